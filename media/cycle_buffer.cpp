@@ -1,0 +1,157 @@
+#include "media/cycle_buffer.h"
+
+#include <cstring>
+
+#include "service/GlobalConfig.h"
+#include "service/OrvexLog.h"
+
+namespace {
+constexpr const char* kTag = "orvex:::cycle_buffer";
+}
+
+cycle_buffer::cycle_buffer(unsigned size) {
+    m_capacity = size > 0 ? size : 1;
+    m_start = new unsigned char[m_capacity];
+    m_end = m_start + m_capacity - 1;
+}
+
+cycle_buffer::~cycle_buffer() { delete[] m_start; }
+
+cycle_buffer::Snapshot cycle_buffer::Snap() {
+    thread_mutex::Scoped hold(m_lock);
+    return Snapshot{m_read.load(std::memory_order_acquire), m_write.load(std::memory_order_acquire)};
+}
+
+// (read - write) modulo capacity, less the byte that always stays unused.
+uint32_t cycle_buffer::FreeOf(const Snapshot& s) const {
+    if (s.read == s.write) return m_capacity - 1;
+    return (s.read + m_capacity - s.write) % m_capacity - 1;
+}
+
+uint32_t cycle_buffer::UsedOf(const Snapshot& s) const {
+    if (s.read == s.write) return 0;
+    return m_capacity - (s.read + m_capacity - s.write) % m_capacity;
+}
+
+unsigned cycle_buffer::free_space() { return FreeOf(Snap()); }
+unsigned cycle_buffer::used_space() { return UsedOf(Snap()); }
+
+uint32_t cycle_buffer::Advance(uint32_t at, uint32_t len) const {
+    return static_cast<uint32_t>((static_cast<uint64_t>(at) + len) % m_capacity);
+}
+
+void cycle_buffer::CopyIn(uint32_t at, const unsigned char* src, uint32_t len) {
+    uint32_t to_end = static_cast<uint32_t>(m_end - (m_start + at)) + 1;
+    if (to_end < len) {
+        memcpy(m_start + at, src, to_end);
+        memcpy(m_start, src + to_end, len - to_end);
+    } else {
+        memcpy(m_start + at, src, len);
+    }
+}
+
+void cycle_buffer::CopyOut(uint32_t at, unsigned char* dst, uint32_t len) const {
+    uint32_t to_end = static_cast<uint32_t>(m_end - (m_start + at)) + 1;
+    if (to_end < len) {
+        memcpy(dst, m_start + at, to_end);
+        memcpy(dst + to_end, m_start, len - to_end);
+    } else {
+        memcpy(dst, m_start + at, len);
+    }
+}
+
+void cycle_buffer::CountWritten(uint32_t len) {
+    if (m_readable.load(std::memory_order_relaxed) == 1) return;
+    m_written_before_readable += len;
+    if (m_written_before_readable > m_threshold) m_readable.store(1, std::memory_order_relaxed);
+}
+
+int cycle_buffer::write(const unsigned char* data, int len) {
+    if (len < 0 || (data == nullptr && len > 0)) return 0;
+    Snapshot s = Snap();
+    uint32_t free = FreeOf(s);
+    if (free < static_cast<uint32_t>(len)) {
+        OrvexPrintLog(kTag,
+                      "\n cycle_buffer::write:free_space_size < len free_space_size:%d,len:%d,\n",
+                      static_cast<int>(free), len);
+        return 0;
+    }
+    CountWritten(static_cast<uint32_t>(len));
+    CopyIn(s.write, data, static_cast<uint32_t>(len));
+    m_write.store(Advance(s.write, static_cast<uint32_t>(len)), std::memory_order_release);
+    return len;
+}
+
+int cycle_buffer::read(unsigned char* dst, int len) {
+    if (m_readable.load(std::memory_order_relaxed) != 1) return 0;
+    if (len < 0 || (dst == nullptr && len > 0)) return 0;
+    Snapshot s = Snap();
+    if (UsedOf(s) < static_cast<uint32_t>(len)) return 0;
+    CopyOut(s.read, dst, static_cast<uint32_t>(len));
+    m_read.store(Advance(s.read, static_cast<uint32_t>(len)), std::memory_order_release);
+    return len;
+}
+
+bool cycle_buffer::newwrite(const unsigned char* data, int len, unsigned timestamp, bool) {
+    if (len < 0 || (data == nullptr && len > 0)) return false;
+    Snapshot s = Snap();
+    uint32_t free = FreeOf(s);
+    if (static_cast<uint64_t>(free) < static_cast<uint64_t>(len) + kItemHeaderSize) {
+        OrvexPrintLog(kTag,
+                      "\n cycle_buffer::newwrite:free_space_size < ( len + buffer_item_header_size "
+                      ") free_space_size:%d,len:%d,buffer_item_header_size:%d,\n",
+                      static_cast<int>(free), len, kItemHeaderSize);
+        return false;
+    }
+    if (timestamp == 0) timestamp = GetTimeStampMillsec();
+    unsigned char header[kItemHeaderSize];
+    int32_t length = len;
+    memcpy(header, &length, 4);
+    memcpy(header + 4, &timestamp, 4);
+    uint32_t total = static_cast<uint32_t>(len) + kItemHeaderSize;
+    CountWritten(total);
+    // Header and payload are published by one store, so the consumer never sees half an item.
+    CopyIn(s.write, header, kItemHeaderSize);
+    CopyIn(Advance(s.write, kItemHeaderSize), data, static_cast<uint32_t>(len));
+    m_write.store(Advance(s.write, total), std::memory_order_release);
+    return true;
+}
+
+bool cycle_buffer::newread(Buffer_Item& item) {
+    if (m_item_stream_valid.load(std::memory_order_relaxed) == 0) {
+        OrvexPuts("\n video FRAME_SIZE is not enough !--1 ");
+        OrvexLog(kTag, "\n video FRAME_SIZE is not enough !--1 \n");
+        return false;
+    }
+    if (m_readable.load(std::memory_order_relaxed) != 1) return false;
+    Snapshot s = Snap();
+    uint32_t used = UsedOf(s);
+    if (used < kItemHeaderSize + 1) return false;
+    unsigned char header[kItemHeaderSize];
+    CopyOut(s.read, header, kItemHeaderSize);
+    int32_t length;
+    uint32_t timestamp;
+    memcpy(&length, header, 4);
+    memcpy(&timestamp, header + 4, 4);
+    item.length = length;
+    item.timestamp = timestamp;
+    uint32_t payload_at = Advance(s.read, kItemHeaderSize);
+    if (length < 0 || length > kFrameSizeMax) {
+        OrvexPrintLog(kTag, "\n video FRAME_SIZE is not enough,bufferitem.length  = %d,! --2 \n",
+                      length);
+        m_item_stream_valid.store(0, std::memory_order_relaxed);
+        // The header is consumed; the payload stays in the ring unread.
+        m_read.store(payload_at, std::memory_order_release);
+        return false;
+    }
+    // Items are published whole, so a short ring here means it was corrupted by raw use.
+    if (used < kItemHeaderSize + static_cast<uint32_t>(length)) return false;
+    CopyOut(payload_at, item.data, static_cast<uint32_t>(length));
+    m_read.store(Advance(payload_at, static_cast<uint32_t>(length)), std::memory_order_release);
+    return true;
+}
+
+void cycle_buffer::reset() {
+    m_read.store(0, std::memory_order_release);
+    m_write.store(0, std::memory_order_release);
+}

@@ -1,0 +1,73 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+
+#include "media/thread_mutex.h"
+
+// Largest payload of one framed item (one encoded frame).
+constexpr int kFrameSizeMax = 1000000;
+// Item header: 32-bit length, 32-bit millisecond time, in the processor's byte order.
+constexpr int kItemHeaderSize = 8;
+
+// One item taken out of a ring. About a megabyte: keep it off small thread stacks.
+struct Buffer_Item {
+    int32_t length;
+    uint32_t timestamp;
+    unsigned char data[kFrameSizeMax];
+};
+
+// Byte ring between one producer thread and one consumer thread, used either raw (write/read)
+// or framed (newwrite/newread). One byte always stays unused so that full and empty differ.
+// Thread contract: one producer (write, newwrite) and one consumer (read, newread) at a time;
+// reset only while the consumer is stopped. No allocation after construction.
+class cycle_buffer {
+public:
+    explicit cycle_buffer(unsigned size);
+    ~cycle_buffer();
+    cycle_buffer(const cycle_buffer&) = delete;
+    cycle_buffer& operator=(const cycle_buffer&) = delete;
+
+    // Appends len bytes; returns len, or 0 (with a message) when they do not fit.
+    int write(const unsigned char* data, int len);
+    // Removes exactly len bytes; returns len, or 0 when fewer are there or not yet readable.
+    int read(unsigned char* dst, int len);
+    // Appends one item (header and payload, published together); timestamp 0 stamps it with
+    // GetTimeStampMillsec(). False, ring unchanged, when it does not fit. `flag` is unused.
+    bool newwrite(const unsigned char* data, int len, unsigned timestamp, bool flag);
+    // Removes one item. An item longer than kFrameSizeMax invalidates the item stream for good.
+    bool newread(Buffer_Item& item);
+    // Empties the ring; the readable and item-stream states stay as they are.
+    void reset();
+
+    unsigned capacity() const { return m_capacity; }
+    unsigned free_space();
+    unsigned used_space();
+    bool item_stream_valid() const { return m_item_stream_valid.load(std::memory_order_relaxed); }
+
+private:
+    struct Snapshot {
+        uint32_t read;
+        uint32_t write;
+    };
+    Snapshot Snap();
+    uint32_t FreeOf(const Snapshot& s) const;
+    uint32_t UsedOf(const Snapshot& s) const;
+    void CopyIn(uint32_t at, const unsigned char* src, uint32_t len);
+    void CopyOut(uint32_t at, unsigned char* dst, uint32_t len) const;
+    uint32_t Advance(uint32_t at, uint32_t len) const;
+    void CountWritten(uint32_t len);
+
+    thread_mutex m_lock;
+    unsigned char* m_start;
+    unsigned char* m_end;  // last byte of the storage
+    uint32_t m_capacity;
+    // Offsets from m_start. Each side alone moves its own: the consumer m_read, the producer
+    // m_write; the release store of a position publishes the bytes copied before it.
+    std::atomic<uint32_t> m_read{0};
+    std::atomic<uint32_t> m_write{0};
+    uint32_t m_threshold = 0;
+    std::atomic<int> m_readable{0};
+    uint32_t m_written_before_readable = 0;  // producer only
+    std::atomic<int> m_item_stream_valid{1};
+};

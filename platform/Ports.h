@@ -1,0 +1,34 @@
+#pragma once
+
+#include "platform/AudioManagerPort.h"
+#include "platform/LogPort.h"
+#include "platform/PipManagerPort.h"
+#include "platform/PropertyPort.h"
+
+// The installed platform implementation: one object per port, reached by the layers above.
+// Thread contract: Install before any other thread uses a port (start-up, or a test's set-up);
+// the accessors may be called from any thread. A port that was never installed is a null
+// implementation: logs vanish, properties read as their defaults, managers cannot connect.
+
+namespace platform {
+
+struct Ports {
+    LogPort* log = nullptr;
+    PropertyPort* properties = nullptr;
+    PipManagerPort* pip_manager = nullptr;
+    AudioManagerPort* audio_manager = nullptr;
+};
+
+// Null members install the null implementation of that port. Ports are not owned.
+void Install(const Ports& ports);
+Ports Installed();
+
+LogPort& Log();
+PropertyPort& Properties();
+PipManagerPort& PipManager();
+AudioManagerPort& AudioManager();
+
+// Defined by the platform library the executable links (host or android), never by fakes.
+void InstallDefaultPorts();
+
+}  // namespace platform

@@ -1,0 +1,19 @@
+#pragma once
+
+// Port to the system properties (Android: property_get).
+// Thread contract: Get may be called from any thread.
+
+namespace platform {
+
+// Room for a value and its NUL, as PROPERTY_VALUE_MAX on Android.
+constexpr int kPropertyValueMax = 92;
+
+class PropertyPort {
+public:
+    virtual ~PropertyPort() = default;
+    // Copies the value of `key` (or `default_value` when the key is unset; "" when that is
+    // null) into `value`, which holds kPropertyValueMax bytes; returns the length copied.
+    virtual int Get(const char* key, char* value, const char* default_value) = 0;
+};
+
+}  // namespace platform

@@ -1,0 +1,33 @@
+#pragma once
+
+#include "platform/Ports.h"
+#include "platform/fake/CallJournal.h"
+#include "platform/fake/FakeLog.h"
+#include "platform/fake/FakeManagers.h"
+#include "platform/fake/FakeProperties.h"
+
+namespace platform {
+namespace fake {
+
+// Installs recording fakes of every port for the object's lifetime and puts the previous
+// ports back afterwards. Thread contract: create and destroy while no other thread uses a
+// port; the fakes themselves may be used from any thread.
+class FakePlatform {
+public:
+    FakePlatform();
+    ~FakePlatform();
+    FakePlatform(const FakePlatform&) = delete;
+    FakePlatform& operator=(const FakePlatform&) = delete;
+
+    CallJournal journal;
+    FakeLog log;
+    FakeProperties properties;
+    FakePipManager pip_manager{journal};
+    FakeAudioManager audio_manager{journal};
+
+private:
+    Ports previous_;
+};
+
+}  // namespace fake
+}  // namespace platform

@@ -1,0 +1,32 @@
+#include "platform/fake/FakeProperties.h"
+
+#include <cstring>
+
+namespace platform {
+namespace fake {
+
+int FakeProperties::Get(const char* key, char* value, const char* default_value) {
+    std::string text = default_value != nullptr ? default_value : "";
+    {
+        std::lock_guard<std::mutex> hold(mutex_);
+        auto it = key != nullptr ? values_.find(key) : values_.end();
+        if (it != values_.end() && !it->second.empty()) text = it->second;
+    }
+    size_t n = text.size() < kPropertyValueMax - 1 ? text.size() : kPropertyValueMax - 1;
+    memcpy(value, text.data(), n);
+    value[n] = '\0';
+    return static_cast<int>(n);
+}
+
+void FakeProperties::Set(const std::string& key, const std::string& value) {
+    std::lock_guard<std::mutex> hold(mutex_);
+    values_[key] = value;
+}
+
+void FakeProperties::Clear() {
+    std::lock_guard<std::mutex> hold(mutex_);
+    values_.clear();
+}
+
+}  // namespace fake
+}  // namespace platform

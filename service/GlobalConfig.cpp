@@ -1,0 +1,113 @@
+#include "service/GlobalConfig.h"
+
+#include <time.h>
+
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+
+#include "service/OrvexLog.h"
+
+namespace {
+
+constexpr const char* kTag = "globalconfig";
+
+std::atomic<Global_Config*> g_instance{nullptr};
+TLock g_create_lock;
+
+}  // namespace
+
+Global_Config* Global_Config::instance() {
+    Global_Config* p = g_instance.load(std::memory_order_acquire);
+    if (p != nullptr) return p;
+    TLock::Scoped hold(g_create_lock);
+    p = g_instance.load(std::memory_order_relaxed);
+    if (p == nullptr) {
+        p = new Global_Config();
+        g_instance.store(p, std::memory_order_release);
+    }
+    return p;
+}
+
+void Global_Config::CloseInstance() {
+    Global_Config* p = g_instance.exchange(nullptr, std::memory_order_acq_rel);
+    delete p;
+}
+
+Global_Config::~Global_Config() = default;
+
+void Global_Config::video_audio_open_cap() {
+    if (m_video_open != nullptr) m_video_open();
+    if (m_audio_open != nullptr) m_audio_open();
+}
+
+void Global_Config::video_audio_close_cap() {
+    if (m_video_close != nullptr) m_video_close();
+    if (m_audio_close != nullptr) m_audio_close();
+}
+
+void Global_Config::mp3_config_ok() {
+    m_audio_configured.store(1, std::memory_order_relaxed);
+    if (m_video_configured.load(std::memory_order_relaxed) != 0) {
+        m_both_configured.store(1, std::memory_order_relaxed);
+        m_input_ready.store(1, std::memory_order_relaxed);
+    }
+}
+
+void Global_Config::h264_config_frequency_ok() {
+    m_video_configured.store(1, std::memory_order_relaxed);
+    if (m_audio_configured.load(std::memory_order_relaxed) != 0) {
+        m_both_configured.store(1, std::memory_order_relaxed);
+        m_input_ready.store(1, std::memory_order_relaxed);
+    }
+}
+
+void Global_Config::set_pause_stat(bool pause) {
+    // The text does not show the value; operators know it by its wording.
+    OrvexLog(kTag, "m_flag_run_pause = pausestat");
+    m_flag_run_pause.store(pause, std::memory_order_relaxed);
+}
+
+void Global_Config::set_sub_stat(bool sub) {
+    OrvexLog(kTag, "m_flag_sub = sub");
+    m_flag_sub.store(sub, std::memory_order_relaxed);
+}
+
+void Global_Config::set_timestamp(unsigned value, bool video) {
+    TLock::Scoped hold(m_timestamp_lock);
+    if (video) {
+        m_video_time = value;
+    } else {
+        m_audio_time = value;
+    }
+}
+
+unsigned Global_Config::get_timestamp(bool video) {
+    TLock::Scoped hold(m_timestamp_lock);
+    return video ? m_video_time : m_audio_time;
+}
+
+unsigned GetTimeHeartbeatSec() {
+    char line[100] = {};
+    FILE* f = fopen("/proc/uptime", "r");
+    if (f != nullptr) {
+        char* got = fgets(line, sizeof line, f);
+        fclose(f);
+        if (got != nullptr) return static_cast<unsigned>(atof(line));
+    }
+    timespec ts{};
+    clock_gettime(CLOCK_BOOTTIME, &ts);
+    return static_cast<unsigned>(ts.tv_sec);
+}
+
+unsigned MillisecondsOf(int64_t seconds, long nanoseconds) {
+    // Unsigned arithmetic: the result wraps modulo 2^32 like the 32-bit stamps it feeds.
+    return static_cast<unsigned>(static_cast<uint64_t>(seconds) * 1000u +
+                                 static_cast<uint64_t>(nanoseconds / 1000000));
+}
+
+unsigned GetTimeStampMillsec() {
+    timespec ts{};
+    clock_gettime(CLOCK_MONOTONIC, &ts);
+    return MillisecondsOf(ts.tv_sec, ts.tv_nsec);
+}

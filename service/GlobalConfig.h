@@ -1,0 +1,88 @@
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <string>
+
+#include "capture/orvexPIPCfg.h"
+#include "media/TLock.h"
+
+// The process-wide configuration: stream parameters, readiness, pause and sub-stream state,
+// the capture callbacks and the two send threads' playing positions.
+// Thread contract: instance() from any thread. Clock rates and callbacks are written at
+// start-up before the threads that read them exist; the flags are atomic; the playing-time
+// stamps are guarded by their own lock. CloseInstance only when no other thread uses it.
+class Global_Config {
+public:
+    typedef int (*CaptureFunc)();
+
+    static Global_Config* instance();
+    static void CloseInstance();
+    virtual ~Global_Config();
+
+    // Stream parameters (public words, as every subsystem reads them).
+    uint32_t m_video_rtp_frequency = 0;  // Hz; 90000 once configured
+    uint32_t m_audio_rtp_frequency = 0;  // Hz; the audio sample rate, 48000 once configured
+    uint32_t m_rtsp_port = 0;
+    int32_t m_video_payload_type = 96;
+    int32_t m_audio_payload_type = 98;  // what the audio RTP headers carry
+    uint32_t m_h264_rtp_port = 8000;
+    uint32_t m_audio_rtp_port = 8002;
+    // Local dotted IPv4 address of the last accepted RTSP connection.
+    std::string m_server_address;
+
+    void register_audio_open_thread_func(CaptureFunc f) { m_audio_open = f; }
+    void register_audio_close_thread_func(CaptureFunc f) { m_audio_close = f; }
+    void register_video_open_thread_func(CaptureFunc f) { m_video_open = f; }
+    void register_video_close_thread_func(CaptureFunc f) { m_video_close = f; }
+    // Video first, then audio. An unregistered callback is skipped.
+    void video_audio_open_cap();
+    void video_audio_close_cap();
+
+    void mp3_config_ok();
+    void h264_config_frequency_ok();
+    bool InIISOK() const { return m_input_ready.load(std::memory_order_relaxed) != 0; }
+
+    void set_current_signal_status(int status) {
+        m_signal_status.store(status, std::memory_order_relaxed);
+    }
+    int current_signal_status() const { return m_signal_status.load(std::memory_order_relaxed); }
+
+    void SetTVParameterDefault() { m_pip_cfg.SetTVParameterDefault(); }
+    orvexPIPCfg& pip_cfg() { return m_pip_cfg; }
+
+    bool isPause() const { return m_flag_run_pause.load(std::memory_order_relaxed); }
+    void set_pause_stat(bool pause);
+    bool isSub() const { return m_flag_sub.load(std::memory_order_relaxed); }
+    void set_sub_stat(bool sub);
+
+    // Milliseconds of media sent by the video (video true) or the audio send thread.
+    void set_timestamp(unsigned value, bool video);
+    unsigned get_timestamp(bool video);
+
+private:
+    Global_Config() = default;
+
+    CaptureFunc m_audio_open = nullptr;
+    CaptureFunc m_audio_close = nullptr;
+    CaptureFunc m_video_open = nullptr;
+    CaptureFunc m_video_close = nullptr;
+    std::atomic<int> m_signal_status{0};
+    std::atomic<unsigned char> m_input_ready{0};
+    std::atomic<unsigned char> m_audio_configured{0};
+    std::atomic<unsigned char> m_video_configured{0};
+    std::atomic<unsigned char> m_both_configured{0};
+    orvexPIPCfg m_pip_cfg;
+    std::atomic<bool> m_flag_run_pause{false};
+    std::atomic<bool> m_flag_sub{false};
+    TLock m_timestamp_lock;
+    unsigned m_video_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;
+    unsigned m_audio_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;
+};
+
+// Whole seconds since boot ("/proc/uptime"; the boot-time clock when that cannot be read).
+unsigned GetTimeHeartbeatSec();
+// Milliseconds of the monotonic clock, wrapping modulo 2^32 (about 49.7 days).
+unsigned GetTimeStampMillsec();
+// The arithmetic of GetTimeStampMillsec, for any clock reading.
+unsigned MillisecondsOf(int64_t seconds, long nanoseconds);

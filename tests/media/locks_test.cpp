@@ -1,0 +1,55 @@
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <chrono>
+#include <thread>
+
+#include "media/TLock.h"
+#include "media/thread_mutex.h"
+
+namespace {
+
+void Acquire(thread_mutex& m) { m.lock(); }
+void Release(thread_mutex& m) { m.unlock(); }
+void Acquire(TLock& l) { l.Lock(); }
+void Release(TLock& l) { l.UnLock(); }
+
+template <typename T>
+class LockTest : public ::testing::Test {};
+using LockTypes = ::testing::Types<thread_mutex, TLock>;
+TYPED_TEST_SUITE(LockTest, LockTypes);
+
+// Destroying a lock that another thread holds must wait for that thread to let go.
+TYPED_TEST(LockTest, DestructorWaitsForHolder) {
+    auto* lock = new TypeParam();
+    std::atomic<bool> held{false};
+    std::atomic<bool> released{false};
+    std::thread holder([&] {
+        Acquire(*lock);
+        held = true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(50));
+        released = true;
+        Release(*lock);
+    });
+    while (!held) std::this_thread::yield();
+    delete lock;
+    EXPECT_TRUE(released.load());
+    holder.join();
+}
+
+TYPED_TEST(LockTest, ExcludesConcurrentIncrements) {
+    TypeParam lock;
+    int counter = 0;
+    auto work = [&] {
+        for (int i = 0; i < 20000; ++i) {
+            typename TypeParam::Scoped hold(lock);
+            ++counter;
+        }
+    };
+    std::thread a(work), b(work);
+    a.join();
+    b.join();
+    EXPECT_EQ(counter, 40000);
+}
+
+}  // namespace

@@ -1,0 +1,155 @@
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <fstream>
+#include <regex>
+#include <sstream>
+#include <string>
+
+#include "platform/Ports.h"
+#include "platform/host/HostLog.h"
+#include "platform/host/HostProperties.h"
+
+namespace {
+
+using platform::host::HostLog;
+using platform::host::HostProperties;
+
+std::string TempPath(const char* name) {
+    return ::testing::TempDir() + "orvex_" + std::to_string(getpid()) + "_" + name;
+}
+
+void WriteFile(const std::string& path, const std::string& text) {
+    std::ofstream(path, std::ios::trunc) << text;
+}
+
+std::string ReadFile(const std::string& path) {
+    std::stringstream s;
+    s << std::ifstream(path).rdbuf();
+    return s.str();
+}
+
+TEST(HostPropertiesTest, ParsesBuildPropLines) {
+    auto v = HostProperties::Parse(
+        "# comment\n"
+        "ro.board.platform=tarvo9\n"
+        "  kv.orvex.log = 2 \r\n"
+        "\n"
+        "no equals sign\n"
+        "=no key\n"
+        "a.b=x=y\n"
+        "kv.orvex.log=3\n"
+        "   # indented comment=1\n");
+    std::map<std::string, std::string> expected = {
+        {"ro.board.platform", "tarvo9"}, {"kv.orvex.log", "3"}, {"a.b", "x=y"}};
+    EXPECT_EQ(v, expected);
+}
+
+TEST(HostPropertiesTest, MissingKeysAndFilesGiveTheDefault) {
+    std::string path = TempPath("props");
+    WriteFile(path, "kelvo.build.kelvotv=sa\nempty.value=\n");
+    HostProperties props(path);
+    char value[platform::kPropertyValueMax];
+    EXPECT_EQ(props.Get("kelvo.build.kelvotv", value, "x"), 2);
+    EXPECT_STREQ(value, "sa");
+    EXPECT_EQ(props.Get("ro.board.platform", value, "android"), 7);
+    EXPECT_STREQ(value, "android");
+    EXPECT_EQ(props.Get("empty.value", value, "dflt"), 4);
+    EXPECT_STREQ(value, "dflt");
+    EXPECT_EQ(props.Get("nothing", value, nullptr), 0);
+    EXPECT_STREQ(value, "");
+
+    HostProperties none(path + ".absent");
+    EXPECT_EQ(none.Get("kelvo.build.kelvotv", value, "0"), 1);
+    EXPECT_STREQ(value, "0");
+    unlink(path.c_str());
+}
+
+TEST(HostPropertiesTest, EditsTakeEffectAtTheNextLookup) {
+    std::string path = TempPath("props_edit");
+    WriteFile(path, "kv.orvex.log=0\n");
+    HostProperties props(path);
+    char value[platform::kPropertyValueMax];
+    props.Get("kv.orvex.log", value, "");
+    EXPECT_STREQ(value, "0");
+    WriteFile(path, "kv.orvex.log=12\n");  // a different size: seen even within one mtime tick
+    props.Get("kv.orvex.log", value, "");
+    EXPECT_STREQ(value, "12");
+    unlink(path.c_str());
+    props.Get("kv.orvex.log", value, "gone");
+    EXPECT_STREQ(value, "gone");
+}
+
+TEST(HostPropertiesTest, LongValuesAreCutToThePropertyLimit) {
+    std::string path = TempPath("props_long");
+    WriteFile(path, "k=" + std::string(200, 'v') + "\n");
+    HostProperties props(path);
+    char value[platform::kPropertyValueMax];
+    EXPECT_EQ(props.Get("k", value, ""), platform::kPropertyValueMax - 1);
+    EXPECT_EQ(std::string(value), std::string(platform::kPropertyValueMax - 1, 'v'));
+    unlink(path.c_str());
+}
+
+TEST(HostLogTest, FileSinkWritesLogcatLinesOnePerTextLine) {
+    std::string path = TempPath("log");
+    unlink(path.c_str());
+    {
+        HostLog log("file:" + path);
+        log.Write(3, 3, "orvex:::cycle_buffer", "\n first line\nsecond\n");
+        log.Write(3, 6, "orvex:::RtspSession", "set reuse rtsp address wrong x");
+        log.Write(3, 3, "globalconfig", "\n\n");
+    }
+    std::string text = ReadFile(path);
+    std::regex line(
+        R"(\d\d-\d\d \d\d:\d\d:\d\d\.\d{3} +\d+ +\d+ ([A-Z?]) ([^:]+(?::::[^:]+)?): (.*))");
+    std::vector<std::string> got;
+    std::istringstream in(text);
+    for (std::string l; std::getline(in, l);) {
+        std::smatch m;
+        ASSERT_TRUE(std::regex_match(l, m, line)) << l;
+        got.push_back(m[1].str() + " " + m[2].str() + ": " + m[3].str());
+    }
+    EXPECT_EQ(got, (std::vector<std::string>{
+                       "D orvex:::cycle_buffer:  first line", "D orvex:::cycle_buffer: second",
+                       "E orvex:::RtspSession: set reuse rtsp address wrong x",
+                       "D globalconfig: "}));
+    unlink(path.c_str());
+}
+
+TEST(HostLogTest, PriorityLetters) {
+    EXPECT_EQ(platform::host::PriorityLetter(2), 'V');
+    EXPECT_EQ(platform::host::PriorityLetter(3), 'D');
+    EXPECT_EQ(platform::host::PriorityLetter(4), 'I');
+    EXPECT_EQ(platform::host::PriorityLetter(5), 'W');
+    EXPECT_EQ(platform::host::PriorityLetter(6), 'E');
+    EXPECT_EQ(platform::host::PriorityLetter(7), 'F');
+    EXPECT_EQ(platform::host::PriorityLetter(9), '?');
+}
+
+// The default ports read the property file named by the environment and log where it says.
+TEST(HostPlatformTest, DefaultPortsFollowThePropertyFile) {
+    std::string props = TempPath("default_props");
+    std::string log = TempPath("default_log");
+    unlink(log.c_str());
+    WriteFile(props, "kelvo.build.kelvotv=px\norvex.host.log=file:" + log + "\n");
+    setenv("ORVEX_PROP_FILE", props.c_str(), 1);
+    unsetenv("ORVEX_LOG");
+    platform::Ports before = platform::Installed();
+    platform::InstallDefaultPorts();
+    char value[platform::kPropertyValueMax];
+    platform::Properties().Get("kelvo.build.kelvotv", value, "");
+    EXPECT_STREQ(value, "px");
+    platform::Log().Write(3, 3, "orvex:::test", "hello host");
+    EXPECT_NE(ReadFile(log).find("D orvex:::test: hello host"), std::string::npos);
+    EXPECT_NE(platform::PipManager().connect(), nullptr);
+    auto audio = platform::AudioManager().connect();
+    ASSERT_NE(audio, nullptr);
+    EXPECT_EQ(audio->setAudioCaptureSource(0, 1), 0);
+    platform::Install(before);
+    unsetenv("ORVEX_PROP_FILE");
+    unlink(props.c_str());
+    unlink(log.c_str());
+}
+
+}  // namespace

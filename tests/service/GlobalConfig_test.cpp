@@ -1,0 +1,119 @@
+#include "service/GlobalConfig.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/fake/FakePlatform.h"
+
+namespace {
+
+class GlobalConfigTest : public ::testing::Test {
+protected:
+    GlobalConfigTest() { Global_Config::CloseInstance(); }
+    ~GlobalConfigTest() override { Global_Config::CloseInstance(); }
+    platform::fake::FakePlatform fake;
+};
+
+TEST_F(GlobalConfigTest, StartsWithItsDefaults) {
+    Global_Config* c = Global_Config::instance();
+    EXPECT_EQ(c->m_video_rtp_frequency, 0u);
+    EXPECT_EQ(c->m_audio_rtp_frequency, 0u);
+    EXPECT_EQ(c->m_video_payload_type, 96);
+    EXPECT_EQ(c->m_audio_payload_type, 98);
+    EXPECT_EQ(c->m_h264_rtp_port, 8000u);
+    EXPECT_EQ(c->m_audio_rtp_port, 8002u);
+    EXPECT_EQ(c->m_server_address, "");
+    EXPECT_FALSE(c->InIISOK());
+    EXPECT_FALSE(c->isPause());
+    EXPECT_FALSE(c->isSub());
+    EXPECT_EQ(c->get_timestamp(true), 0u);
+    EXPECT_EQ(c->get_timestamp(false), 0u);
+}
+
+// Input is ready once both clock rates were configured, whichever came first.
+TEST_F(GlobalConfigTest, ReadinessInEitherOrder) {
+    for (bool audio_first : {true, false}) {
+        Global_Config::CloseInstance();
+        Global_Config* c = Global_Config::instance();
+        if (audio_first) c->mp3_config_ok(); else c->h264_config_frequency_ok();
+        EXPECT_FALSE(c->InIISOK()) << audio_first;
+        if (audio_first) c->h264_config_frequency_ok(); else c->mp3_config_ok();
+        EXPECT_TRUE(c->InIISOK()) << audio_first;
+    }
+}
+
+std::vector<std::string> g_calls;
+int VideoOpen() { g_calls.push_back("video open"); return 0; }
+int AudioOpen() { g_calls.push_back("audio open"); return 0; }
+int VideoClose() { g_calls.push_back("video close"); return 0; }
+int AudioClose() { g_calls.push_back("audio close"); return 0; }
+
+TEST_F(GlobalConfigTest, CallbacksRunVideoFirstAndAreLostWithTheInstance) {
+    g_calls.clear();
+    Global_Config* c = Global_Config::instance();
+    c->register_audio_open_thread_func(AudioOpen);
+    c->register_video_open_thread_func(VideoOpen);
+    c->register_audio_close_thread_func(AudioClose);
+    c->register_video_close_thread_func(VideoClose);
+    c->m_video_rtp_frequency = 90000;
+    c->video_audio_open_cap();
+    c->video_audio_close_cap();
+    EXPECT_EQ(g_calls, (std::vector<std::string>{"video open", "audio open", "video close",
+                                                 "audio close"}));
+
+    Global_Config::CloseInstance();
+    g_calls.clear();
+    Global_Config* fresh = Global_Config::instance();
+    EXPECT_EQ(fresh->m_video_rtp_frequency, 0u);
+    fresh->video_audio_open_cap();  // nothing registered: nothing runs, nothing breaks
+    fresh->video_audio_close_cap();
+    EXPECT_TRUE(g_calls.empty());
+}
+
+TEST_F(GlobalConfigTest, SettersLogFixedTexts) {
+    Global_Config* c = Global_Config::instance();
+    fake.log.Clear();
+    c->set_pause_stat(true);
+    c->set_sub_stat(true);
+    EXPECT_TRUE(c->isPause());
+    EXPECT_TRUE(c->isSub());
+    EXPECT_EQ(fake.log.Texts("globalconfig"),
+              (std::vector<std::string>{"m_flag_run_pause = pausestat", "m_flag_sub = sub"}));
+}
+
+TEST_F(GlobalConfigTest, TimestampsAreKeptPerStream) {
+    Global_Config* c = Global_Config::instance();
+    c->set_timestamp(1234, true);
+    c->set_timestamp(99, false);
+    EXPECT_EQ(c->get_timestamp(true), 1234u);
+    EXPECT_EQ(c->get_timestamp(false), 99u);
+}
+
+TEST_F(GlobalConfigTest, ConcurrentFirstUseCreatesOneObject) {
+    Global_Config::CloseInstance();
+    std::vector<Global_Config*> seen(4);
+    std::vector<std::thread> threads;
+    for (int i = 0; i < 4; ++i) threads.emplace_back([&, i] { seen[i] = Global_Config::instance(); });
+    for (auto& t : threads) t.join();
+    for (Global_Config* p : seen) EXPECT_EQ(p, seen[0]);
+}
+
+TEST(Clocks, MillisecondsWrapModulo2To32) {
+    EXPECT_EQ(MillisecondsOf(0, 999999), 0u);
+    EXPECT_EQ(MillisecondsOf(1, 2500000), 1002u);
+    EXPECT_EQ(MillisecondsOf(4294967, 295000000), 4294967295u);
+    EXPECT_EQ(MillisecondsOf(4294967, 296000000), 0u);
+    EXPECT_EQ(MillisecondsOf(4294968, 0), 704u);
+}
+
+TEST(Clocks, HeartbeatAndMillisecondsAdvanceTogether) {
+    unsigned ms = GetTimeStampMillsec();
+    unsigned later = GetTimeStampMillsec();
+    EXPECT_LE(later - ms, 1000u);  // unsigned difference: correct across a wrap
+    EXPECT_GT(GetTimeHeartbeatSec(), 0u);
+}
+
+}  // namespace
