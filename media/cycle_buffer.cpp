@@ -41,6 +41,7 @@ uint32_t cycle_buffer::Advance(uint32_t at, uint32_t len) const {
 }
 
 void cycle_buffer::CopyIn(uint32_t at, const unsigned char* src, uint32_t len) {
+    if (len == 0) return;
     uint32_t to_end = static_cast<uint32_t>(m_end - (m_start + at)) + 1;
     if (to_end < len) {
         memcpy(m_start + at, src, to_end);
@@ -51,6 +52,7 @@ void cycle_buffer::CopyIn(uint32_t at, const unsigned char* src, uint32_t len) {
 }
 
 void cycle_buffer::CopyOut(uint32_t at, unsigned char* dst, uint32_t len) const {
+    if (len == 0) return;
     uint32_t to_end = static_cast<uint32_t>(m_end - (m_start + at)) + 1;
     if (to_end < len) {
         memcpy(dst, m_start + at, to_end);

@@ -1,0 +1,28 @@
+#!/usr/bin/env bash
+# Installs the Debian 12 packages a build needs, and only those that are missing.
+#   install-deps.sh          what building, running and testing on this machine needs
+#   install-deps.sh ci       that, plus the sanitizer, fuzzing and 32-bit ARM tool chains
+set -euo pipefail
+
+packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock-dev
+          libbenchmark-dev)
+if [[ "${1:-}" == ci ]]; then
+  packages+=(clang libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
+fi
+
+missing=()
+for p in "${packages[@]}"; do
+  if ! dpkg-query -W -f='${Status}' "$p" 2>/dev/null | grep -q '^install ok installed$'; then
+    missing+=("$p")
+  fi
+done
+[[ ${#missing[@]} -eq 0 ]] && exit 0
+
+sudo=()
+if [[ $(id -u) -ne 0 ]]; then
+  command -v sudo >/dev/null || { echo "install-deps: need root or sudo to install: ${missing[*]}" >&2; exit 1; }
+  sudo=(sudo)
+fi
+echo "install-deps: installing ${missing[*]}"
+"${sudo[@]}" apt-get update -qq
+DEBIAN_FRONTEND=noninteractive "${sudo[@]}" apt-get install -y -qq --no-install-recommends "${missing[@]}"
