@@ -80,6 +80,17 @@ void OrvexDebugPrint(const char* fmt, ...) {
     WriteStdout("\n", m.text, "\n");
 }
 
+void OrvexDebugRaw(const char* fmt, ...) {
+    if (GET_ORVEX_API_DEBUG_PRINTF() != 1) return;
+    FORMAT_ARGS(m, fmt);
+    WriteStdout("", m.text, "");
+}
+
+void OrvexRaw(const char* fmt, ...) {
+    FORMAT_ARGS(m, fmt);
+    WriteStdout("", m.text, "");
+}
+
 void OrvexPuts(const char* text) { WriteStdout("", text, "\n"); }
 
 void OrvexDebugPuts(const char* text) {

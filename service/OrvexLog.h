@@ -22,6 +22,10 @@ void OrvexPrintLog(const char* tag, const char* fmt, ...) __attribute__((format(
 void OrvexPrint(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
 // Framed stdout only, while the debug switch is on.
 void OrvexDebugPrint(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
+// stdout exactly as formatted (no framing), while the debug switch is on: protocol traces.
+void OrvexDebugRaw(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
+// stdout exactly as formatted, always.
+void OrvexRaw(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
 // stdout as puts writes it: the text and one newline.
 void OrvexPuts(const char* text);
 // stdout as puts writes it, while the debug switch is on.
