@@ -1,0 +1,111 @@
+#include "media/MediaStreamH264.h"
+
+#include <cstdio>
+
+#include "capture/LivecameraResolution.h"
+#include "service/GlobalConfig.h"
+
+namespace {
+
+constexpr unsigned char kFuA = 28;  // RFC 6184 §5.8
+
+// Index of the next 0 0 1 at or after `from`, or `len`.
+unsigned FindStartCode(const unsigned char* p, unsigned len, unsigned from) {
+    for (unsigned i = from; i + 2 < len; ++i) {
+        if (p[i] == 0 && p[i + 1] == 0 && p[i + 2] == 1) return i;
+    }
+    return len;
+}
+
+}  // namespace
+
+MediaStreamH264::MediaStreamH264(const char* name) : MediaStream(name, kMediaTypeH264) {}
+
+bool MediaStreamH264::Init(unsigned param1, unsigned param2, unsigned param3, std::string text) {
+    m_param1 = param1;
+    m_param2 = param2;
+    m_param3 = param3;
+    m_text = std::move(text);
+    return true;
+}
+
+const char* MediaStreamH264::FmtpForWidth(unsigned width) {
+    // Fixed Baseline 3.0 parameter sets per capture width; they do not describe the live
+    // encoder's own, which arrive in band.
+    if (width == 640) {
+        return "profile-level-id=42401E; sprop-parameter-sets=Z0JAHqbAoD2hAAADAAEAAAMAKA8QIuA=,"
+               "aMpDiA==; packetization-mode=1;";
+    }
+    if (width == 480) {
+        return "profile-level-id=42401E; sprop-parameter-sets=Z0JAHqbB4KaEAAADAAQAAAMAoDxAi4A=,"
+               "aMpDiA==; packetization-mode=1;";
+    }
+    return "profile-level-id=42401E; sprop-parameter-sets=Z0JAHqbBQfoQAAADABAAAAMCgPECLg==,"
+           "aMpDiA==; packetization-mode=1;";
+}
+
+std::string MediaStreamH264::GenerateMediaSdp(unsigned payload_type, int with_control) {
+    m_rtp_payload_type = static_cast<int>(payload_type);
+    Global_Config* config = Global_Config::instance();
+    unsigned width = 0, height = 0;
+    get_video_resolution(&width, &height);
+    char line[256];
+    std::string sdp;
+    int pt = config->m_video_payload_type;
+    snprintf(line, sizeof line, "m=video %u RTP/AVP %d\r\n", m_remote_port, pt);
+    sdp += line;
+    snprintf(line, sizeof line, "a=rtpmap:%d H264/%u\r\n", pt, config->m_video_rtp_frequency);
+    sdp += line;
+    snprintf(line, sizeof line, "a=fmtp:%d %s\r\n", pt, FmtpForWidth(width));
+    sdp += line;
+    if (with_control != 0) {
+        snprintf(line, sizeof line, "a=control:trackID=%d\r\n", static_cast<int>(payload_type) - 95);
+        sdp += line;
+    }
+    return sdp;
+}
+
+int MediaStreamH264::TransportData(unsigned char* data, unsigned len, int timestamp) {
+    TLock::Scoped hold(m_state_lock);
+    if (m_playing == 0 || data == nullptr || len < 5) return 0;
+    unsigned pos = FindStartCode(data, len, 0);
+    int total = 0;
+    while (pos < len && len - pos >= 5) {
+        unsigned next = FindStartCode(data, len, pos + 3);
+        bool last = next >= len;
+        unsigned end = next;
+        if (!last && next > pos + 3 && data[next - 1] == 0) end = next - 1;  // 0 0 0 1
+        total += TransportH264Nal(data + pos, end - pos, timestamp, last);
+        pos = next;
+    }
+    return total;
+}
+
+int MediaStreamH264::TransportH264Nal(unsigned char* nal, unsigned len, int timestamp, bool last) {
+    if (nal == nullptr || len < 5 || m_packet_size <= kRtpHeaderSize + 2) return 0;
+    unsigned char header = nal[3];
+    unsigned type = header & 0x1F;
+    if (type == 7 || type == 8) return 0;
+    if (len - 3 <= m_packet_size - kRtpHeaderSize) {
+        return SendPacket(nal + 3, len - 3, timestamp, last ? 1 : 0);
+    }
+    const unsigned max_piece = m_packet_size - kRtpHeaderSize - 2;
+    unsigned char* piece = nal + 4;
+    unsigned remaining = len - 4;
+    int total = 0;
+    bool first = true;
+    m_fu_buffer.ExtendBuffer(max_piece + 2);
+    while (remaining > 0) {
+        unsigned n = remaining < max_piece ? remaining : max_piece;
+        bool end = n == remaining;
+        unsigned char* out = m_fu_buffer.GetData();
+        out[0] = static_cast<unsigned char>((header & 0xE0) | kFuA);
+        out[1] = static_cast<unsigned char>(type | (first ? 0x80 : 0) | (end ? 0x40 : 0));
+        for (unsigned i = 0; i < n; ++i) out[2 + i] = piece[i];
+        total += SendPacket(out, n + 2, timestamp, last && end ? 1 : 0);
+        piece += n;
+        remaining -= n;
+        first = false;
+    }
+    return total;
+}

@@ -1,0 +1,100 @@
+#include "media/MediaStreamMP4A.h"
+
+#include <cstdio>
+
+namespace {
+constexpr unsigned kAdtsHeaderSize = 7;
+constexpr unsigned kAuHeaderSectionSize = 4;  // AU-headers-length (16 bits) + one AU header
+}  // namespace
+
+MediaStreamMP4A::MediaStreamMP4A(const char* name, int object)
+    : MediaStream(name, kMediaTypeMP4A), m_object(object) {}
+
+bool MediaStreamMP4A::Init(int channels, int sample_rate, int object) {
+    m_channels = channels;
+    m_sample_rate = sample_rate;
+    m_object = object;
+    return true;
+}
+
+int MediaStreamMP4A::FrequencyIndex(int rate) {
+    if (rate > 94999) return 0;
+    if (rate >= 87200) return 1;
+    if (rate >= 63000) return 2;
+    if (rate >= 47000) return 3;
+    if (rate >= 43100) return 4;
+    if (rate >= 31000) return 5;
+    if (rate >= 23000) return 6;
+    if (rate >= 21050) return 7;
+    if (rate >= 15000) return 8;
+    if (rate >= 11000) return 9;
+    if (rate >= 10025) return 10;
+    if (rate >= 7000) return 11;
+    if (rate >= -1000) return 12;
+    return 15;
+}
+
+std::string MediaStreamMP4A::ConfigString(int sample_rate, int channels) {
+    static const char kHex[] = "0123456789abcdef";
+    int index = FrequencyIndex(sample_rate);
+    // 5 bits object type (2, AAC LC), 4 bits frequency index, 4 bits channels, 3 bits zero.
+    std::string s(4, '0');
+    s[0] = '1';
+    s[1] = kHex[(index >> 1) & 0xF];
+    s[2] = kHex[((index & 1) * 8 + (channels >> 1)) & 0xF];
+    s[3] = kHex[((channels & 1) * 8) & 0xF];
+    return s;
+}
+
+std::string MediaStreamMP4A::GenerateMediaSdp(unsigned payload_type, int with_control) {
+    m_rtp_payload_type = static_cast<int>(payload_type);
+    char line[256];
+    std::string sdp;
+    snprintf(line, sizeof line, "m=audio %u RTP/AVP %u\r\n", m_remote_port, payload_type);
+    sdp += line;
+    snprintf(line, sizeof line, "a=rtpmap:%u MPEG4-GENERIC/%u/%u\r\n", payload_type,
+             static_cast<unsigned>(m_sample_rate), static_cast<unsigned>(m_channels));
+    sdp += line;
+    snprintf(line, sizeof line,
+             "a=fmtp:%u streamtype=5; profile-level-id=1; mode=AAC-hbr; config=%s; SizeLength=13; "
+             "IndexLength=3; IndexDeltaLength=3;\r\n",
+             payload_type, ConfigString(m_sample_rate, m_channels).c_str());
+    sdp += line;
+    if (with_control != 0) {
+        snprintf(line, sizeof line, "a=control:trackID=%d\r\n", static_cast<int>(payload_type) - 95);
+        sdp += line;
+    }
+    return sdp;
+}
+
+int MediaStreamMP4A::TransportData(unsigned char* frame, unsigned len, int timestamp) {
+    TLock::Scoped hold(m_state_lock);
+    if (m_playing == 0 || frame == nullptr || len < kAdtsHeaderSize ||
+        m_packet_size <= kRtpHeaderSize + kAuHeaderSectionSize) {
+        return 0;
+    }
+    unsigned frame_length = ((frame[3] & 0x03u) << 11) | (frame[4] << 3) | (frame[5] >> 5);
+    unsigned header = kAdtsHeaderSize + ((frame[1] & 0x01) == 0 ? 2 : 0);  // CRC when not absent
+    if (frame_length > len) frame_length = len;
+    if (frame_length <= header) return 0;
+    unsigned size = frame_length - header;
+    const unsigned max_piece = m_packet_size - kRtpHeaderSize - kAuHeaderSectionSize;
+    m_au_buffer.ExtendBuffer(max_piece + kAuHeaderSectionSize);
+    unsigned char* out = m_au_buffer.GetData();
+    // RFC 3640 §3.2.1: 16 bits of AU headers; AU-size 13 bits (the whole AU), AU-Index 0.
+    out[0] = 0x00;
+    out[1] = 0x10;
+    out[2] = static_cast<unsigned char>(size >> 5);
+    out[3] = static_cast<unsigned char>((size << 3) & 0xF8);
+    unsigned char* piece = frame + header;
+    unsigned remaining = size;
+    int total = 0;
+    while (remaining > 0) {
+        unsigned n = remaining < max_piece ? remaining : max_piece;
+        for (unsigned i = 0; i < n; ++i) out[kAuHeaderSectionSize + i] = piece[i];
+        remaining -= n;
+        piece += n;
+        total += SendPacket(out, n + kAuHeaderSectionSize, timestamp, remaining == 0 ? 1 : 0);
+    }
+    return total;
+}
