@@ -1,0 +1,42 @@
+#pragma once
+
+#include <netinet/in.h>
+
+#include <map>
+#include <memory>
+#include <string>
+#include <vector>
+
+#include "media/TLock.h"
+
+// One client destination of a send session.
+struct DestSocketInfo {
+    int port;        // host order
+    std::string ip;  // dotted IPv4, as the RTSP layer gave it
+};
+
+// The destinations of a send session, keyed by the requesting RTSP session, and the send
+// thread's own copy of them (ascending key order), refreshed once per loop turn.
+// Thread contract: Add, Del and Clear from any thread, under the owner's class-wide lock
+// (passed in); Refresh and targets() only from the send thread.
+class DestSocketTable {
+public:
+    explicit DestSocketTable(TLock& lock) : lock_(lock) {}
+
+    // A key already present gets the new value.
+    void Add(void* key, int port, const std::string& ip);
+    void Del(void* key);
+    // Forgets every destination; the send thread's copy stays as it is.
+    void Clear();
+    void MarkChanged();
+    // Rebuilds the send thread's copy if anything changed since the last rebuild.
+    void Refresh();
+    const std::vector<sockaddr_in>& targets() const { return targets_; }
+    size_t size();
+
+private:
+    TLock& lock_;
+    std::map<void*, std::unique_ptr<DestSocketInfo>> map_;
+    bool changed_ = true;
+    std::vector<sockaddr_in> targets_;  // send thread only
+};

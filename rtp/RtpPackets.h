@@ -1,0 +1,58 @@
+#pragma once
+
+#include <netinet/in.h>
+
+#include <cstdint>
+#include <vector>
+
+// The packets the two send sessions build, as pure functions over bytes, and the fan-out that
+// sends each packet to every client.
+
+constexpr unsigned kRtpPacketMax = 1500;
+constexpr uint32_t kRtpSsrc = 10;  // every packet of every client
+// 1400 + 12 (RTP) + 2 (FU indicator and header) stays inside a 1500-byte MTU with the IP
+// and UDP headers (20 + 8) and room to spare.
+constexpr unsigned kH264FragmentPayload = 1400;
+constexpr unsigned kAdtsHeaderBytes = 7;
+constexpr unsigned kAacPayloadType = 98;
+// 1500 - 12 (RTP) - 4 (AU headers): the largest raw AAC frame one packet carries.
+constexpr unsigned kAacRawFrameMax = kRtpPacketMax - 16;
+
+// Receives each packet as it is built. Thread contract: the caller's thread.
+class PacketSink {
+public:
+    virtual ~PacketSink() = default;
+    virtual void Send(const unsigned char* packet, unsigned length) = 0;
+};
+
+// RFC 3550 §5.1 header, V=2 and no CSRC; `payload_type` is masked to 7 bits.
+void WriteRtpHeader(unsigned char* p, bool marker, unsigned payload_type, uint16_t sequence,
+                    uint32_t timestamp, uint32_t ssrc);
+
+// One ring item (4-byte start code, then one NAL unit) as RTP (RFC 6184): a single NAL unit
+// packet up to 1400 bytes, else FU-A fragments of 1400 (§5.8). Each packet takes *sequence
+// and increments it.
+void PacketiseH264Item(const unsigned char* item, unsigned length, uint32_t timestamp,
+                       unsigned payload_type, uint16_t* sequence, PacketSink& sink);
+
+// One ADTS frame (no CRC) as one RFC 3640 AAC-hbr packet with one AU header, marker set,
+// payload type 98. Returns the packet length, 0 when the frame is shorter than its header or
+// its raw data does not fit one packet.
+unsigned BuildAacPacket(const unsigned char* frame, unsigned length, uint32_t timestamp,
+                        uint16_t sequence, unsigned char* packet);
+
+// Sends packets with sendto to a list of destinations in order. Video stops a packet at the
+// first failing destination; audio goes on with the others.
+// Thread contract: the send thread that owns it.
+class ClientFanout final : public PacketSink {
+public:
+    ClientFanout(int sockfd, bool stop_at_first_failure, const char* error_text);
+    void SetTargets(const std::vector<sockaddr_in>& targets) { targets_ = &targets; }
+    void Send(const unsigned char* packet, unsigned length) override;
+
+private:
+    int sockfd_;
+    bool stop_at_first_failure_;
+    const char* error_text_;
+    const std::vector<sockaddr_in>* targets_ = nullptr;
+};

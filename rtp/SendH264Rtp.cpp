@@ -1,0 +1,156 @@
+#include "rtp/SendH264Rtp.h"
+
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <memory>
+
+#include "rtp/Base64.h"
+#include "rtp/RtpPackets.h"
+#include "rtp/SendLoopState.h"
+#include "rtp/h264_sps.h"
+#include "service/GlobalConfig.h"
+#include "service/OrvexLog.h"
+
+namespace {
+
+constexpr const char* kTag = "orvex:::SendH264Rtp";
+constexpr useconds_t kIdleSleepUs = 2000;
+
+TLock g_class_lock;
+std::atomic<H264RtpTransportSession*> g_instance{nullptr};
+
+}  // namespace
+
+H264RtpTransportSession* H264RtpTransportSession::instance() {
+    H264RtpTransportSession* p = g_instance.load(std::memory_order_acquire);
+    if (p != nullptr) return p;
+    TLock::Scoped hold(g_class_lock);
+    p = g_instance.load(std::memory_order_relaxed);
+    if (p == nullptr) {
+        p = new H264RtpTransportSession();
+        g_instance.store(p, std::memory_order_release);
+    }
+    return p;
+}
+
+void H264RtpTransportSession::CloseInstance() {
+    delete g_instance.exchange(nullptr, std::memory_order_acq_rel);
+}
+
+H264RtpTransportSession::H264RtpTransportSession() : m_dests(g_class_lock) {}
+
+H264RtpTransportSession::~H264RtpTransportSession() { CloseSendThread(); }
+
+int H264RtpTransportSession::StartSendThread() {
+    if (m_thread_started) return 0;  // one send thread at a time
+    m_running.store(1, std::memory_order_relaxed);
+    m_dests.MarkChanged();
+    m_sps_seen = false;
+    int rc = pthread_create(&m_thread, nullptr, event_loop_thread, this);
+    m_thread_started = rc == 0;
+    return rc;
+}
+
+void H264RtpTransportSession::CloseSendThread() {
+    m_running.store(0, std::memory_order_relaxed);
+    if (m_thread_started) {
+        pthread_join(m_thread, nullptr);
+        m_thread_started = false;
+        OrvexPrint("\n H264RtpTransportSession CloseThread() \n ");
+    }
+    m_dests.Clear();
+}
+
+void H264RtpTransportSession::add_dest_socket_info(void* key, int port, std::string ip) {
+    m_dests.Add(key, port, ip);
+}
+
+void H264RtpTransportSession::del_dest_socket_info(void* key) { m_dests.Del(key); }
+
+void* H264RtpTransportSession::event_loop_thread(void* self) {
+    static_cast<H264RtpTransportSession*>(self)->procH264Thread();
+    OrvexPrintLog(kTag, "\n H264RtpTransportSession::event_loop_thread \n ");
+    return nullptr;
+}
+
+void H264RtpTransportSession::InspectParameterSets(const Buffer_Item& item) {
+    if (item.length < 5) return;
+    unsigned n = static_cast<unsigned>(item.length) - 4;
+    unsigned type = item.data[4] & 0x1F;
+    if (!m_sps_seen && type == 7) {
+        h264_sps_t sps;
+        m_time_scale = h264_parse_sps(item.data + 5, n - 1, m_time_scale, &sps);
+        if (m_time_scale == 0) {
+            OrvexPrint("The SPS's time_scale field info is error!");
+        } else {
+            Base64Encode(item.data + 4, n, m_sps_base64);
+            m_sps_seen = true;
+        }
+    }
+    if (!m_pps_seen && type == 8) {
+        Base64Encode(item.data + 4, n, m_pps_base64);
+        m_pps_seen = true;
+    }
+}
+
+void H264RtpTransportSession::procH264Thread() {
+    int sock = socket(AF_INET, SOCK_DGRAM, 0);
+    m_sps_seen = true;  // inspection stays dormant unless a flag is cleared
+    m_pps_seen = true;
+    m_time_scale = 1;
+    Global_Config* config = Global_Config::instance();
+    const unsigned rate = config->m_video_rtp_frequency;
+    const unsigned payload_type = static_cast<unsigned>(config->m_video_payload_type);
+    // A megabyte: on the heap, as a 32-bit thread stack may not hold it.
+    auto item = std::make_unique<Buffer_Item>();
+    ClientFanout fanout(sock, true, "\n  h264 frame send error ! \n ");
+    fanout.SetTargets(m_dests.targets());
+    H264SendState state;
+    uint32_t ts = 0;
+    uint16_t sequence = 0;
+
+    bool recompute = true;
+    unsigned video_ms = 0;
+    while (m_running.load(std::memory_order_relaxed) == 1) {
+        // The position is not recomputed after a sleep, only after a sent item.
+        if (recompute) video_ms = PositionMs(ts, rate);
+        recompute = false;
+        unsigned audio_ms = config->get_timestamp(false);
+        if (state.MustWaitForAudio(video_ms, audio_ms)) {
+            if (GET_ORVEX_API_DEBUG_PRINTF() == 1) {
+                OrvexPrintLog(kTag, "Video and audio timestamp compare: audio delay %d \n",
+                              static_cast<int32_t>(video_ms - audio_ms));
+            }
+            usleep(kIdleSleepUs);
+            continue;
+        }
+        m_dests.Refresh();
+        if (m_ring == nullptr || !m_ring->newread(*item)) {
+            usleep(kIdleSleepUs);
+            continue;
+        }
+        if (state.TakeFirstItem()) {
+            OrvexPrint("*****h264 set current signal status 1 ");
+            OrvexLog(kTag, "*****h264 set current signal status 1 \n");
+            config->set_current_signal_status(1);
+        }
+        if (state.Admit(config->isPause()) == H264SendState::kDrop) {
+            usleep(kIdleSleepUs);
+            continue;
+        }
+        InspectParameterSets(*item);
+        if (m_dests.targets().empty()) {
+            usleep(kIdleSleepUs);
+            continue;
+        }
+        AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);
+        config->set_timestamp(PositionMs(ts, rate), true);
+        PacketiseH264Item(item->data, static_cast<unsigned>(item->length), ts, payload_type, &sequence,
+                          fanout);
+        state.AfterSend(&sequence);
+        recompute = true;
+    }
+    close(sock);
+    OrvexPrint("\n exit H264RtpTransportSession::SendH264RTPPACKET ");
+}

@@ -1,0 +1,128 @@
+#include "rtp/SendMP3Rtp.h"
+
+#include <netinet/in.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <memory>
+
+#include "rtp/RtpPackets.h"
+#include "rtp/SendLoopState.h"
+#include "service/GlobalConfig.h"
+#include "service/OrvexLog.h"
+
+namespace {
+
+constexpr const char* kTag = "orvex:::SendMP3Rtp";
+constexpr useconds_t kIdleSleepUs = 5000;
+
+TLock g_class_lock;
+std::atomic<MP3RtpTransportSession*> g_instance{nullptr};
+
+}  // namespace
+
+MP3RtpTransportSession* MP3RtpTransportSession::instance() {
+    MP3RtpTransportSession* p = g_instance.load(std::memory_order_acquire);
+    if (p != nullptr) return p;
+    TLock::Scoped hold(g_class_lock);
+    p = g_instance.load(std::memory_order_relaxed);
+    if (p == nullptr) {
+        p = new MP3RtpTransportSession();
+        g_instance.store(p, std::memory_order_release);
+    }
+    return p;
+}
+
+void MP3RtpTransportSession::CloseInstance() {
+    delete g_instance.exchange(nullptr, std::memory_order_acq_rel);
+}
+
+MP3RtpTransportSession::MP3RtpTransportSession() : m_dests(g_class_lock) {}
+
+MP3RtpTransportSession::~MP3RtpTransportSession() { CloseSendThread(); }
+
+int MP3RtpTransportSession::StartSendThread() {
+    if (m_thread_started) return 0;  // one send thread at a time
+    // Unlike the video session, the destination copy is not marked for a rebuild here.
+    m_running.store(1, std::memory_order_relaxed);
+    int rc = pthread_create(&m_thread, nullptr, event_loop_thread, this);
+    m_thread_started = rc == 0;
+    return rc;
+}
+
+void MP3RtpTransportSession::CloseSendThread() {
+    m_running.store(0, std::memory_order_relaxed);
+    if (m_thread_started) {
+        pthread_join(m_thread, nullptr);
+        m_thread_started = false;
+        OrvexPrint("\n MP3RtpTransportSession CloseThread() \n ");
+    }
+    m_dests.Clear();
+}
+
+void MP3RtpTransportSession::add_dest_socket_info(void* key, int port, std::string ip) {
+    m_dests.Add(key, port, ip);
+}
+
+void MP3RtpTransportSession::del_dest_socket_info(void* key) { m_dests.Del(key); }
+
+void* MP3RtpTransportSession::event_loop_thread(void* self) {
+    static_cast<MP3RtpTransportSession*>(self)->procMP3Thread();
+    return nullptr;
+}
+
+void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, int sockfd,
+                                              uint32_t timestamp, uint16_t sequence) {
+    unsigned char packet[kRtpPacketMax];
+    unsigned length = BuildAacPacket(item.data, static_cast<unsigned>(item.length), timestamp,
+                                     sequence, packet);
+    if (length == 0) {
+        // Not an ADTS frame that fits one packet: dropped, the stream goes on.
+        OrvexLog(kTag, "\n  mp3 frame of %d bytes dropped ! \n", static_cast<int>(item.length));
+        return;
+    }
+    ClientFanout fanout(sockfd, false, "\n  mp3 frame send error ! \n ");
+    fanout.SetTargets(m_dests.targets());
+    fanout.Send(packet, length);
+}
+
+void MP3RtpTransportSession::procMP3Thread() {
+    Global_Config* config = Global_Config::instance();
+    int sock = socket(AF_INET, SOCK_DGRAM, 0);
+    sockaddr_in local{};
+    local.sin_family = AF_INET;
+    local.sin_port = htons(static_cast<uint16_t>(config->m_audio_rtp_port));
+    local.sin_addr.s_addr = htonl(INADDR_ANY);
+    (void)bind(sock, reinterpret_cast<sockaddr*>(&local), sizeof local);  // unchecked, as ever
+    const unsigned rate = config->m_audio_rtp_frequency;
+    auto item = std::make_unique<Buffer_Item>();
+    AacSendState state;
+    uint32_t ts = 0;
+    uint16_t sequence = 0;
+
+    bool recompute = true;
+    unsigned audio_ms = 0;
+    while (m_running.load(std::memory_order_relaxed) == 1) {
+        if (recompute) audio_ms = PositionMs(ts, rate);
+        recompute = false;
+        unsigned video_ms = config->get_timestamp(true);
+        if (state.VideoLags(audio_ms, video_ms) && GET_ORVEX_API_DEBUG_PRINTF() == 1) {
+            // The number shown is the video position itself; operators read it that way.
+            OrvexPrintLog(kTag, "Video and audio timestamp compare: video delay %d \n",
+                          static_cast<int>(video_ms));
+        }
+        GetSocketInfoList();
+        bool got = m_ring != nullptr && m_ring->newread(*item);
+        if (!got || config->isPause() || !config->InIISOK() || m_dests.targets().empty()) {
+            usleep(kIdleSleepUs);
+            continue;
+        }
+        AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);
+        config->set_timestamp(PositionMs(ts, rate), false);
+        sendMP3RtpPacket(*item, sock, ts, sequence);
+        state.AfterSend(&sequence);
+        recompute = true;
+    }
+    close(sock);
+    OrvexPrint("\n exit MP3RtpTransportSession::SendAACRTPPACKET ");
+}

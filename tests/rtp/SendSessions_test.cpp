@@ -1,0 +1,189 @@
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <thread>
+#include <vector>
+
+#include "platform/fake/FakePlatform.h"
+#include "rtp/SendH264Rtp.h"
+#include "rtp/SendMP3Rtp.h"
+#include "service/GlobalConfig.h"
+#include "tests/rtp/UdpReceiver.h"
+
+namespace {
+
+using Bytes = std::vector<unsigned char>;
+
+void* Key(int n) { return reinterpret_cast<void*>(static_cast<uintptr_t>(n)); }
+int Seq(const Bytes& p) { return (p[2] << 8) | p[3]; }
+uint32_t Ts(const Bytes& p) {
+    return (uint32_t{p[4]} << 24) | (uint32_t{p[5]} << 16) | (uint32_t{p[6]} << 8) | p[7];
+}
+
+Bytes NalItem(unsigned nal_size, unsigned char header) {
+    Bytes b = {0, 0, 0, 1, header};
+    b.resize(4 + nal_size, 0x42);
+    return b;
+}
+
+// ADTS frame (no CRC) of `size` bytes.
+Bytes AdtsFrame(unsigned size) {
+    Bytes b(size, 0x21);
+    b[0] = 0xFF;
+    b[1] = 0xF1;
+    return b;
+}
+
+class SendSessionTest : public ::testing::Test {
+protected:
+    SendSessionTest() {
+        Global_Config::CloseInstance();
+        config = Global_Config::instance();
+        config->m_video_rtp_frequency = 90000;
+        config->m_audio_rtp_frequency = 48000;
+        config->m_audio_rtp_port = 0;  // any port: tests may run side by side
+        config->mp3_config_ok();
+        config->h264_config_frequency_ok();
+        video = H264RtpTransportSession::instance();
+        audio = MP3RtpTransportSession::instance();
+        video->SetInputRing(&video_ring);
+        audio->SetInputRing(&audio_ring);
+    }
+    ~SendSessionTest() override {
+        H264RtpTransportSession::CloseInstance();
+        MP3RtpTransportSession::CloseInstance();
+        Global_Config::CloseInstance();
+    }
+    void Feed(cycle_buffer& ring, const Bytes& item, unsigned ms) {
+        ASSERT_TRUE(ring.newwrite(item.data(), static_cast<int>(item.size()), ms, false));
+    }
+    static void WaitEmpty(cycle_buffer& ring) {
+        for (int i = 0; i < 2000 && ring.used_space() > 0; ++i) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(1));
+        }
+    }
+
+    platform::fake::FakePlatform fake;
+    Global_Config* config;
+    cycle_buffer video_ring{8000000};
+    cycle_buffer audio_ring{500000};
+    H264RtpTransportSession* video;
+    MP3RtpTransportSession* audio;
+};
+
+TEST_F(SendSessionTest, VideoPacketsReachEveryDestinationWithItemTimestamps) {
+    UdpReceiver a, b;
+    config->set_timestamp(1000000, false);  // audio far ahead: no pacing here
+    video->add_dest_socket_info(Key(1), a.port(), "127.0.0.1");
+    video->add_dest_socket_info(Key(2), b.port(), "127.0.0.1");
+    ASSERT_EQ(video->StartSendThread(), 0);
+    Feed(video_ring, NalItem(1400, 0x65), 1000);
+    Feed(video_ring, NalItem(1401, 0x41), 1000);
+    Feed(video_ring, NalItem(2800, 0x41), 1033);
+    const std::vector<unsigned> sizes = {1412, 1414, 14, 1414, 1413};
+    const std::vector<uint32_t> stamps = {90000, 90000, 90000, 92970, 92970};
+    for (UdpReceiver* r : {&a, &b}) {
+        for (size_t i = 0; i < sizes.size(); ++i) {
+            Bytes p = r->Receive();
+            ASSERT_EQ(p.size(), sizes[i]) << "packet " << i;
+            EXPECT_EQ(p[1] & 0x7F, 96);
+            EXPECT_EQ(Seq(p), static_cast<int>(i));
+            EXPECT_EQ(Ts(p), stamps[i]);
+            EXPECT_EQ(Bytes(p.begin() + 8, p.begin() + 12), (Bytes{0, 0, 0, 10}));
+        }
+    }
+    EXPECT_EQ(config->get_timestamp(true), 1033u);
+    EXPECT_EQ(config->current_signal_status(), 1);
+}
+
+// A broadcast address without SO_BROADCAST fails every time, deterministically.
+TEST_F(SendSessionTest, VideoStopsAPacketAtTheFirstFailingDestinationAudioGoesOn) {
+    UdpReceiver ok;
+    config->set_timestamp(1000000, false);
+    video->add_dest_socket_info(Key(1), 9, "255.255.255.255");
+    video->add_dest_socket_info(Key(2), ok.port(), "127.0.0.1");
+    audio->add_dest_socket_info(Key(1), 9, "255.255.255.255");
+    audio->add_dest_socket_info(Key(2), ok.port(), "127.0.0.1");
+    ::testing::internal::CaptureStdout();
+    ASSERT_EQ(video->StartSendThread(), 0);
+    Feed(video_ring, NalItem(100, 0x41), 10);  // sequence 0: reaches nobody
+    WaitEmpty(video_ring);
+    video->del_dest_socket_info(Key(1));
+    Feed(video_ring, NalItem(100, 0x41), 20);
+    Bytes p = ok.Receive();
+    ASSERT_EQ(p.size(), 112u);
+    EXPECT_EQ(Seq(p), 1);
+
+    ASSERT_EQ(audio->StartSendThread(), 0);
+    Feed(audio_ring, AdtsFrame(200), 10);
+    p = ok.Receive();
+    ASSERT_EQ(p.size(), 209u);
+    EXPECT_EQ(Bytes(p.begin(), p.begin() + 2), (Bytes{0x80, 0xE2}));
+    EXPECT_EQ(Bytes(p.begin() + 12, p.begin() + 16), (Bytes{0x00, 0x10, 0x06, 0x08}));
+    video->CloseSendThread();
+    audio->CloseSendThread();
+    std::string out = ::testing::internal::GetCapturedStdout();
+    EXPECT_NE(out.find("\n\n  h264 frame send error ! \n \n"), std::string::npos);
+    EXPECT_NE(out.find("\n\n  mp3 frame send error ! \n \n"), std::string::npos);
+}
+
+TEST_F(SendSessionTest, VideoHoldsWhile251MsAheadOfAudio) {
+    UdpReceiver r;
+    video->add_dest_socket_info(Key(1), r.port(), "127.0.0.1");
+    ASSERT_EQ(video->StartSendThread(), 0);
+    Feed(video_ring, NalItem(10, 0x41), 1000);
+    Feed(video_ring, NalItem(10, 0x41), 2000);
+    Feed(video_ring, NalItem(10, 0x41), 3000);
+    EXPECT_EQ(Ts(r.Receive()), 90000u);
+    EXPECT_EQ(Ts(r.Receive()), 180000u);
+    EXPECT_TRUE(r.Receive(150).empty());  // 2000 ms ahead of audio at 0: the item waits
+    EXPECT_GT(video_ring.used_space(), 0u);
+    config->set_timestamp(1750, false);   // 250 ms behind: close enough
+    EXPECT_EQ(Ts(r.Receive()), 270000u);
+}
+
+TEST_F(SendSessionTest, WithoutDestinationsItemsAreDiscardedAndTheGapCounts) {
+    config->set_timestamp(1000000, false);
+    ASSERT_EQ(video->StartSendThread(), 0);
+    Feed(video_ring, NalItem(10, 0x41), 500);
+    Feed(video_ring, NalItem(10, 0x41), 600);
+    WaitEmpty(video_ring);
+    UdpReceiver r;
+    video->add_dest_socket_info(Key(1), r.port(), "127.0.0.1");
+    Feed(video_ring, NalItem(10, 0x41), 700);
+    Bytes p = r.Receive();
+    EXPECT_EQ(Seq(p), 0);
+    // The discarded items did not move the item time: 700 ms from 0, 90000 x 0.7 truncated.
+    EXPECT_EQ(Ts(p), 62999u);
+}
+
+TEST_F(SendSessionTest, AudioDropsFramesWhilePausedOrNotReady) {
+    UdpReceiver r;
+    audio->add_dest_socket_info(Key(1), r.port(), "127.0.0.1");
+    ASSERT_EQ(audio->StartSendThread(), 0);
+    config->set_pause_stat(true);
+    Feed(audio_ring, AdtsFrame(50), 100);
+    WaitEmpty(audio_ring);
+    config->set_pause_stat(false);
+    Feed(audio_ring, AdtsFrame(60), 200);
+    Bytes p = r.Receive();
+    ASSERT_EQ(p.size(), 69u);   // the paused frame never went out
+    EXPECT_EQ(Ts(p), 9600u);    // 200 ms at 48 kHz: the dropped frame did not count
+    EXPECT_EQ(config->get_timestamp(false), 200u);
+    EXPECT_EQ(Seq(p), 0);
+}
+
+TEST_F(SendSessionTest, AudioWaitsForBothClockRates) {
+    Global_Config::CloseInstance();
+    config = Global_Config::instance();
+    config->m_audio_rtp_frequency = 48000;
+    config->mp3_config_ok();  // the video rate is still missing
+    UdpReceiver r;
+    audio->add_dest_socket_info(Key(1), r.port(), "127.0.0.1");
+    ASSERT_EQ(audio->StartSendThread(), 0);
+    Feed(audio_ring, AdtsFrame(70), 300);
+    WaitEmpty(audio_ring);
+    EXPECT_TRUE(r.Receive(100).empty());
+}
+
+}  // namespace
