@@ -1,0 +1,253 @@
+#include "rtsp/RtspSession.h"
+
+#include <arpa/inet.h>
+#include <sys/time.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <cstring>
+
+#include "capture/LivecameraResolution.h"
+#include "rtp/SendH264Rtp.h"
+#include "rtp/SendMP3Rtp.h"
+#include "rtsp/KeyWordValue.h"
+#include "service/GlobalConfig.h"
+#include "service/OrvexLog.h"
+
+std::atomic<unsigned char> g_url_check_switch{0};
+
+namespace {
+
+constexpr const char* kTag = "orvex:::RtspSession";
+
+std::string Dotted(const sockaddr_in& a) {
+    char text[INET_ADDRSTRLEN] = {};
+    inet_ntop(AF_INET, &a.sin_addr, text, sizeof text);
+    return text;
+}
+
+unsigned CameraCode(const std::string& v) {
+    if (v == "hd0") return 5;
+    if (v == "hd1") return 6;
+    if (v == "hd2") return 7;
+    if (v == "sd") return 3;
+    return 0;
+}
+
+// "allwithoutosd" is 13 characters and query values are cut at 10, so code 2 cannot come
+// from a URL; the comparison is kept as it is.
+unsigned WindowCode(const std::string& v) {
+    if (v == "sub") return 4;
+    if (v == "main") return 6;
+    if (v == "allwithosd") return 1;
+    if (v == "allwithoutosd") return 2;
+    return 0;
+}
+
+unsigned Number(const std::string& v) { return static_cast<unsigned>(atoi(v.c_str())); }
+
+}  // namespace
+
+RtspSession::RtspSession(int fd, sockaddr_in first, sockaddr_in second, MediaSessionList* list)
+    : m_fd(fd), m_response(std::make_unique<RtspResponse>(fd, first, second)), m_list(list) {}
+
+RtspSession::~RtspSession() {
+    OrvexPrint("\n RtspSession::~RtspSession() ");
+    H264RtpTransportSession::instance()->del_dest_socket_info(this);
+    MP3RtpTransportSession::instance()->del_dest_socket_info(this);
+    m_response.reset();  // closes the connection
+}
+
+int RtspSession::RtspSessionThread(int& type) {
+    type = 0;
+    if (!m_response->GetRequests()) {
+        OrvexPrintLog(kTag, "\n m_pRtspResponse->GetRequests() ");
+        return -1;
+    }
+    if (!m_response->GetRequestType(&type)) {
+        OrvexPrintLog(kTag, "\n m_pRtspResponse->GetRequestType() %d \n", type);
+        return -1;
+    }
+    m_last_activity = static_cast<int>(GetTimeHeartbeatSec());
+    switch (type) {
+        case kRtspOptions:
+            m_response->ResponseOptions();
+            return 0;
+        case kRtspDescribe: {
+            std::string sdp;
+            if (!TransportDescribe(&sdp)) return -1;
+            m_response->ResponseDescribe(sdp.c_str(), static_cast<unsigned>(sdp.size()));
+            return 0;
+        }
+        case kRtspSetup:
+            ResponseSetup();
+            return 0;
+        case kRtspGetParameter:
+            m_response->ResponsePause();  // the plain answer serves as keep-alive
+            return 0;
+        case kRtspTeardown:
+            // Never answered: the connection is simply closed.
+            usleep(100000);
+            OrvexPrintLog(kTag, "\n rtsp server ResponseTeardown ");
+            return -1;
+        case kRtspPlay:
+            if (TransportPlay()) {
+                m_response->ResponsePlay(m_rtp_info.c_str());
+                usleep(10000);
+            }
+            return 0;
+        case kRtspPause:
+            if (TransportPause()) m_response->ResponsePause();
+            return 0;
+        default:
+            OrvexPrintLog(kTag, "\n rtsp method not support ");
+            return -1;
+    }
+}
+
+bool RtspSession::TransportDescribe(std::string* sdp) {
+    // rtsp://host/name.seconds?query: the text after the first '.' carries time and query.
+    std::string name, time_text;
+    m_response->GetRequestSessionName(&name, time_text);
+    if (g_url_check_switch.load(std::memory_order_relaxed) != 0) {
+        int stamp = atoi(time_text.c_str());
+        timeval now{};
+        gettimeofday(&now, nullptr);
+        int now_sec = static_cast<int>(now.tv_sec);
+        OrvexPrintLog(kTag, "\n timesec:%d,nowsec:%d,\n", stamp, now_sec);
+        if (now_sec < stamp) {
+            OrvexPrintLog(kTag, "\n  live auth error --1 ! ");
+            return false;
+        }
+        if (static_cast<int64_t>(now_sec) - stamp >= 11) {
+            OrvexPrintLog(kTag, "\n  live auth error --3 ! ");
+            return false;
+        }
+    }
+    static const char* kKeys[] = {"width=",     "height=",    "cameraid=",    "win=",      "sub=",
+                                  "dumpvideo=", "dumpaudio=", "specialcase=", "framerate="};
+    std::string values[9];
+    for (int i = 0; i < 9; ++i) {
+        values[i] = getKeyWordValue(kKeys[i], time_text);
+        if (values[i] == "failed") {
+            OrvexPrintLog(kTag, "get %s failed \n ", kKeys[i]);
+            return false;
+        }
+    }
+    int refused = set_video_resolution_support_more(
+        Number(values[0]), Number(values[1]), CameraCode(values[2]), WindowCode(values[3]),
+        Number(values[4]), Number(values[5]), Number(values[6]),
+        values[7] == "followmain" ? 1u : 0u, Number(values[8]));
+    if (refused != 0) {
+        m_response->ResponseError("RTSP/1.0 405  resolvration error !");
+        return false;
+    }
+    MediaSession* session = m_list->FindMediaSession(name.c_str());
+    if (session == nullptr) {
+        m_response->ResponseError("RTSP/1.0 404 File Url Not Found, Or In Incorrect Format");
+        return false;
+    }
+    m_session_name = name;
+    std::string local = Dotted(m_response->GetBindAddr());
+    std::string client = Dotted(m_response->GetConnectAddr());
+    *sdp = session->GenerateMediaSdp(local.c_str(), client.c_str(), 1);
+    if (sdp->empty()) return false;
+    m_rtp_info.clear();
+    return true;
+}
+
+void RtspSession::ResponseSetup() {
+    std::string name, auth;
+    if (!m_response->GetRequestSessionName(&name, auth)) name = m_session_name;
+    MediaSession* session = m_list->FindMediaSession(name.c_str());
+    if (session == nullptr) {
+        m_response->ResponseError("RTSP/1.0 404 Session Not Found");
+        return;
+    }
+    unsigned server_port = 0;
+    int client_port = 0;
+    if (TransportSetup(session, &server_port, &client_port)) {
+        m_response->ResponseSetup(nullptr, static_cast<int>(server_port), nullptr, client_port, 1);
+    }
+}
+
+bool RtspSession::TransportSetup(MediaSession* session, unsigned* server_port, int* client_port) {
+    std::string stream;
+    m_response->GetRequestStreamName(&stream);
+    size_t track = stream.find("trackID=");
+    if (track != std::string::npos) {
+        // trackID=1 is the first stream.
+        int index = atoi(stream.c_str() + track + 8) - 1;
+        MediaStream* s = index >= 0 ? session->GetMediaStream(static_cast<unsigned>(index)) : nullptr;
+        if (s == nullptr) {
+            m_response->ResponseError("RTSP/1.0 404 Stream Not Found");
+            return false;
+        }
+        return StreamSetup(s, server_port, client_port);
+    }
+    if (!stream.empty()) {
+        MediaStream* s = session->FindMediaStream(stream.c_str());
+        if (s == nullptr) {
+            m_response->ResponseError("RTSP/1.0 404 Stream Not Found");
+            return false;
+        }
+        return StreamSetup(s, server_port, client_port);
+    }
+    // No stream named: every stream in order, stopping at the first failure.
+    for (int i = 0; i < session->GetMediaStreamCount(); ++i) {
+        if (!StreamSetup(session->GetMediaStream(static_cast<unsigned>(i)), server_port, client_port)) {
+            return false;
+        }
+    }
+    return true;
+}
+
+bool RtspSession::StreamSetup(MediaStream* stream, unsigned* server_port, int* client_port) {
+    std::string client = Dotted(m_response->GetConnectAddr());
+    int rtp = 0, rtcp = 0;
+    if (!m_response->GetRequestTransportInfo(&rtp, &rtcp)) {
+        m_response->ResponseError("RTSP/1.0 400 Bad Request");
+        return false;
+    }
+    Global_Config* config = Global_Config::instance();
+    std::string codec = stream->GetName();
+    unsigned port = 8000;
+    if (codec == "h264") {
+        port = config->m_h264_rtp_port;
+        H264RtpTransportSession::instance()->SetServerPort(port);
+        H264RtpTransportSession::instance()->add_dest_socket_info(this, rtp, client);
+    } else if (codec == "aac") {
+        port = config->m_audio_rtp_port;
+        MP3RtpTransportSession::instance()->SetServerPort(port);
+        MP3RtpTransportSession::instance()->add_dest_socket_info(this, rtp, client);
+    }
+    std::string mrl;
+    m_response->GetRequestMrl(&mrl);
+    if (!m_rtp_info.empty()) m_rtp_info += ",";
+    m_rtp_info += "url=" + mrl;
+    *server_port = port;
+    *client_port = rtp;
+    return true;
+}
+
+MediaSession* RtspSession::NamedSession() {
+    std::string name, auth;
+    if (!m_response->GetRequestSessionName(&name, auth)) {
+        m_response->ResponseError("RTSP/1.0 400 Bad Request");
+        return nullptr;
+    }
+    MediaSession* session = m_list->FindMediaSession(name.c_str());
+    if (session == nullptr) m_response->ResponseError("RTSP/1.0 404 Session Not Found");
+    return session;
+}
+
+bool RtspSession::TransportPlay() { return NamedSession() != nullptr; }
+
+bool RtspSession::TransportPause() {
+    MediaSession* session = NamedSession();
+    if (session == nullptr) return false;
+    for (int i = 0; i < session->GetMediaStreamCount(); ++i) {
+        session->GetMediaStream(static_cast<unsigned>(i))->TransportStop();
+    }
+    return true;
+}
