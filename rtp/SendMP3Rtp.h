@@ -21,7 +21,10 @@ public:
     void SetInputRing(cycle_buffer* ring) { m_ring = ring; }
     cycle_buffer* GetInputRing() const { return m_ring; }
 
+    // The item time that playing starts from, so the first RTP timestamp counts from it.
+    void SetBaseTime(uint32_t ms) { m_last_item_time = ms; }
     int StartSendThread();
+    bool sending() const { return m_thread_started; }
     void CloseSendThread();
     void add_dest_socket_info(void* key, int port, std::string ip);
     void del_dest_socket_info(void* key);

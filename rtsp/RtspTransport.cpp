@@ -1,0 +1,318 @@
+#include "rtsp/RtspTransport.h"
+
+#include <arpa/inet.h>
+#include <netinet/tcp.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstring>
+#include <vector>
+
+#include "capture/livepipmanager.h"
+#include "platform/LogPort.h"
+#include "rtp/SendH264Rtp.h"
+#include "rtp/SendMP3Rtp.h"
+#include "rtsp/RtspResponse.h"
+#include "rtsp/RtspSession.h"
+#include "server/QuitFlag.h"
+#include "service/GlobalConfig.h"
+#include "service/OrvexLog.h"
+
+std::atomic<int> g_capture_running{0};
+std::atomic<unsigned> g_accepts_without_clients{0};
+
+namespace {
+
+constexpr const char* kTag = "orvex:::RtspTransport";
+constexpr int kMaxClients = 5;
+std::atomic<int> g_select_wait_ms{2000};
+
+void ResetOnClose(int fd) {
+    linger reset{1, 0};
+    setsockopt(fd, SOL_SOCKET, SO_LINGER, &reset, sizeof reset);
+}
+
+std::string Dotted(const sockaddr_in& a) {
+    char text[INET_ADDRSTRLEN] = {};
+    inet_ntop(AF_INET, &a.sin_addr, text, sizeof text);
+    return text;
+}
+
+// Three tries, 1 ms apart; a frame that finds no room is dropped whole.
+int AddWithRetries(cycle_buffer& ring, unsigned char* data, unsigned len, unsigned timestamp) {
+    if (data == nullptr || len == 0) return 0;
+    for (int attempt = 0; attempt < 3; ++attempt) {
+        if (ring.newwrite(data, static_cast<int>(len), timestamp, false)) return 1;
+        usleep(1000);
+    }
+    return 0;
+}
+
+}  // namespace
+
+void RtspTransport::SetSelectWaitMs(int ms) { g_select_wait_ms.store(ms, std::memory_order_relaxed); }
+
+void CloseVideoAndAudioDecodeAndSend() {
+    g_capture_running.store(0, std::memory_order_relaxed);
+    H264RtpTransportSession* video = H264RtpTransportSession::instance();
+    MP3RtpTransportSession* audio = MP3RtpTransportSession::instance();
+    video->CloseSendThread();
+    audio->CloseSendThread();
+    Global_Config* config = Global_Config::instance();
+    config->video_audio_close_cap();
+    if (video->GetInputRing() != nullptr) video->GetInputRing()->reset();
+    if (audio->GetInputRing() != nullptr) audio->GetInputRing()->reset();
+    config->SetTVParameterDefault();
+    config->set_pause_stat(false);
+}
+
+RtspTransport::RtspTransport() = default;
+
+RtspTransport::~RtspTransport() {
+    // Capture was stopped by CloseAll; here only the thread and the sockets go.
+    m_running.store(0, std::memory_order_relaxed);
+    if (m_thread_started) pthread_join(m_thread, nullptr);
+    Close();
+}
+
+int RtspTransport::listen_port() const { return ntohs(m_listen_addr.sin_port); }
+
+bool RtspTransport::Open(const char* ip, unsigned port, unsigned extra) {
+    if (m_opened != 0) return true;
+    m_address = ip != nullptr ? ip : "";
+    m_port = port;
+    m_extra = extra;
+    if (m_listen_fd >= 0) close(m_listen_fd);
+    m_listen_fd = socket(AF_INET, SOCK_STREAM, 0);
+    if (m_listen_fd < 0) {
+        OrvexPrint("failed to create socket");
+        Close();
+        return false;
+    }
+    int on = 1;
+    if (setsockopt(m_listen_fd, SOL_SOCKET, SO_REUSEADDR, &on, sizeof on) != 0) {
+        OrvexLogPriority(platform::kLogError, "orvex:::RtspSession", "set reuse rtsp address wrong %s",
+                         strerror(errno));
+        return false;
+    }
+    m_listen_addr = sockaddr_in{};
+    m_listen_addr.sin_family = AF_INET;
+    m_listen_addr.sin_port = htons(static_cast<uint16_t>(port));
+    m_listen_addr.sin_addr.s_addr = inet_addr(m_address.c_str());
+    auto fail = [this](const char* text) {
+        OrvexPrint("%s", text);
+        close(m_listen_fd);
+        m_listen_fd = -1;
+        return false;
+    };
+    // Both spellings "rtstptransport" are the texts operators know.
+    if (bind(m_listen_fd, reinterpret_cast<sockaddr*>(&m_listen_addr), sizeof m_listen_addr) != 0) {
+        return fail("\n rtstptransport bind error. ");
+    }
+    if (listen(m_listen_fd, 128) != 0) return fail("\n  rtstptransport listen error. ");
+    socklen_t len = sizeof m_listen_addr;
+    getsockname(m_listen_fd, reinterpret_cast<sockaddr*>(&m_listen_addr), &len);
+    m_running.store(1, std::memory_order_relaxed);
+    if (pthread_create(&m_thread, nullptr, StartListenThread, this) != 0) {
+        OrvexPrintLog(kTag, "in Open()--->thread_create failed ");
+    } else {
+        m_thread_started = true;
+    }
+    OrvexPrint("\nRtspTransport:    Begin listen connect. ip address:%s  port:%d\n", m_address.c_str(),
+               static_cast<int>(port));
+    m_opened = 1;
+    return true;
+}
+
+void* RtspTransport::StartListenThread(void* self) {
+    static_cast<RtspTransport*>(self)->ListenThread();
+    return nullptr;
+}
+
+bool RtspTransport::Close() {
+    if (m_opened == 0) return true;
+    for (auto& entry : m_sessions) delete entry.second;
+    m_sessions.clear();
+    m_addresses.clear();
+    m_client_count.store(0, std::memory_order_relaxed);
+    if (m_listen_fd >= 0) close(m_listen_fd);
+    m_listen_fd = -1;
+    m_opened = 0;
+    return true;
+}
+
+void RtspTransport::CloseAll() {
+    // The listener goes first: it may itself be stopping capture for a departing client, and
+    // the send threads must be stopped by one thread at a time.
+    m_running.store(0, std::memory_order_relaxed);
+    if (m_thread_started) {
+        pthread_join(m_thread, nullptr);
+        m_thread_started = false;
+    }
+    CloseVideoAndAudioDecodeAndSend();
+    Close();
+}
+
+void RtspTransport::ServePipRestart() {
+    Global_Config* config = Global_Config::instance();
+    if (g_pip_stop_flag.exchange(0, std::memory_order_relaxed) != 0) {
+        config->video_audio_close_cap();
+        if (g_follow_main_flag.load(std::memory_order_relaxed) == 1) m_reopen_pending = true;
+    }
+    if (!m_reopen_pending) return;
+    if (--m_reopen_countdown > 0) return;
+    // A fast quit in the meantime (follow-main cleared) cancels the reopen.
+    if (g_follow_main_flag.load(std::memory_order_relaxed) == 1) {
+        m_reopened = 1;
+        config->video_audio_open_cap();
+    }
+    m_reopen_countdown = 3;
+    m_reopen_pending = false;
+}
+
+void RtspTransport::ListenThread() {
+    while (m_running.load(std::memory_order_relaxed) == 1) {
+        ServePipRestart();
+        fd_set ready;
+        FD_ZERO(&ready);
+        int max_fd = m_listen_fd;
+        FD_SET(m_listen_fd, &ready);
+        for (const auto& entry : m_sessions) {
+            FD_SET(entry.first, &ready);
+            if (entry.first > max_fd) max_fd = entry.first;
+        }
+        int wait_ms = g_select_wait_ms.load(std::memory_order_relaxed);
+        timeval wait{wait_ms / 1000, (wait_ms % 1000) * 1000};
+        int n = select(max_fd + 1, &ready, nullptr, nullptr, &wait);
+        if (n >= 0 && ProcessReadRtspSession(ready) != 0) {
+            ProcessNewIncomingRtspSession(m_listen_fd, ready, max_fd);
+        }
+    }
+    OrvexPrint("\n quit all orvex loop ! ");
+    // The process ends with its listener.
+    ClearLiveQuitFlag();
+}
+
+int RtspTransport::ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, int& maxFd) {
+    if (!FD_ISSET(listenFd, &ready)) return 0;
+    sockaddr_in peer{};
+    socklen_t len = sizeof peer;
+    int fd = accept(listenFd, reinterpret_cast<sockaddr*>(&peer), &len);
+    if (fd < 1) return 0;
+    int count = m_client_count.load(std::memory_order_relaxed);
+    if (count == 0) g_accepts_without_clients.fetch_add(1, std::memory_order_relaxed);
+    if (count > kMaxClients - 1) {
+        OrvexPrint("\n CloseSockid,socketid:%d,\n", fd);
+        ResetOnClose(fd);
+        close(fd);
+        return 0;
+    }
+    std::string ip = Dotted(peer);
+    OrvexPrint("\n rtsp session new connection client[%d] %s:%d --2 \n", count, ip.c_str(),
+               ntohs(peer.sin_port));
+    if (fd > maxFd) maxFd = fd;
+    int old = FindSameIpFromMap(m_addresses, ip.c_str());
+    if (old >= 0) {
+        // A client that reconnects never holds two sessions: the old one is reset and goes.
+        OrvexPrint("\n rtsp session find same addr:%s,\n", ip.c_str());
+        OrvexPrint("\n CloseSockid,socketid:%d,\n", old);
+        ResetOnClose(old);  // the session's own close below resets it
+        ProcessDelRtspSession(old);
+        if (m_client_count.load(std::memory_order_relaxed) == 0) CloseVideoAndAudioDecodeAndSend();
+    }
+    m_client_count.fetch_add(1, std::memory_order_relaxed);
+    // A vanished peer is noticed within about six seconds.
+    int on = 1, idle = 1, interval = 1, probes = 5;
+    setsockopt(fd, SOL_SOCKET, SO_KEEPALIVE, &on, sizeof on);
+    setsockopt(fd, IPPROTO_TCP, TCP_KEEPIDLE, &idle, sizeof idle);
+    setsockopt(fd, IPPROTO_TCP, TCP_KEEPINTVL, &interval, sizeof interval);
+    setsockopt(fd, IPPROTO_TCP, TCP_KEEPCNT, &probes, sizeof probes);
+    // Answers go out line by line: without this, Nagle holds the later lines back, and a
+    // connection closed right after an error answer (closes reset) would lose them.
+    setsockopt(fd, IPPROTO_TCP, TCP_NODELAY, &on, sizeof on);
+    m_sessions[fd] = new RtspSession(fd, m_listen_addr, peer, this);
+    m_addresses[fd] = ip;
+    return 1;
+}
+
+void RtspTransport::StartStreaming(int fd) {
+    Global_Config* config = Global_Config::instance();
+    sockaddr_in local{};
+    socklen_t len = sizeof local;
+    if (getsockname(fd, reinterpret_cast<sockaddr*>(&local), &len) == 0) {
+        config->m_server_address = Dotted(local);
+    }
+    if (g_capture_running.load(std::memory_order_relaxed) != 0) return;
+    g_capture_running.store(1, std::memory_order_relaxed);
+    H264RtpTransportSession* video = H264RtpTransportSession::instance();
+    MP3RtpTransportSession* audio = MP3RtpTransportSession::instance();
+    uint32_t now = GetTimeStampMillsec();
+    video->SetBaseTime(now);
+    audio->SetBaseTime(now);
+    if (video->GetInputRing() != nullptr) video->GetInputRing()->reset();
+    if (audio->GetInputRing() != nullptr) audio->GetInputRing()->reset();
+    video->StartSendThread();
+    audio->StartSendThread();
+    config->video_audio_open_cap();
+}
+
+int RtspTransport::ProcessReadRtspSession(fd_set& ready) {
+    std::vector<int> fds;
+    for (const auto& entry : m_sessions) fds.push_back(entry.first);
+    // In descriptor order; a ready client is served until it leaves.
+    for (int fd : fds) {
+        if (!FD_ISSET(fd, &ready)) continue;
+        for (;;) {
+            auto it = m_sessions.find(fd);
+            if (it == m_sessions.end()) break;
+            int type = 0;
+            errno = 0;
+            int result = it->second->RtspSessionThread(type);
+            if (result == 0) {
+                if (type == 128 && m_client_count.load(std::memory_order_relaxed) == 1) {
+                    StartStreaming(fd);
+                }
+                // Shutting down: stop serving after the request in progress.
+                if (m_running.load(std::memory_order_relaxed) != 1) return 0;
+                continue;
+            }
+            if (errno == EINTR) continue;
+            CloseVideoAndAudioDecodeAndSend();
+            if (ProcessDelRtspSessionOther(fd) != 0) m_client_count.fetch_sub(1, std::memory_order_relaxed);
+            delete it->second;
+            m_sessions.erase(it);
+            break;
+        }
+    }
+    return m_running.load(std::memory_order_relaxed) == 1 ? 1 : 0;
+}
+
+int RtspTransport::ProcessDelRtspSession(int fd) {
+    auto it = m_sessions.find(fd);
+    if (it == m_sessions.end()) return 0;
+    OrvexPrint("\n RtspSessionMap delete one !");
+    delete it->second;
+    m_sessions.erase(it);
+    ProcessDelRtspSessionOther(fd);
+    m_client_count.fetch_sub(1, std::memory_order_relaxed);
+    return 1;
+}
+
+int RtspTransport::ProcessDelRtspSessionOther(int fd) { return m_addresses.erase(fd) > 0 ? 1 : 0; }
+
+int RtspTransport::FindSameIpFromMap(std::map<int, std::string>& addresses, const char* ip) {
+    for (const auto& entry : addresses) {
+        if (ip != nullptr && entry.second == ip) return entry.first;
+    }
+    return -1;
+}
+
+int RtspTransport::skyvo_add_h264_data(unsigned char* data, unsigned len) {
+    // Time stamp 0: the ring stamps the frame with the monotonic clock.
+    return AddWithRetries(m_video_ring, data, len, 0);
+}
+
+int RtspTransport::skyvo_add_mp3_data(unsigned char* data, unsigned len, unsigned timestamp) {
+    return AddWithRetries(m_audio_ring, data, len, timestamp);
+}

@@ -1,0 +1,82 @@
+#pragma once
+
+#include <netinet/in.h>
+#include <pthread.h>
+#include <sys/select.h>
+
+#include <atomic>
+#include <map>
+#include <string>
+
+#include "media/MediaSessionList.h"
+#include "media/cycle_buffer.h"
+
+class RtspSession;
+
+// Stops capture and both send threads, forgets every RTP destination, empties the send rings
+// and puts the TV settings back. Any departing client does this for all.
+void CloseVideoAndAudioDecodeAndSend();
+
+// The RTSP server: the listening socket, one listener thread that multiplexes it and every
+// client connection, at most five clients (one per IPv4 address), the two media rings, and
+// the rules that start capture with the first PLAY and stop it when a client goes away.
+// A client whose connection becomes readable is served exclusively until it leaves.
+// Thread contract: Open and CloseAll from the controlling thread; the add_* producers from
+// one producer thread each; everything else runs on the listener thread.
+class RtspTransport : public MediaSessionList {
+public:
+    RtspTransport();
+    ~RtspTransport() override;
+
+    bool Open(const char* ip, unsigned port, unsigned extra);
+    static void* StartListenThread(void* self);
+    bool Close();
+    void CloseAll();
+
+    // 1 when the frame was stored, 0 when it was dropped after three tries 1 ms apart.
+    int skyvo_add_h264_data(unsigned char* data, unsigned len);
+    int skyvo_add_mp3_data(unsigned char* data, unsigned len, unsigned timestamp);
+
+    cycle_buffer& video_ring() { return m_video_ring; }
+    cycle_buffer& audio_ring() { return m_audio_ring; }
+    int client_count() const { return m_client_count.load(std::memory_order_relaxed); }
+    int listen_port() const;
+
+    // The listener's select wait, two seconds in service. Tests shorten it.
+    static void SetSelectWaitMs(int ms);
+
+    int ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, int& maxFd);
+    int ProcessReadRtspSession(fd_set& ready);
+    int ProcessDelRtspSession(int fd);
+    int ProcessDelRtspSessionOther(int fd);
+    int FindSameIpFromMap(std::map<int, std::string>& addresses, const char* ip);
+
+private:
+    void ListenThread();
+    void ServePipRestart();
+    void StartStreaming(int fd);
+
+    std::string m_address;
+    unsigned m_port = 0;
+    unsigned m_extra = 0;
+    int m_listen_fd = -1;
+    sockaddr_in m_listen_addr{};
+    int m_opened = 0;
+    std::map<int, RtspSession*> m_sessions;
+    cycle_buffer m_audio_ring{500000};
+    cycle_buffer m_video_ring{8000000};
+    pthread_t m_thread{};
+    bool m_thread_started = false;
+    std::atomic<int> m_running{0};
+    std::atomic<int> m_client_count{0};
+    std::map<int, std::string> m_addresses;
+    // PIP restart: a reopen pending, its countdown in listener rounds, and the reopened mark.
+    bool m_reopen_pending = false;
+    int m_reopen_countdown = 3;
+    int m_reopened = 0;
+};
+
+// Capture runs (1) from the first PLAY of a single client until any client leaves.
+extern std::atomic<int> g_capture_running;
+// Accepts that found no client connected.
+extern std::atomic<unsigned> g_accepts_without_clients;

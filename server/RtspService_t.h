@@ -1,0 +1,36 @@
+#pragma once
+
+#include "media/MediaSession.h"
+#include "media/MediaStreamH264.h"
+#include "media/MediaStreamMP4A.h"
+#include "rtsp/RtspTransport.h"
+#include "service/GlobalConfig.h"
+
+// The process-wide streaming server behind the skyvo_* functions: the RTSP listener and the
+// presentation "skyvo" with its tracks "h264" and "aac".
+// Thread contract: created, opened and released by the main thread; the producers reach its
+// listener's rings while it is open.
+class RtspService_t {
+public:
+    RtspService_t();
+    virtual ~RtspService_t();
+    RtspService_t(const RtspService_t&) = delete;
+    RtspService_t& operator=(const RtspService_t&) = delete;
+
+    // Builds the presentation and the listener and opens it; false (nothing left open) on failure.
+    bool Open(unsigned port);
+    // Hands the listener's rings to the two send sessions.
+    void OpenAudioAndVideoThread();
+    void Release();
+
+    RtspTransport* listener() { return m_listener; }
+    Global_Config* config() { return m_config; }
+
+private:
+    RtspTransport* m_listener = nullptr;
+    MediaSession* m_session = nullptr;  // owned by the listener's session list
+    MediaStreamH264* m_video = nullptr;
+    MediaStreamMP4A* m_audio = nullptr;
+    unsigned m_bookkeeping[4] = {};
+    Global_Config* m_config;
+};

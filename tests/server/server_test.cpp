@@ -1,0 +1,361 @@
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "capture/livepipmanager.h"
+#include "platform/fake/FakePlatform.h"
+#include "rtp/SendH264Rtp.h"
+#include "rtp/SendMP3Rtp.h"
+#include "rtsp/RtspResponse.h"
+#include "rtsp/RtspTransport.h"
+#include "server/RtspService_t.h"
+#include "server/skyvo_rtsp.h"
+#include "server/skyvo_service.h"
+#include "service/OrvexLog.h"
+#include "tests/rtp/UdpReceiver.h"
+#include "tests/server/RtspClient.h"
+
+namespace {
+
+using Calls = std::vector<std::string>;
+
+std::mutex g_mutex;
+Calls g_calls;
+
+void Record(const std::string& call) {
+    std::lock_guard<std::mutex> hold(g_mutex);
+    g_calls.push_back(call);
+}
+
+Calls RecordedCalls() {
+    std::lock_guard<std::mutex> hold(g_mutex);
+    return g_calls;
+}
+
+// The open callbacks also note whether the rings were empty and both send threads running.
+int VideoOpen() {
+    RtspService_t* service = skyvo_rtsp_service();
+    if (service == nullptr) return 0;  // a test that ended early is closing the server
+    RtspTransport* l = service->listener();
+    bool ready = l->video_ring().used_space() == 0 && l->audio_ring().used_space() == 0 &&
+                 H264RtpTransportSession::instance()->sending() &&
+                 MP3RtpTransportSession::instance()->sending();
+    Record(ready ? "video open" : "video open before rings and senders were ready");
+    return 0;
+}
+int AudioOpen() { Record("audio open"); return 0; }
+int VideoClose() { Record("video close"); return 0; }
+int AudioClose() { Record("audio close"); return 0; }
+
+template <typename Pred>
+bool WaitFor(Pred done, int ms = 3000) {
+    for (int i = 0; i < ms / 5; ++i) {
+        if (done()) return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+    return done();
+}
+
+int FreePort() {
+    int fd = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in a{};
+    a.sin_family = AF_INET;
+    bind(fd, reinterpret_cast<sockaddr*>(&a), sizeof a);
+    socklen_t len = sizeof a;
+    getsockname(fd, reinterpret_cast<sockaddr*>(&a), &len);
+    close(fd);
+    return ntohs(a.sin_port);
+}
+
+const std::string kQuery =
+    "?width=640&height=480&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none"
+    "&framerate=30";
+
+class ServerTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        RtspResponse::SetSessionCounter(1880);
+        Socket::SetReadinessWaitMs(500);  // a silent client goes after half a second here
+        RtspTransport::SetSelectWaitMs(20);
+        {
+            std::lock_guard<std::mutex> hold(g_mutex);
+            g_calls.clear();
+        }
+        g_pip_stop_flag = 0;
+        g_follow_main_flag = 0;
+        port = FreePort();
+        url = "rtsp://127.0.0.1:" + std::to_string(port) + "/skyvo.0" + kQuery;
+        skyvo_rtsp_sever_init();
+        register_audio_open_thread_func(AudioOpen);
+        register_video_open_thread_func(VideoOpen);
+        register_audio_close_thread_func(AudioClose);
+        register_video_close_thread_func(VideoClose);
+        skyvo_set_mp3_rtp_config(48000);
+        skyvo_set_h264_rtp_config(90000);
+        ASSERT_EQ(skyvo_rtsp_sever_open(static_cast<unsigned>(port)), 0);
+    }
+    void TearDown() override {
+        skyvo_rtsp_sever_close();
+        Socket::SetReadinessWaitMs(10000);
+        RtspTransport::SetSelectWaitMs(2000);
+    }
+    int Clients() { return skyvo_rtsp_service()->listener()->client_count(); }
+    // DESCRIBE, SETUP of both tracks and PLAY, as ffmpeg sends them.
+    void Play(RtspClient& c, int video_port, int audio_port) {
+        ASSERT_NE(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n\r\n")
+                      .find("200 OK"), std::string::npos);
+        c.Exchange("SETUP " + url + "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;client_port=" +
+                   std::to_string(video_port) + "-" + std::to_string(video_port + 1) + "\r\nCSeq: 3\r\n\r\n");
+        c.Exchange("SETUP " + url + "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;client_port=" +
+                   std::to_string(audio_port) + "-" + std::to_string(audio_port + 1) + "\r\nCSeq: 4\r\n\r\n");
+        ASSERT_NE(c.Exchange("PLAY " + url + " RTSP/1.0\r\nRange: npt=0.000-\r\nCSeq: 5\r\n\r\n").find("200 OK"),
+                  std::string::npos);
+    }
+
+    platform::fake::FakePlatform fake;
+    int port = 0;
+    std::string url;
+};
+
+class LoopbackReceiver : public UdpReceiver {};
+
+TEST_F(ServerTest, FullExchangeIsByteExactAndRtpFollowsTheFrames) {
+    UdpReceiver video, audio;
+    RtspClient c("127.0.0.1", port);
+    ASSERT_TRUE(c.connected());
+    EXPECT_EQ(c.Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\nUser-Agent: Lavf59.27.100\r\n\r\n"),
+              "RTSP/1.0 200 OK\r\nCSeq: 1\r\n"
+              "Public: OPTIONS, DESCRIBE, SETUP, TEARDOWN, PLAY, PAUSE,GET_PARAMETER\r\n\r\n");
+    const std::string sdp =
+        "v=0\r\ns=skyvo\r\nc=IN IP4 127.0.0.1\r\nt=0 0\r\na=control:*\r\n"
+        "m=video 0 RTP/AVP 96\r\na=rtpmap:96 H264/90000\r\n"
+        "a=fmtp:96 profile-level-id=42401E; sprop-parameter-sets=Z0JAHqbAoD2hAAADAAEAAAMAKA8QIuA=,"
+        "aMpDiA==; packetization-mode=1;\r\na=control:trackID=1\r\n"
+        "m=audio 0 RTP/AVP 97\r\na=rtpmap:97 MPEG4-GENERIC/48000/2\r\n"
+        "a=fmtp:97 streamtype=5; profile-level-id=1; mode=AAC-hbr; config=1190; SizeLength=13; "
+        "IndexLength=3; IndexDeltaLength=3;\r\na=control:trackID=2\r\n";
+    EXPECT_EQ(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n"
+                         "User-Agent: Lavf59.27.100\r\n\r\n"),
+              "RTSP/1.0 200 OK\r\nCSeq: 2\r\nServer: RTSP Service\r\nContent-Base: " + url +
+                  "\r\nContent-Type: application/sdp\r\nContent-Length: " + std::to_string(sdp.size()) +
+                  "\r\n\r\n" + sdp);
+    const std::string v = std::to_string(video.port()), a = std::to_string(audio.port());
+    const std::string v1 = std::to_string(video.port() + 1), a1 = std::to_string(audio.port() + 1);
+    EXPECT_EQ(c.Exchange("SETUP " + url + "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
+                         "client_port=" + v + "-" + v1 + "\r\nCSeq: 3\r\n\r\n"),
+              "RTSP/1.0 200 OK\r\nCSeq: 3\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
+              "server_port=8000-8001;client_port=" + v + "-" + v1 + ";ssrc=1\r\n\r\n");
+    EXPECT_EQ(c.Exchange("SETUP " + url + "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
+                         "client_port=" + a + "-" + a1 + "\r\nCSeq: 4\r\nSession: 1881\r\n\r\n"),
+              "RTSP/1.0 200 OK\r\nCSeq: 4\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
+              "server_port=8002-8003;client_port=" + a + "-" + a1 + ";ssrc=1\r\n\r\n");
+    EXPECT_TRUE(RecordedCalls().empty());
+    // Answer lines are cut at 255 characters: with URLs this long the second url= is cut.
+    const std::string rtp_info = ("RTP-Info: url=" + url + "/trackID=1,url=" + url + "/trackID=2").substr(0, 255);
+    EXPECT_EQ(c.Exchange("PLAY " + url + " RTSP/1.0\r\nRange: npt=0.000-\r\nCSeq: 5\r\nSession: 1881\r\n\r\n"),
+              "RTSP/1.0 200 OK\r\nCSeq: 5\r\nSession: 1881;timeout=10\r\n" + rtp_info + "\r\n\r\n");
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));  // just after the answer
+    EXPECT_EQ(RecordedCalls(), (Calls{"video open", "audio open"}));
+
+    unsigned char idr[] = {0, 0, 0, 1, 0x65, 1, 2, 3, 4, 5};
+    EXPECT_EQ(skyvo_add_h264_data(idr, sizeof idr), 1);
+    std::vector<unsigned char> p = video.Receive();
+    ASSERT_EQ(p.size(), 12u + 6);
+    EXPECT_EQ(p[1], 0x80 | 96);
+    EXPECT_EQ(p[12], 0x65);
+    unsigned char adts[30] = {0xFF, 0xF1};
+    EXPECT_EQ(skyvo_add_mp3_data(adts, sizeof adts, 0), 1);
+    p = audio.Receive();
+    ASSERT_EQ(p.size(), 30u + 9);
+    EXPECT_EQ(p[1], 0xE2);
+
+    EXPECT_EQ(c.Exchange("GET_PARAMETER " + url + " RTSP/1.0\r\nCSeq: 6\r\nSession: 1881\r\n\r\n"),
+              "RTSP/1.0 200 OK\r\nCSeq: 6\r\nSession: 1881;timeout=10\r\n\r\n");
+    c.Send("TEARDOWN " + url + " RTSP/1.0\r\nCSeq: 7\r\nSession: 1881\r\n\r\n");
+    EXPECT_TRUE(c.ClosedWithoutAnswer());  // TEARDOWN is never answered
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 4; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video open", "audio open", "video close", "audio close"}));
+    EXPECT_EQ(H264RtpTransportSession::instance()->dest_count(), 0u);
+    EXPECT_EQ(Clients(), 0);
+}
+
+TEST_F(ServerTest, PlayWithTwoClientsConnectedDoesNotStartCapture) {
+    RtspClient idle("127.0.0.2", port);
+    ASSERT_TRUE(WaitFor([&] { return Clients() == 1; }));
+    RtspClient player("127.0.0.3", port);
+    ASSERT_TRUE(WaitFor([&] { return Clients() == 2; }));
+    UdpReceiver v, a;
+    Play(player, v.port(), a.port());
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));  // capture would start by now
+    EXPECT_TRUE(RecordedCalls().empty());
+    player.Close();
+    // Any client leaving stops capture for all: the close callbacks and the TV defaults.
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close"}));
+    auto cfg_logs = fake.log.Texts("orvex:::orvexPIPCfg");
+    EXPECT_EQ(std::count(cfg_logs.begin(), cfg_logs.end(), "orvexPIPCfg::SetTVParameterDefault"), 2);
+    EXPECT_EQ(Clients(), 1);
+}
+
+TEST_F(ServerTest, SixthClientIsResetAtOnce) {
+    std::vector<std::unique_ptr<RtspClient>> clients;
+    for (int i = 2; i <= 6; ++i) {
+        clients.push_back(std::make_unique<RtspClient>(("127.0.0." + std::to_string(i)).c_str(), port));
+        ASSERT_TRUE(WaitFor([&] { return Clients() == i - 1; }));
+    }
+    RtspClient sixth("127.0.0.7", port);
+    EXPECT_TRUE(sixth.ClosedWithoutAnswer());
+    EXPECT_EQ(Clients(), 5);
+    // The five are still served.
+    EXPECT_NE(clients[0]->Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n").find("200 OK"),
+              std::string::npos);
+}
+
+TEST_F(ServerTest, ReconnectFromTheSameAddressReplacesTheOldSession) {
+    RtspClient first("127.0.0.2", port);
+    ASSERT_TRUE(WaitFor([&] { return Clients() == 1; }));
+    RtspClient again("127.0.0.2", port);
+    EXPECT_TRUE(first.ClosedWithoutAnswer());  // reset
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close"}));  // it was the only client
+    EXPECT_EQ(Clients(), 1);
+    UdpReceiver v, a;
+    Play(again, v.port(), a.port());
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 4; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close", "video open", "audio open"}));
+}
+
+TEST_F(ServerTest, BadOrSilentClientsAreClosedWithoutAnswer) {
+    const std::string without_framerate =
+        "DESCRIBE rtsp://127.0.0.1/skyvo.0?width=640&height=480&cameraid=hd0&win=main&sub=0"
+        "&dumpvideo=0&dumpaudio=0&specialcase=none RTSP/1.0\r\nCSeq: 2\r\n\r\n";
+    const std::string cases[] = {
+        without_framerate,
+        "DESCRIBE rtsp://127.0.0.1/skyvo" + kQuery + " RTSP/1.0\r\nCSeq: 2\r\n\r\n",  // no '.' and time
+        "RECORD " + url + " RTSP/1.0\r\nCSeq: 2\r\n\r\n",
+    };
+    for (const std::string& request : cases) {
+        RtspClient c("127.0.0.2", port);
+        c.Send(request);
+        EXPECT_TRUE(c.ClosedWithoutAnswer()) << request;
+    }
+    // A client that goes quiet is dropped when the socket wait ends its next request empty.
+    RtspClient quiet("127.0.0.2", port);
+    EXPECT_NE(quiet.Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n").find("200 OK"),
+              std::string::npos);
+    EXPECT_TRUE(quiet.ClosedWithoutAnswer());
+}
+
+TEST_F(ServerTest, ErrorAnswersKeepTheConnection) {
+    RtspClient c("127.0.0.2", port);
+    const std::string track = "SETUP " + url + "/trackID=";
+    struct Case {
+        std::string request, answer;
+    };
+    const Case cases[] = {
+        {"PLAY rtsp://127.0.0.1/other.0 RTSP/1.0\r\nCSeq: 1\r\n\r\n",
+         "RTSP/1.0 404 Session Not Found\r\nCSeq: 1\r\n\r\n"},
+        {"PAUSE rtsp://127.0.0.1 RTSP/1.0\r\nCSeq: 2\r\n\r\n", "RTSP/1.0 400 Bad Request\r\nCSeq: 2\r\n\r\n"},
+        // No name in a SETUP URL and none stored by a DESCRIBE yet.
+        {track + "1 RTSP/1.0\r\nCSeq: 3\r\nTransport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n",
+         "RTSP/1.0 404 Session Not Found\r\nCSeq: 3\r\n\r\n"},
+        {"DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 4\r\n\r\n", ""},
+        {track + "3 RTSP/1.0\r\nCSeq: 5\r\nTransport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n",
+         "RTSP/1.0 404 Stream Not Found\r\nCSeq: 5\r\n\r\n"},
+        {track + "1 RTSP/1.0\r\nCSeq: 6\r\nTransport: RTP/AVP/TCP;interleaved=0-1\r\n\r\n",
+         "RTSP/1.0 400 Bad Request\r\nCSeq: 6\r\n\r\n"},
+        {track + "2 RTSP/1.0\r\nCSeq: 7\r\nTransport: RTP/AVP;unicast;client_port=5002\r\n\r\n",
+         "RTSP/1.0 200 OK\r\nCSeq: 7\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
+         "server_port=8002-8003;client_port=5002-5003;ssrc=1\r\n\r\n"},
+        {"PLAY rtsp://127.0.0.1/other.0 RTSP/1.0\r\nCSeq: 8\r\n\r\n",
+         "RTSP/1.0 404 Session Not Found\r\nCSeq: 8\r\nSession: 1881;timeout=10\r\n\r\n"},
+    };
+    for (const Case& k : cases) {
+        std::string answer = c.Exchange(k.request);
+        if (k.answer.empty()) {
+            EXPECT_EQ(answer.compare(0, 15, "RTSP/1.0 200 OK"), 0) << k.request;
+        } else {
+            EXPECT_EQ(answer, k.answer) << k.request;
+        }
+    }
+    std::string unknown = url;
+    unknown.replace(unknown.find("skyvo"), 5, "other");
+    EXPECT_EQ(c.Exchange("DESCRIBE " + unknown + " RTSP/1.0\r\nCSeq: 9\r\n\r\n"),
+              "RTSP/1.0 404 File Url Not Found, Or In Incorrect Format\r\nCSeq: 9\r\n"
+              "Session: 1881;timeout=10\r\n\r\n");
+    EXPECT_TRUE(c.ClosedWithoutAnswer());  // a failed DESCRIBE ends the connection
+}
+
+TEST_F(ServerTest, RefusedPipRegistrationAnswers405) {
+    fake.properties.Set("kelvo.build.kelvotv", "sa");
+    fake.pip_manager.set_listener_result(-1);
+    RtspClient c("127.0.0.2", port);
+    EXPECT_EQ(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 2\r\n\r\n"),
+              "RTSP/1.0 405  resolvration error !\r\nCSeq: 2\r\n\r\n");
+    EXPECT_TRUE(c.ClosedWithoutAnswer());
+}
+
+TEST_F(ServerTest, PipStopClosesCaptureAndReopensThreeRoundsLaterOnlyWhenFollowingMain) {
+    g_follow_main_flag = 1;
+    PipListener listener;
+    listener.eventCallback(1);
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 4; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close", "video open before rings and senders were ready",
+                                      "audio open"}));
+    {
+        std::lock_guard<std::mutex> hold(g_mutex);
+        g_calls.clear();
+    }
+    g_follow_main_flag = 0;
+    listener.eventCallback(1);
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+    std::this_thread::sleep_for(std::chrono::milliseconds(300));  // well past three rounds
+    EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close"}));
+}
+
+TEST_F(ServerTest, FrameLargerThanTheRingIsDroppedAndTheRingKept) {
+    RtspTransport* l = skyvo_rtsp_service()->listener();
+    unsigned char small[100] = {0, 0, 0, 1, 0x41};
+    ASSERT_EQ(skyvo_add_h264_data(small, sizeof small), 1);
+    unsigned used = l->video_ring().used_space();
+    std::vector<unsigned char> big(8000000);
+    ::testing::internal::CaptureStdout();
+    EXPECT_EQ(skyvo_add_h264_data(big.data(), static_cast<unsigned>(big.size())), 0);
+    ::testing::internal::GetCapturedStdout();
+    EXPECT_EQ(l->video_ring().used_space(), used);
+    EXPECT_EQ(skyvo_add_h264_data(nullptr, 5), 0);
+    EXPECT_EQ(skyvo_add_mp3_data(small, 0, 0), 0);
+}
+
+TEST(ServerLifecycleTest, PortInUseLeavesNoServerAndCloseTwiceIsHarmless) {
+    platform::fake::FakePlatform fake;
+    int taken = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in a{};
+    a.sin_family = AF_INET;
+    ASSERT_EQ(bind(taken, reinterpret_cast<sockaddr*>(&a), sizeof a), 0);
+    listen(taken, 1);
+    socklen_t len = sizeof a;
+    getsockname(taken, reinterpret_cast<sockaddr*>(&a), &len);
+    skyvo_rtsp_sever_init();
+    ::testing::internal::CaptureStdout();
+    EXPECT_EQ(skyvo_rtsp_sever_open(ntohs(a.sin_port)), 1);
+    EXPECT_EQ(skyvo_rtsp_service(), nullptr);
+    skyvo_set_h264_rtp_config(90000);
+    unsigned char b[8] = {0, 0, 0, 1, 0x65};
+    EXPECT_EQ(skyvo_add_h264_data(b, sizeof b), 0);
+    skyvo_rtsp_sever_close();
+    g_orvex_debug_printf = 1;
+    skyvo_rtsp_sever_close();
+    g_orvex_debug_printf = 0;
+    std::string out = ::testing::internal::GetCapturedStdout();
+    EXPECT_NE(out.find("\n rtstptransport bind error. "), std::string::npos);
+    EXPECT_EQ(out.substr(out.size() - std::string("\n g_pRtspService is NULL ! \n").size()),
+              "\n g_pRtspService is NULL ! \n");
+    close(taken);
+}
+
+}  // namespace
