@@ -1,6 +1,9 @@
 #pragma once
 
 #include "platform/AudioManagerPort.h"
+#include "platform/AudioPorts.h"
+#include "platform/BinderPort.h"
+#include "platform/CapturePorts.h"
 #include "platform/LogPort.h"
 #include "platform/PipManagerPort.h"
 #include "platform/PropertyPort.h"
@@ -17,6 +20,13 @@ struct Ports {
     PropertyPort* properties = nullptr;
     PipManagerPort* pip_manager = nullptr;
     AudioManagerPort* audio_manager = nullptr;
+    BinderPort* binder = nullptr;
+    CameraPort* camera = nullptr;
+    MediaRecorderPort* media_recorder = nullptr;
+    TvManagerPort* tv_manager = nullptr;
+    PxAudioOutPort* px_audio_out = nullptr;
+    AudioRecordPort* audio_record = nullptr;
+    AacLibraryPort* aac_library = nullptr;
 };
 
 // Null members install the null implementation of that port. Ports are not owned.
@@ -27,6 +37,13 @@ LogPort& Log();
 PropertyPort& Properties();
 PipManagerPort& PipManager();
 AudioManagerPort& AudioManager();
+BinderPort& Binder();
+CameraPort& Cameras();
+MediaRecorderPort& MediaRecorders();
+TvManagerPort& TvManager();
+PxAudioOutPort& PxAudioOut();
+AudioRecordPort& AudioRecords();
+AacLibraryPort& AacLibrary();
 
 // Defined by the platform library the executable links (host or android), never by fakes.
 void InstallDefaultPorts();
