@@ -10,6 +10,15 @@
 
 namespace platform {
 
+// The vendor's camera keys for traveling (TV picture) capture. They must match the
+// vendor SDK's CameraParameters names.
+constexpr const char* kKeyTravelingRes = "traveling-res";
+constexpr const char* kKeyTravelingMode = "traveling-mode";
+constexpr const char* kKeyTravelingFramerate = "traveling-framerate";
+constexpr const char* kKeyTravelingMagicKey = "traveling-magic-key";
+constexpr const char* kKeyMainInputSource = "main-input-source";
+constexpr const char* kKeySubInputSource = "sub-input-source";
+
 class Camera {
 public:
     virtual ~Camera() = default;

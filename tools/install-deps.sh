@@ -5,7 +5,7 @@
 set -euo pipefail
 
 packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock-dev
-          libbenchmark-dev)
+          libbenchmark-dev libopenh264-dev libvo-aacenc-dev)
 if [[ "${1:-}" == ci ]]; then
   packages+=(clang libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
 fi

@@ -9,6 +9,13 @@ FakePlatform::FakePlatform() : previous_(Installed()) {
     ports.properties = &properties;
     ports.pip_manager = &pip_manager;
     ports.audio_manager = &audio_manager;
+    ports.binder = &binder;
+    ports.camera = &camera;
+    ports.media_recorder = &media_recorder;
+    ports.tv_manager = &tv_manager;
+    ports.px_audio_out = &px_audio_out;
+    ports.audio_record = &audio_record;
+    ports.aac_library = &aac_library;
     Install(ports);
 }
 

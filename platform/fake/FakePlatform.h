@@ -2,6 +2,7 @@
 
 #include "platform/Ports.h"
 #include "platform/fake/CallJournal.h"
+#include "platform/fake/FakeCapture.h"
 #include "platform/fake/FakeLog.h"
 #include "platform/fake/FakeManagers.h"
 #include "platform/fake/FakeProperties.h"
@@ -24,6 +25,14 @@ public:
     FakeProperties properties;
     FakePipManager pip_manager{journal};
     FakeAudioManager audio_manager{journal};
+    FakeResults results;
+    FakeBinder binder{journal};
+    FakeCameraPort camera{journal, results};
+    FakeMediaRecorderPort media_recorder{journal, results};
+    FakeTvManager tv_manager{journal, results};
+    FakePxAudioOut px_audio_out{journal, results};
+    FakeAudioRecordPort audio_record{journal, results};
+    FakeAacLibrary aac_library{journal};
 
 private:
     Ports previous_;

@@ -23,7 +23,50 @@ public:
     void disconnect() override { Note("AudioManager::disconnect"); }
 };
 
+class HostTvClient final : public TvManagerClient {
+public:
+    // HDMI 1: what a television shows most of the time.
+    int getCurrentMainInputSource() override {
+        Note("TvManager::getCurrentMainInputSource");
+        return 23;
+    }
+    void disconnect() override { Note("TvManager::disconnect"); }
+};
+
 }  // namespace
+
+std::shared_ptr<TvManagerClient> HostTvManager::connect() {
+    Note("TvManager::connect");
+    return std::make_shared<HostTvClient>();
+}
+
+int HostPxAudioOut::Init(unsigned short first_field) {
+    Note("PX_AOUT_Init(%d)", first_field);
+    return 0;
+}
+int HostPxAudioOut::GetHandle(int path, int* handle) {
+    Note("PX_AOUT_GetHandle(%d)", path);
+    if (handle != nullptr) *handle = path;
+    return 0;
+}
+int HostPxAudioOut::Open(int path, int param, int* handle) {
+    Note("PX_AOUT_Open(%d, %d)", path, param);
+    if (handle != nullptr) *handle = path;
+    return 0;
+}
+int HostPxAudioOut::SetAttr(int handle, int attr, int* value) {
+    Note("PX_AOUT_SetAttr(%d, %d)", handle, attr);
+    (void)value;
+    return 0;
+}
+int HostPxAudioOut::Close(int handle) {
+    Note("PX_AOUT_Close(%d)", handle);
+    return 0;
+}
+int HostPxAudioOut::DeInit() {
+    Note("PX_AOUT_DeInit");
+    return 0;
+}
 
 class HostPipClient final : public PipManagerClient {
 public:

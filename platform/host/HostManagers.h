@@ -4,6 +4,7 @@
 #include <mutex>
 
 #include "platform/AudioManagerPort.h"
+#include "platform/CapturePorts.h"
 #include "platform/PipManagerPort.h"
 
 namespace platform {
@@ -27,6 +28,22 @@ private:
 class HostAudioManager final : public AudioManagerPort {
 public:
     std::shared_ptr<AudioManagerClient> connect() override;
+};
+
+class HostTvManager final : public TvManagerPort {
+public:
+    std::shared_ptr<TvManagerClient> connect() override;
+};
+
+// The PX audio-output library: every call logs and succeeds; the output path's handle is 4.
+class HostPxAudioOut final : public PxAudioOutPort {
+public:
+    int Init(unsigned short first_field) override;
+    int GetHandle(int path, int* handle) override;
+    int Open(int path, int param, int* handle) override;
+    int SetAttr(int handle, int attr, int* value) override;
+    int Close(int handle) override;
+    int DeInit() override;
 };
 
 }  // namespace host

@@ -1,0 +1,101 @@
+#include "platform/host/HostAudio.h"
+
+#include <dlfcn.h>
+#include <time.h>
+
+#include <cmath>
+#include <vector>
+
+#include "platform/Ports.h"
+#include "platform/host/HostClock.h"
+
+namespace platform {
+namespace host {
+namespace {
+
+constexpr unsigned kRate = 48000;
+constexpr size_t kMinFrames = 960;  // 20 ms: one encoder block of 3840 bytes
+constexpr double kToneHz = 1000.0;
+constexpr double kAmplitude = 12000.0;
+
+void SleepUntilMs(uint64_t ms) {
+    timespec ts{};
+    ts.tv_sec = static_cast<time_t>(ms / 1000);
+    ts.tv_nsec = static_cast<long>((ms % 1000) * 1000000);
+    clock_nanosleep(CLOCK_MONOTONIC, TIMER_ABSTIME, &ts, nullptr);
+}
+
+class HostAudioRecord final : public AudioRecord {
+public:
+    int set(int, unsigned sample_rate, int format, unsigned, size_t frame_count) override {
+        if (sample_rate != kRate || format != 1 || frame_count == 0) return -22;
+        frames_per_read_ = frame_count;
+        return 0;
+    }
+    int start() override {
+        start_ms_ = HostClockMs();
+        next_ = 0;
+        started_ = true;
+        return 0;
+    }
+    void stop() override { started_ = false; }
+    long read(void* buffer, size_t size) override {
+        if (!started_) return -1;
+        size_t frames = size / 4;
+        if (frames > frames_per_read_) frames = frames_per_read_;
+        if (frames == 0) return -1;
+        // Real time: a block is there once its last sample has been "recorded".
+        SleepUntilMs(start_ms_ + (next_ + frames) * 1000 / kRate);
+        FillTone(static_cast<int16_t*>(buffer), frames, next_, start_ms_);
+        next_ += frames;
+        return static_cast<long>(frames * 4);
+    }
+
+private:
+    size_t frames_per_read_ = kMinFrames;
+    uint64_t start_ms_ = 0;
+    uint64_t next_ = 0;
+    bool started_ = false;
+};
+
+}  // namespace
+
+void FillTone(int16_t* out, size_t frames, uint64_t first, uint64_t start_ms) {
+    for (size_t i = 0; i < frames; ++i) {
+        uint64_t n = first + i;
+        uint64_t ms = start_ms + n * 1000 / kRate;
+        int16_t v = 0;
+        if (InFlash(ms)) {
+            double phase = 2.0 * M_PI * kToneHz * static_cast<double>(n % kRate) / kRate;
+            v = static_cast<int16_t>(std::lround(kAmplitude * std::sin(phase)));
+        }
+        out[2 * i] = v;
+        out[2 * i + 1] = v;
+    }
+}
+
+std::shared_ptr<AudioRecord> HostAudioRecordPort::create(const std::string&) {
+    return std::make_shared<HostAudioRecord>();
+}
+
+int HostAudioRecordPort::getMinFrameCount(size_t* frame_count, unsigned sample_rate, int format,
+                                          unsigned) {
+    if (frame_count == nullptr || sample_rate != kRate || format != 1) return -22;
+    *frame_count = kMinFrames;
+    return 0;
+}
+
+bool HostAudioRecordPort::setFlingerParameters(int, const std::string& key_values) {
+    Log().Write(kLogIdSystem, kLogDebug, "orvex:::host",
+                ("AudioFlinger::setParameters " + key_values).c_str());
+    return true;
+}
+
+void* HostAacLibrary::open() { return dlopen(name(), RTLD_NOW); }
+void* HostAacLibrary::symbol(void* library, const char* symbol) { return dlsym(library, symbol); }
+void HostAacLibrary::close(void* library) {
+    if (library != nullptr) dlclose(library);
+}
+
+}  // namespace host
+}  // namespace platform
