@@ -1,0 +1,60 @@
+#include "service/OrvexSystemService.h"
+
+#include <pthread.h>
+#include <unistd.h>
+
+#include "platform/Ports.h"
+#include "service/OrvexLog.h"
+#include "service/OrvexService.h"
+
+namespace {
+
+// The spelling "sevice" is the tag operators filter on.
+constexpr const char* kTag = "orvex:::startorvexsevice";
+
+std::atomic<bool> g_service_run{false};
+pthread_t g_service_thread{};
+bool g_service_started = false;
+
+}  // namespace
+
+int start_orvex_service_main(std::atomic<bool>* run) {
+    platform::BinderPort& binder = platform::Binder();
+    binder.initWithDriver("/dev/vndbinder");
+    OrvexPrintLog(kTag, "OrvexServiceThread( ServiceManager: %p)", binder.defaultServiceManager());
+    binder.startThreadPool();
+    android::OrvexService::instantiate();
+    OrvexPuts("\n start orvex service ");
+    OrvexLog(kTag, "\n start orvex service \n");
+    while (run->load(std::memory_order_relaxed)) usleep(10000);
+    OrvexPuts("\n end orvex service ");
+    OrvexLog(kTag, "\n end orvex service \n");
+    OrvexPrintLog(kTag, "OrvexServiceThread end");
+    return 0;
+}
+
+void* start_orvex_service_thread(void*) {
+    OrvexPrintLog(kTag, "start_orvex_service_thread");
+    start_orvex_service_main(&g_service_run);
+    return nullptr;
+}
+
+int start_orvex_system_service() {
+    OrvexPrintLog(kTag, "start_orvex_system_service");
+    g_service_started = false;
+    g_service_run = true;
+    int rc = pthread_create(&g_service_thread, nullptr, start_orvex_service_thread, nullptr);
+    if (rc != 0) {
+        OrvexPrintLog(kTag, "start_orvex_system_service----------->thread_create create failed");
+        return rc;
+    }
+    g_service_started = true;
+    return 0;
+}
+
+void close_orvex_system_service() {
+    OrvexPrintLog(kTag, "close_orvex_system_service");
+    g_service_run = false;
+    if (g_service_started) pthread_join(g_service_thread, nullptr);
+    g_service_started = false;
+}
