@@ -1,0 +1,353 @@
+#include <dirent.h>
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cstdlib>
+#include <fstream>
+#include <iterator>
+#include <mutex>
+#include <set>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/host/HostBinder.h"
+#include "tools/AccessUnitSplitter.h"
+
+namespace {
+
+using platform::ParcelWriter;
+using platform::host::HostBinder;
+using Bytes = std::vector<uint8_t>;
+
+struct Received {
+    uint32_t code;
+    uint32_t flags;
+    Bytes data;
+    bool operator==(const Received& o) const {
+        return code == o.code && flags == o.flags && data == o.data;
+    }
+};
+
+// Records every transaction; code 2 is one it does not handle.
+class RecordingService : public platform::BinderService {
+public:
+    int onTransact(uint32_t code, platform::ParcelReader& data, uint32_t flags) override {
+        size_t n = data.dataAvail();
+        const uint8_t* at = data.readInplace(n);
+        std::lock_guard<std::mutex> hold(mutex_);
+        got_.push_back({code, flags, Bytes(at, at + n)});
+        return code == 2 ? platform::kBinderUnknownTransaction : platform::kBinderOk;
+    }
+    std::vector<Received> Take() {
+        std::lock_guard<std::mutex> hold(mutex_);
+        return std::move(got_);
+    }
+
+private:
+    std::mutex mutex_;
+    std::vector<Received> got_;
+};
+
+Bytes Le32(uint32_t v) {
+    return {uint8_t(v), uint8_t(v >> 8), uint8_t(v >> 16), uint8_t(v >> 24)};
+}
+
+Bytes Cat(std::initializer_list<Bytes> parts) {
+    Bytes out;
+    for (const Bytes& p : parts) out.insert(out.end(), p.begin(), p.end());
+    return out;
+}
+
+int ConnectRaw(const std::string& path) {
+    int fd = socket(AF_UNIX, SOCK_STREAM, 0);
+    sockaddr_un addr{};
+    addr.sun_family = AF_UNIX;
+    snprintf(addr.sun_path, sizeof addr.sun_path, "%s", path.c_str());
+    if (connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr) != 0) {
+        close(fd);
+        return -1;
+    }
+    timeval tv{30, 0};  // a service that never answers fails the test instead of hanging it
+    setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &tv, sizeof tv);
+    return fd;
+}
+
+// Writes `bytes` on a new connection (then hangs up if asked) and reads the statuses until
+// the service closes the connection.
+std::vector<int32_t> RawExchange(const std::string& path, const Bytes& bytes, bool hang_up) {
+    int fd = ConnectRaw(path);
+    EXPECT_GE(fd, 0);
+    EXPECT_EQ(send(fd, bytes.data(), bytes.size(), MSG_NOSIGNAL), ssize_t(bytes.size()));
+    if (hang_up) shutdown(fd, SHUT_WR);
+    Bytes in;
+    uint8_t buf[64];
+    ssize_t n;
+    while ((n = recv(fd, buf, sizeof buf, 0)) > 0) in.insert(in.end(), buf, buf + n);
+    EXPECT_EQ(n, 0) << "the service neither answered nor closed";
+    close(fd);
+    std::vector<int32_t> statuses;
+    for (size_t i = 0; i + 4 <= in.size(); i += 4) {
+        statuses.push_back(int32_t(in[i] | in[i + 1] << 8 | in[i + 2] << 16 | in[i + 3] << 24));
+    }
+    return statuses;
+}
+
+// Each test gets its own ORVEX_BINDER_DIR.
+class HostBinderTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        dir_ = ::testing::TempDir() + "orvex_binder_" + std::to_string(getpid()) + "_" +
+               ::testing::UnitTest::GetInstance()->current_test_info()->name();
+        setenv("ORVEX_BINDER_DIR", dir_.c_str(), 1);
+    }
+    void TearDown() override {
+        if (DIR* d = opendir(dir_.c_str())) {
+            while (dirent* e = readdir(d)) unlink((dir_ + "/" + e->d_name).c_str());
+            closedir(d);
+        }
+        rmdir(dir_.c_str());
+        unsetenv("ORVEX_BINDER_DIR");
+    }
+    std::string Path(const char* name) const { return dir_ + "/" + name; }
+
+    std::string dir_;
+};
+
+TEST_F(HostBinderTest, TransactionsArriveWithTheirCodeAndBytes) {
+    auto service = std::make_shared<RecordingService>();
+    HostBinder server;
+    ASSERT_EQ(server.addService("orvex.rtp", service), 0);
+    server.startThreadPool();
+    HostBinder client;
+
+    ParcelWriter frame;  // as the recorder hands over an encoded frame
+    frame.writeInt32(5);
+    frame.writeInplace("\x00\x00\x00\x01\x65", 5);
+    frame.writeInt32(0);
+    ParcelWriter word;
+    word.writeInt32(-7);
+    struct Case {
+        uint32_t code;
+        ParcelWriter data;
+        int status;
+    } cases[] = {{101, frame, 0}, {0, ParcelWriter(), 0}, {2, word, -74}, {101, frame, 0}};
+    for (const Case& c : cases) EXPECT_EQ(client.transact("orvex.rtp", c.code, c.data), c.status);
+    std::vector<Received> got = service->Take();
+    ASSERT_EQ(got.size(), std::size(cases));
+    for (size_t i = 0; i < got.size(); ++i) {
+        EXPECT_EQ(got[i], (Received{cases[i].code, 0, cases[i].data.data()})) << i;
+    }
+}
+
+TEST_F(HostBinderTest, BadPeersGetAnErrorAndTheServiceGoesOn) {
+    auto service = std::make_shared<RecordingService>();
+    HostBinder server;
+    ASSERT_EQ(server.addService("svc", service), 0);
+    server.startThreadPool();
+    HostBinder client;
+    const Bytes abcd = {'a', 'b', 'c', 'd'};
+    struct Case {
+        const char* name;
+        Bytes in;
+        bool hang_up;
+        std::vector<int32_t> statuses;
+        std::vector<Received> recorded;
+    } cases[] = {
+        {"two in one write", Cat({Le32(101), Le32(0x11), Le32(4), abcd, Le32(0), Le32(0), Le32(0)}),
+         true, {0, 0}, {{101, 0x11, abcd}, {0, 0, {}}}},
+        {"lying size", Cat({Le32(101), Le32(0), Le32(100), abcd}), true, {}, {}},
+        {"truncated header", Cat({Le32(101), {0, 0, 0}}), true, {}, {}},
+        {"size over the limit", Cat({Le32(101), Le32(0), Le32((16u << 20) + 1)}), false, {-22}, {}},
+        {"garbage", Bytes(std::begin("GET / HTTP/1.0\r\n\r\n"), std::end("GET / HTTP/1.0\r\n\r\n")),
+         false, {-22}, {}},
+        {"unknown code", Cat({Le32(2), Le32(0), Le32(0)}), true, {-74}, {{2, 0, {}}}},
+    };
+    ParcelWriter probe;
+    probe.writeInt32(1);
+    for (const Case& c : cases) {
+        EXPECT_EQ(RawExchange(Path("svc"), c.in, c.hang_up), c.statuses) << c.name;
+        EXPECT_EQ(service->Take(), c.recorded) << c.name;
+        EXPECT_EQ(client.transact("svc", 7, probe), 0) << "after " << c.name;
+        EXPECT_EQ(service->Take(), (std::vector<Received>{{7, 0, probe.data()}})) << c.name;
+    }
+}
+
+TEST_F(HostBinderTest, ConcurrentClientsAllGetThrough) {
+    auto service = std::make_shared<RecordingService>();
+    HostBinder server;
+    ASSERT_EQ(server.addService("svc", service), 0);
+    server.startThreadPool();
+    // More clients than pool threads: the later ones are served as the first ones hang up.
+    constexpr int kClients = HostBinder::kPoolThreads + 2, kEach = 50;
+    std::vector<std::thread> clients;
+    for (int c = 0; c < kClients; ++c) {
+        clients.emplace_back([c] {
+            HostBinder client;
+            for (int i = 0; i < kEach; ++i) {
+                ParcelWriter p;
+                p.writeInt32(c);
+                p.writeInt32(i);
+                EXPECT_EQ(client.transact("svc", 101, p), 0);
+            }
+        });
+    }
+    for (auto& t : clients) t.join();
+    std::vector<int> next(kClients, 0);
+    for (const Received& r : service->Take()) {
+        ASSERT_EQ(r.data.size(), 8u);
+        int c = r.data[0], i = r.data[4];
+        EXPECT_EQ(i, next[c]++) << "client " << c << " out of order";
+    }
+    EXPECT_EQ(next, std::vector<int>(kClients, kEach));
+}
+
+TEST_F(HostBinderTest, NobodyListeningIsANegativeStatus) {
+    HostBinder client;
+    ParcelWriter p;
+    EXPECT_LT(client.transact("orvex.rtp", 101, p), 0);  // no directory yet
+    {
+        HostBinder gone;
+        ASSERT_EQ(gone.addService("orvex.rtp", std::make_shared<RecordingService>()), 0);
+    }
+    EXPECT_NE(access(Path("orvex.rtp").c_str(), F_OK), 0) << "socket file left behind";
+    EXPECT_LT(client.transact("orvex.rtp", 101, p), 0);
+    // A stale socket file with nobody behind it, as a crashed service leaves.
+    int fd = socket(AF_UNIX, SOCK_STREAM, 0);
+    sockaddr_un addr{};
+    addr.sun_family = AF_UNIX;
+    snprintf(addr.sun_path, sizeof addr.sun_path, "%s", Path("stale").c_str());
+    ASSERT_EQ(bind(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr), 0);
+    close(fd);
+    EXPECT_LT(client.transact("stale", 101, p), 0);
+    for (const char* bad : {"", ".", "..", "../x", "a/b", "a b"}) {
+        EXPECT_LT(client.transact(bad, 101, p), 0) << bad;
+    }
+}
+
+TEST_F(HostBinderTest, ServicesComeAndGoUnderOneName) {
+    HostBinder client;
+    ParcelWriter p;
+    p.writeInt32(3);
+    for (int round = 0; round < 3; ++round) {
+        auto service = std::make_shared<RecordingService>();
+        HostBinder server;
+        ASSERT_EQ(server.addService("svc", service), 0) << round;
+        EXPECT_LT(HostBinder().addService("svc", service), 0) << "a live name taken over";
+        server.startThreadPool();
+        // The client's connection to the previous round's service is dead: it reconnects.
+        EXPECT_EQ(client.transact("svc", 101, p), 0) << round;
+        EXPECT_EQ(service->Take().size(), 1u);
+    }
+    for (const char* bad : {"", ".", "..", "a/b", "a b", "x\n"}) {
+        EXPECT_LT(HostBinder().addService(bad, std::make_shared<RecordingService>()), 0) << bad;
+    }
+}
+
+TEST(ParcelReaderTest, LengthsBeyondTheDataReadAsMissing) {
+    struct Case {
+        const char* name;
+        Bytes in;
+        int32_t length;
+        const char* payload;  // null: missing
+    } cases[] = {
+        {"exact", {4, 0, 0, 0, 'a', 'b', 'c', 'd'}, 4, "abcd"},
+        {"padding cut off", {5, 0, 0, 0, 'a', 'b', 'c', 'd', 'e'}, 5, "abcde"},
+        {"longer than arrived", {16, 0, 0, 0, 'a', 'b'}, 16, nullptr},
+        {"one byte short", {3, 0, 0, 0, 'a', 'b'}, 3, nullptr},
+        {"huge", {0xff, 0xff, 0xff, 0x7f, 'a'}, 0x7fffffff, nullptr},
+        {"negative", {0xff, 0xff, 0xff, 0xff, 'a'}, -1, nullptr},
+        {"length cut off", {9, 0}, 0, ""},
+    };
+    for (const Case& c : cases) {
+        // An exactly sized heap copy, so a read past the end shows under ASan.
+        std::unique_ptr<uint8_t[]> heap(new uint8_t[c.in.size()]);
+        std::copy(c.in.begin(), c.in.end(), heap.get());
+        platform::ParcelReader r(heap.get(), c.in.size());
+        int32_t length = r.readInt32();
+        EXPECT_EQ(length, c.length) << c.name;
+        const uint8_t* at = r.readInplace(static_cast<size_t>(length));
+        if (c.payload == nullptr) {
+            EXPECT_EQ(at, nullptr) << c.name;
+        } else {
+            ASSERT_NE(at, nullptr) << c.name;
+            EXPECT_EQ(std::string(reinterpret_cast<const char*>(at), length), c.payload) << c.name;
+        }
+        EXPECT_EQ(r.dataAvail(), 0u) << c.name;
+        EXPECT_EQ(r.readInt32(), 0) << c.name;
+        EXPECT_EQ(r.readInplace(1), nullptr) << c.name;
+    }
+}
+
+// The units one call gives, and the same input fed in chunks as orvex-feed reads it.
+std::vector<Bytes> Split(const Bytes& in, size_t chunk) {
+    std::vector<Bytes> units;
+    Bytes pending;
+    for (size_t at = 0; at <= in.size(); at += chunk) {
+        size_t n = std::min(chunk, in.size() - at);
+        pending.insert(pending.end(), in.begin() + at, in.begin() + at + n);
+        bool at_end = at + chunk > in.size();
+        size_t consumed = 0;
+        auto split = tools::SplitAccessUnits(pending.data(), pending.size(), at_end, &consumed);
+        for (Bytes& u : split) units.push_back(std::move(u));
+        pending.erase(pending.begin(), pending.begin() + consumed);
+        if (at_end) {
+            EXPECT_TRUE(pending.empty());
+        }
+    }
+    return units;
+}
+
+TEST(AccessUnitSplitterTest, SplitsAtPictureBoundaries) {
+    const Bytes sc4 = {0, 0, 0, 1}, sc3 = {0, 0, 1};
+    const Bytes sps = {0x67, 0x42, 0x00, 0x1e}, pps = {0x68, 0xce, 0x3c, 0x80};
+    const Bytes idr = {0x65, 0x88, 0x84}, p1 = {0x41, 0x9a, 0x02}, p2 = {0x41, 0x9a, 0x04};
+    const Bytes idr_part2 = {0x65, 0x40, 0x11};  // first_mb_in_slice 1: same picture
+    const Bytes aud = {0x09, 0xf0}, sei = {0x06, 0x05, 0x01};
+    struct Case {
+        const char* name;
+        Bytes in;
+        std::vector<Bytes> units;
+    } cases[] = {
+        {"sps pps idr p p", Cat({sc4, sps, sc4, pps, sc4, idr, sc4, p1, sc4, p2}),
+         {Cat({sc4, sps, sc4, pps, sc4, idr}), Cat({sc4, p1}), Cat({sc4, p2})}},
+        {"3-byte start codes", Cat({sc3, sps, sc3, pps, sc4, idr, sc3, p1}),
+         {Cat({sc4, sps, sc4, pps, sc4, idr}), Cat({sc4, p1})}},
+        {"aud splits", Cat({sc4, aud, sc4, p1, sc4, aud, sc3, sei, sc4, p2}),
+         {Cat({sc4, aud, sc4, p1}), Cat({sc4, aud, sc4, sei, sc4, p2})}},
+        {"two slices, one picture", Cat({sc4, idr, sc4, idr_part2, sc4, p1}),
+         {Cat({sc4, idr, sc4, idr_part2}), Cat({sc4, p1})}},
+        {"sei after a slice", Cat({sc4, p1, sc4, sei, sc4, p2}),
+         {Cat({sc4, p1}), Cat({sc4, sei, sc4, p2})}},
+        {"garbage and trailing zeros", Cat({{0xff, 0x01}, sc3, p1, {0, 0, 0}, sc4, p2, {0, 0}}),
+         {Cat({sc4, p1}), Cat({sc4, p2})}},
+        {"empty nal units", Cat({sc4, sc3, p1, sc4}), {Cat({sc4, p1})}},
+        {"no start code", {0x65, 0x88, 0, 0}, {}},
+    };
+    for (const Case& c : cases) {
+        for (size_t chunk : {c.in.size() + 1, size_t{1}, size_t{2}, size_t{3}, size_t{5}}) {
+            EXPECT_EQ(Split(c.in, chunk), c.units) << c.name << ", chunks of " << chunk;
+        }
+    }
+}
+
+TEST(AccessUnitSplitterTest, SampleFileHasOneUnitPerFrame) {
+    const char* dir = getenv("ORVEX_MEDIA_DIR");
+    std::string path = std::string(dir != nullptr ? dir : "/work/shared/media") +
+                       "/testsrc2_640x480_30fps_4s.h264";
+    std::ifstream file(path, std::ios::binary);
+    if (!file) GTEST_SKIP() << path << " not found";
+    Bytes in((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
+    std::vector<Bytes> units = Split(in, in.size() + 1);
+    ASSERT_EQ(units.size(), 120u);  // 4 s at 30 fps
+    for (size_t i = 0; i < units.size(); ++i) {
+        ASSERT_GE(units[i].size(), 5u);
+        EXPECT_EQ(Bytes(units[i].begin(), units[i].begin() + 4), (Bytes{0, 0, 0, 1})) << i;
+        EXPECT_EQ(units[i][4] & 0x1f, i % 30 == 0 ? 7 : 1) << i;
+    }
+    EXPECT_EQ(Split(in, 64 * 1024), units);
+}
+
+}  // namespace
