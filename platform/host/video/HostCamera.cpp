@@ -1,0 +1,51 @@
+#include "platform/host/video/HostCamera.h"
+
+#include <cstdio>
+
+#include "platform/Ports.h"
+
+namespace platform {
+namespace host {
+
+const char* const HostCamera::kDefaultParameters =
+    "preview-size=1280x720;preview-size-values=1920x1080,1280x720,720x576,640x480,320x240;"
+    "preview-frame-rate=30;preview-frame-rate-values=15,25,30,60;preview-format=yuv420p;"
+    "video-size=1280x720;video-frame-format=yuv420p";
+
+std::string HostCamera::getParameters() {
+    std::lock_guard<std::mutex> hold(mutex_);
+    return parameters_;
+}
+
+int HostCamera::setParameters(const std::string& flattened) {
+    std::lock_guard<std::mutex> hold(mutex_);
+    parameters_ = flattened;
+    return 0;
+}
+
+int HostCamera::unlock() {
+    std::lock_guard<std::mutex> hold(mutex_);
+    locked_ = false;
+    return 0;
+}
+
+int HostCamera::lock() {
+    std::lock_guard<std::mutex> hold(mutex_);
+    locked_ = true;
+    return 0;
+}
+
+bool HostCamera::locked() {
+    std::lock_guard<std::mutex> hold(mutex_);
+    return locked_;
+}
+
+std::shared_ptr<Camera> HostCameraPort::connect(int camera_id, const std::string&, int, int) {
+    char text[64];
+    snprintf(text, sizeof text, "Camera::connect(%d)", camera_id);
+    Log().Write(kLogIdSystem, kLogDebug, "orvex:::host", text);
+    return std::make_shared<HostCamera>();
+}
+
+}  // namespace host
+}  // namespace platform

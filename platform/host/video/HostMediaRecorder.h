@@ -1,0 +1,119 @@
+#pragma once
+
+#include <atomic>
+#include <condition_variable>
+#include <cstddef>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/BinderPort.h"
+#include "platform/CapturePorts.h"
+#include "platform/host/video/TestPattern.h"
+
+class ISVCEncoder;
+
+namespace platform {
+namespace host {
+
+// The host's media recorder: between start and stop a thread draws the test pattern at the
+// requested frame rate, encodes it as H.264 (Constrained Baseline, OpenH264) and sends every
+// encoded frame to the binder service "orvex.rtp" the way the platform's recorder does.
+// Thread contract: MediaRecorder calls and encodeFrame from one thread; between start and stop
+// the recorder's own thread owns the encoder and buffers; the counters read from any thread.
+class HostMediaRecorder final : public MediaRecorder {
+public:
+    static constexpr int kOutputFormatOrvex = 101;
+    static constexpr int kVideoEncoderH264 = 2;
+    static constexpr const char* kFrameService = "orvex.rtp";
+    static constexpr uint32_t kFrameTransaction = 101;
+    static constexpr uint64_t kKeyIntervalMs = 2000;
+    // Status codes as Android numbers them.
+    static constexpr int kBadValue = -22;
+    static constexpr int kInvalidOperation = -38;
+    static constexpr int kUnknownError = -2147483647 - 1;
+
+    HostMediaRecorder() = default;
+    ~HostMediaRecorder() override;
+    HostMediaRecorder(const HostMediaRecorder&) = delete;
+    HostMediaRecorder& operator=(const HostMediaRecorder&) = delete;
+
+    int setCamera(Camera& camera) override;
+    int setVideoSource(int source) override;
+    int setOutputFormat(int format) override;
+    int setVideoEncoder(int encoder) override;
+    int setVideoSize(int width, int height) override;
+    int setVideoFrameRate(int fps) override;
+    // "key=value;key=value": reads video-param-encoding-bitrate (bits per second), accepts and
+    // ignores the other keys.
+    int setParameters(const std::string& params) override;
+    int prepare() override;
+    int start() override;
+    int stop() override;
+    int release() override;
+
+    // One encoded frame; `data` points into the recorder's buffer until its next frame.
+    struct Encoded {
+        const uint8_t* data = nullptr;
+        size_t size = 0;
+        bool key = false;
+    };
+    // The thread's work for one frame, minus the binder: draws frame `frame` as captured at
+    // host clock time `ms` and encodes it. Only after prepare and before start (else empty);
+    // size 0 when the encoder skipped the frame.
+    Encoded encodeFrame(uint32_t frame, uint64_t ms);
+
+    int videoBitrate() const { return bitrate_; }
+    uint64_t framesDelivered() const { return delivered_.load(std::memory_order_relaxed); }
+    uint64_t failedTransacts() const { return failed_.load(std::memory_order_relaxed); }
+    // Frames the thread had no time for (it was more than a frame period late) and left out.
+    uint64_t framesDropped() const { return dropped_.load(std::memory_order_relaxed); }
+
+private:
+    enum class State { kIdle, kPrepared, kRecording, kReleased };
+
+    int settable() const;
+    int openEncoder();
+    void closeEncoder();
+    void run();
+    Encoded encodeNext(uint32_t frame, uint64_t ms);
+    void deliver(const Encoded& frame);
+
+    State state_ = State::kIdle;
+    bool format_set_ = false;
+    bool encoder_set_ = false;
+    int width_ = 1280;
+    int height_ = 720;
+    int fps_ = 30;
+    int bitrate_ = 4000000;
+
+    std::unique_ptr<TestPattern> pattern_;
+    ISVCEncoder* encoder_ = nullptr;
+    std::vector<uint8_t> picture_;
+    std::vector<uint8_t> frame_;
+    ParcelWriter parcel_;
+    bool key_seen_ = false;
+    uint64_t last_key_ms_ = 0;
+    bool failing_ = false;
+
+    std::thread thread_;
+    std::mutex mutex_;
+    std::condition_variable wake_;
+    bool stopping_ = false;
+
+    std::atomic<uint64_t> delivered_{0};
+    std::atomic<uint64_t> failed_{0};
+    std::atomic<uint64_t> dropped_{0};
+};
+
+// Every create gives a fresh HostMediaRecorder. Thread contract: any thread.
+class HostMediaRecorderPort final : public MediaRecorderPort {
+public:
+    std::shared_ptr<MediaRecorder> create(const std::string& package) override;
+};
+
+}  // namespace host
+}  // namespace platform

@@ -1,0 +1,129 @@
+#include "platform/host/video/TestPattern.h"
+
+#include <algorithm>
+#include <cstring>
+
+#include "platform/host/HostClock.h"
+
+namespace platform {
+namespace host {
+namespace {
+
+int Even(int v) { return v & ~1; }
+
+struct Yuv {
+    uint8_t y, u, v;
+};
+
+// 75% bars in studio range (BT.601): white, yellow, cyan, green, magenta, red, blue, black.
+constexpr Yuv kBars[] = {{180, 128, 128}, {162, 44, 142}, {131, 156, 44}, {112, 72, 58},
+                         {84, 184, 198},  {65, 100, 212}, {35, 212, 114}, {16, 128, 128}};
+constexpr int kBarCount = sizeof kBars / sizeof kBars[0];
+
+// Seven-segment digits; bit 0 is the top segment "a", then clockwise b..f, bit 6 the middle "g".
+constexpr uint8_t kSegments[10] = {0x3F, 0x06, 0x5B, 0x4F, 0x66, 0x6D, 0x7D, 0x07, 0x7F, 0x6F};
+
+}  // namespace
+
+TestPattern::TestPattern(int width, int height)
+    : width_(std::max(2, Even(width))), height_(std::max(2, Even(height))) {
+    bar_step_ = std::max(2, Even(width_ / 160));
+    flash_size_ = std::max(2, Even(height_ / 6));
+    flash_border_ = Even(flash_size_ / 8);
+    flash_x_ = flash_border_;
+    flash_y_ = flash_border_;
+    digit_h_ = std::max(10, Even(height_ / 8));
+    stroke_ = std::max(2, Even(digit_h_ / 6));
+    digit_w_ = Even(digit_h_ / 2 + stroke_);
+    int pad = 2 * stroke_;
+    int plate_w = kDigits * digit_w_ + (kDigits + 1) * pad;
+    counter_x_ = Even(width_ - plate_w - pad);
+    counter_y_ = pad;
+}
+
+size_t TestPattern::frameSize() const {
+    return static_cast<size_t>(width_) * height_ * 3 / 2;
+}
+
+void TestPattern::draw(uint32_t frame, uint64_t ms, uint8_t* i420) const {
+    drawBars(frame, i420);
+    drawCounter(frame, i420);
+    // Last, so that nothing on narrow pictures can cover the square the sync measurement reads.
+    int outer = flash_size_ + 2 * flash_border_;
+    fillRect(i420, 0, 0, outer, outer, kBlackY, kNeutralUV, kNeutralUV);
+    if (InFlash(ms)) {
+        fillRect(i420, flash_x_, flash_y_, flash_size_, flash_size_, kWhiteY, kNeutralUV,
+                 kNeutralUV);
+    }
+}
+
+void TestPattern::fillRect(uint8_t* i420, int x, int y, int w, int h, uint8_t yv, uint8_t u,
+                           uint8_t v) const {
+    // Even corners keep the chroma rectangle exactly under the luma one.
+    int x0 = Even(std::max(0, x)), y0 = Even(std::max(0, y));
+    int x1 = Even(std::min(width_, x + w)), y1 = Even(std::min(height_, y + h));
+    if (x1 <= x0 || y1 <= y0) return;
+    uint8_t* plane_y = i420;
+    uint8_t* plane_u = plane_y + static_cast<size_t>(width_) * height_;
+    uint8_t* plane_v = plane_u + static_cast<size_t>(width_ / 2) * (height_ / 2);
+    for (int row = y0; row < y1; ++row) {
+        memset(plane_y + static_cast<size_t>(row) * width_ + x0, yv, x1 - x0);
+    }
+    int cw = width_ / 2;
+    for (int row = y0 / 2; row < y1 / 2; ++row) {
+        memset(plane_u + static_cast<size_t>(row) * cw + x0 / 2, u, (x1 - x0) / 2);
+        memset(plane_v + static_cast<size_t>(row) * cw + x0 / 2, v, (x1 - x0) / 2);
+    }
+}
+
+void TestPattern::drawBars(uint32_t frame, uint8_t* i420) const {
+    // Bars are vertical, so one row of each plane is worked out and copied down.
+    int offset = static_cast<int>((static_cast<uint64_t>(frame) * bar_step_) % width_);
+    uint8_t* plane_y = i420;
+    for (int x = 0; x < width_; ++x) {
+        int bar = (x + offset) % width_ * kBarCount / width_;
+        plane_y[x] = kBars[bar].y;
+    }
+    for (int row = 1; row < height_; ++row) {
+        memcpy(plane_y + static_cast<size_t>(row) * width_, plane_y, width_);
+    }
+    int cw = width_ / 2, ch = height_ / 2;
+    uint8_t* plane_u = plane_y + static_cast<size_t>(width_) * height_;
+    uint8_t* plane_v = plane_u + static_cast<size_t>(cw) * ch;
+    for (int x = 0; x < cw; ++x) {
+        int bar = (2 * x + offset) % width_ * kBarCount / width_;
+        plane_u[x] = kBars[bar].u;
+        plane_v[x] = kBars[bar].v;
+    }
+    for (int row = 1; row < ch; ++row) {
+        memcpy(plane_u + static_cast<size_t>(row) * cw, plane_u, cw);
+        memcpy(plane_v + static_cast<size_t>(row) * cw, plane_v, cw);
+    }
+}
+
+void TestPattern::drawCounter(uint32_t frame, uint8_t* i420) const {
+    int pad = 2 * stroke_;
+    int plate_w = kDigits * digit_w_ + (kDigits + 1) * pad;
+    fillRect(i420, counter_x_, counter_y_, plate_w, digit_h_ + 2 * pad, kBlackY, kNeutralUV,
+             kNeutralUV);
+    int t = stroke_, w = digit_w_, h = digit_h_;
+    int mid = Even((h - t) / 2);
+    uint32_t rest = frame;
+    for (int i = kDigits - 1; i >= 0; --i, rest /= 10) {
+        uint8_t on = kSegments[rest % 10];
+        int x = counter_x_ + pad + i * (w + pad), y = counter_y_ + pad;
+        const int rects[7][4] = {{x, y, w, t},           {x + w - t, y, t, mid + t},
+                                 {x + w - t, y + mid, t, h - mid}, {x, y + h - t, w, t},
+                                 {x, y + mid, t, h - mid},          {x, y, t, mid + t},
+                                 {x, y + mid, w, t}};
+        for (int s = 0; s < 7; ++s) {
+            if (on & (1 << s)) {
+                fillRect(i420, rects[s][0], rects[s][1], rects[s][2], rects[s][3], kWhiteY,
+                         kNeutralUV, kNeutralUV);
+            }
+        }
+    }
+}
+
+}  // namespace host
+}  // namespace platform
