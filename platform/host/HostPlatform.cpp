@@ -2,9 +2,13 @@
 #include <string>
 
 #include "platform/Ports.h"
+#include "platform/host/HostAudio.h"
+#include "platform/host/HostBinder.h"
 #include "platform/host/HostLog.h"
 #include "platform/host/HostManagers.h"
 #include "platform/host/HostProperties.h"
+#include "platform/host/video/HostCamera.h"
+#include "platform/host/video/HostMediaRecorder.h"
 
 namespace platform {
 
@@ -19,13 +23,18 @@ void InstallDefaultPorts() {
         properties->Get("orvex.host.log", value, "stderr");
         return new host::HostLog(env != nullptr && env[0] != '\0' ? env : value);
     }();
-    static host::HostPipManager* pip = new host::HostPipManager();
-    static host::HostAudioManager* audio = new host::HostAudioManager();
     Ports ports;
     ports.log = log;
     ports.properties = properties;
-    ports.pip_manager = pip;
-    ports.audio_manager = audio;
+    ports.pip_manager = new host::HostPipManager();
+    ports.audio_manager = new host::HostAudioManager();
+    ports.binder = new host::HostBinder();
+    ports.camera = new host::HostCameraPort();
+    ports.media_recorder = new host::HostMediaRecorderPort();
+    ports.tv_manager = new host::HostTvManager();
+    ports.px_audio_out = new host::HostPxAudioOut();
+    ports.audio_record = new host::HostAudioRecordPort();
+    ports.aac_library = new host::HostAacLibrary();
     Install(ports);
 }
 
