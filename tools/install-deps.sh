@@ -1,13 +1,18 @@
 #!/usr/bin/env bash
 # Installs the Debian 12 packages a build needs, and only those that are missing.
 #   install-deps.sh          what building, running and testing on this machine needs
-#   install-deps.sh ci       that, plus the sanitizer, fuzzing and 32-bit ARM tool chains
+#   install-deps.sh e2e      that, plus the clients of the end-to-end check (ffmpeg, GStreamer)
+#   install-deps.sh ci       all of it, plus the sanitizer, fuzzing and 32-bit ARM tool chains
 set -euo pipefail
 
 packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock-dev
           libbenchmark-dev libopenh264-dev libvo-aacenc-dev)
 if [[ "${1:-}" == ci ]]; then
   packages+=(clang libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
+fi
+if [[ "${1:-}" == ci || "${1:-}" == e2e ]]; then
+  packages+=(ffmpeg gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
+             gstreamer1.0-plugins-bad gstreamer1.0-libav python3)
 fi
 
 missing=()

@@ -1,0 +1,181 @@
+#!/usr/bin/env python3
+"""A small RTSP client for checking a running orvex.
+
+    rtsp_check.py packets URL [SECONDS]   receive RTP, check packet formats, print rates
+    rtsp_check.py measure URL [SECONDS]   decode with ffmpeg, print frame rate and A/V offset
+
+The service announces audio as payload type 97 and sends it as 98 (kept for its clients on the
+television). ffmpeg and GStreamer drop packets whose type differs from the SDP, so 'measure'
+hands ffmpeg its own SDP with type 98 for the ports this client set up.
+"""
+import os
+import re
+import socket
+import struct
+import subprocess
+import sys
+import tempfile
+import threading
+import time
+
+
+class Session:
+    def __init__(self, url):
+        self.url = url
+        m = re.match(r"rtsp://([^/:]+)(?::(\d+))?/", url)
+        self.sock = socket.create_connection((m.group(1), int(m.group(2) or 554)), timeout=10)
+        self.cseq = 0
+        self.lock = threading.Lock()
+
+    def request(self, method, url, headers=""):
+        with self.lock:
+            self.cseq += 1
+            self.sock.sendall(("%s %s RTSP/1.0\r\nCSeq: %d\r\n%s\r\n" % (method, url, self.cseq, headers)).encode())
+            data = b""
+            while b"\r\n\r\n" not in data:
+                chunk = self.sock.recv(4096)
+                if not chunk:
+                    raise RuntimeError("connection closed after " + method)
+                data += chunk
+            head, _, body = data.partition(b"\r\n\r\n")
+            m = re.search(rb"Content-Length: (\d+)", head)
+            while m and len(body) < int(m.group(1)):
+                body += self.sock.recv(4096)
+            if not head.startswith(b"RTSP/1.0 200 OK"):
+                raise RuntimeError(method + ": " + head.decode(errors="replace"))
+            return head.decode(), body.decode()
+
+    def play(self, ports):
+        self.request("DESCRIBE", self.url)
+        for i, port in enumerate(ports):
+            self.request("SETUP", "%s/trackID=%d" % (self.url, i + 1),
+                         "Transport: RTP/AVP;unicast;client_port=%d-%d\r\n" % (port, port + 1))
+        self.request("PLAY", self.url)
+
+    def keep_alive(self, seconds):
+        """The service drops a connection that is quiet for 10 s."""
+        end = time.time() + seconds
+        while time.time() < end:
+            time.sleep(min(4.0, max(0.0, end - time.time())))
+            self.request("GET_PARAMETER", self.url)
+
+
+def udp_pair():
+    s = socket.socket(socket.AF_INET, socket.SOCK_DGRAM)
+    s.bind(("127.0.0.1", 0))
+    s.setsockopt(socket.SOL_SOCKET, socket.SO_RCVBUF, 4 << 20)
+    return s
+
+
+def packets(url, seconds):
+    video, audio = udp_pair(), udp_pair()
+    session = Session(url)
+    session.play([video.getsockname()[1], audio.getsockname()[1]])
+    stats = {"video": [0, 0, set(), set()], "audio": [0, 0, set(), set()]}
+    bad = []
+
+    def receive(sock, name):
+        sock.settimeout(0.5)
+        end = time.time() + seconds
+        while time.time() < end:
+            try:
+                p = sock.recv(2048)
+            except socket.timeout:
+                continue
+            st = stats[name]
+            st[0] += 1
+            st[1] += len(p)
+            st[2].add(p[1] & 0x7F)
+            st[3].add(struct.unpack(">I", p[8:12])[0])
+            if p[0] != 0x80:
+                bad.append(name + " version byte")
+            if name == "audio" and p[12:14] != b"\x00\x10":
+                bad.append("audio AU header")
+    threads = [threading.Thread(target=receive, args=(video, "video")),
+               threading.Thread(target=receive, args=(audio, "audio"))]
+    for t in threads:
+        t.start()
+    session.keep_alive(seconds)
+    for t in threads:
+        t.join()
+    for name, (n, size, pts, ssrcs) in stats.items():
+        print("%s packets=%d kbit/s=%.0f payload_types=%s ssrc=%s" %
+              (name, n, size * 8 / seconds / 1000, sorted(pts), sorted(ssrcs)))
+    if bad or not stats["video"][0] or not stats["audio"][0]:
+        print("bad:", sorted(set(bad)) or "no packets")
+        return 1
+    return 0
+
+
+SDP = """v=0
+o=- 0 0 IN IP4 127.0.0.1
+s=orvex
+c=IN IP4 127.0.0.1
+t=0 0
+m=video %d RTP/AVP 96
+a=rtpmap:96 H264/90000
+a=fmtp:96 packetization-mode=1
+m=audio %d RTP/AVP 98
+a=rtpmap:98 MPEG4-GENERIC/48000/2
+a=fmtp:98 streamtype=5; profile-level-id=1; mode=AAC-hbr; config=1190; SizeLength=13; IndexLength=3; IndexDeltaLength=3;
+"""
+
+
+def measure(url, seconds):
+    video, audio = udp_pair(), udp_pair()
+    ports = [video.getsockname()[1], audio.getsockname()[1]]
+    video.close()
+    audio.close()
+    session = Session(url)
+    session.play(ports)
+    with tempfile.NamedTemporaryFile("w", suffix=".sdp", delete=False) as f:
+        f.write(SDP % tuple(ports))
+    # The flash square's middle: it lies at about 1/48 to 9/48 of the height from the corner.
+    graph = ("[0:v]crop=ih/16:ih/16:ih/12:ih/12,showinfo[v];"
+             "[0:a]astats=metadata=1:reset=1,"
+             "ametadata=mode=print:key=lavfi.astats.Overall.RMS_level[a]")
+    cmd = ["ffmpeg", "-hide_banner", "-nostats", "-protocol_whitelist", "file,udp,rtp",
+           "-t", str(seconds), "-i", f.name, "-filter_complex", graph,
+           "-map", "[v]", "-f", "null", "-", "-map", "[a]", "-f", "null", "-"]
+    alive = threading.Thread(target=session.keep_alive, args=(seconds + 8,), daemon=True)
+    alive.start()
+    out = subprocess.run(cmd, stderr=subprocess.PIPE, stdout=subprocess.DEVNULL, text=True,
+                         timeout=seconds + 30).stderr
+    os.unlink(f.name)
+    video_t = [(float(t), int(y) > 128) for t, y in
+               re.findall(r"pts_time:\s*([0-9.]+).*?mean:\[(\d+)", out)]
+    audio_t, last = [], None
+    for line in out.splitlines():
+        m = re.search(r"pts_time:([0-9.]+)", line)
+        if m and "showinfo" not in line:
+            last = float(m.group(1))
+        m = re.search(r"RMS_level=(\S+)", line)
+        if m and last is not None:
+            level = -1e9 if "inf" in m.group(1) else float(m.group(1))
+            audio_t.append((last, level > -40.0))
+
+    def onsets(samples):
+        return [t for (t, on), (_, was) in zip(samples[1:], samples) if on and not was]
+
+    v_on, a_on = onsets(video_t), onsets(audio_t)
+    fps = (len(video_t) - 1) / (video_t[-1][0] - video_t[0][0]) if len(video_t) > 1 else 0.0
+    diffs = []
+    for a in a_on:
+        v = min(v_on, key=lambda x: abs(x - a), default=None)
+        if v is not None and abs(v - a) < 0.5:
+            diffs.append((a - v) * 1000.0)
+    errors = len(re.findall(r"(?i)error while decoding|concealing", out))
+    offset = sum(diffs) / len(diffs) if diffs else float("nan")
+    print("frames=%d fps=%.2f audio_frames=%d av_offset_ms=%.1f onsets=%d decode_errors=%d" %
+          (len(video_t), fps, len(audio_t), offset, len(diffs), errors))
+    return 0 if video_t and audio_t and errors == 0 else 1
+
+
+def main():
+    mode, url = sys.argv[1], sys.argv[2]
+    seconds = float(sys.argv[3]) if len(sys.argv) > 3 else 10.0
+    sys.exit(packets(url, seconds) if mode == "packets" else measure(url, seconds))
+
+
+if __name__ == "__main__":
+    main()
