@@ -23,18 +23,21 @@ void InstallDefaultPorts() {
         properties->Get("orvex.host.log", value, "stderr");
         return new host::HostLog(env != nullptr && env[0] != '\0' ? env : value);
     }();
-    Ports ports;
-    ports.log = log;
-    ports.properties = properties;
-    ports.pip_manager = new host::HostPipManager();
-    ports.audio_manager = new host::HostAudioManager();
-    ports.binder = new host::HostBinder();
-    ports.camera = new host::HostCameraPort();
-    ports.media_recorder = new host::HostMediaRecorderPort();
-    ports.tv_manager = new host::HostTvManager();
-    ports.px_audio_out = new host::HostPxAudioOut();
-    ports.audio_record = new host::HostAudioRecordPort();
-    ports.aac_library = new host::HostAacLibrary();
+    static const Ports ports = [] {
+        Ports p;
+        p.log = log;
+        p.properties = properties;
+        p.pip_manager = new host::HostPipManager();
+        p.audio_manager = new host::HostAudioManager();
+        p.binder = new host::HostBinder();
+        p.camera = new host::HostCameraPort();
+        p.media_recorder = new host::HostMediaRecorderPort();
+        p.tv_manager = new host::HostTvManager();
+        p.px_audio_out = new host::HostPxAudioOut();
+        p.audio_record = new host::HostAudioRecordPort();
+        p.aac_library = new host::HostAacLibrary();
+        return p;
+    }();
     Install(ports);
 }
 
