@@ -10,6 +10,7 @@
 #include "rtp/SendLoopState.h"
 #include "rtp/h264_sps.h"
 #include "service/GlobalConfig.h"
+#include "media/LazyInstance.h"
 #include "service/OrvexLog.h"
 
 namespace {
@@ -23,15 +24,7 @@ std::atomic<H264RtpTransportSession*> g_instance{nullptr};
 }  // namespace
 
 H264RtpTransportSession* H264RtpTransportSession::instance() {
-    H264RtpTransportSession* p = g_instance.load(std::memory_order_acquire);
-    if (p != nullptr) return p;
-    TLock::Scoped hold(g_class_lock);
-    p = g_instance.load(std::memory_order_relaxed);
-    if (p == nullptr) {
-        p = new H264RtpTransportSession();
-        g_instance.store(p, std::memory_order_release);
-    }
-    return p;
+    return LazyInstance(g_instance, g_class_lock, [] { return new H264RtpTransportSession(); });
 }
 
 void H264RtpTransportSession::CloseInstance() {

@@ -9,6 +9,7 @@
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
 #include "service/GlobalConfig.h"
+#include "media/LazyInstance.h"
 #include "service/OrvexLog.h"
 
 namespace {
@@ -22,15 +23,7 @@ std::atomic<MP3RtpTransportSession*> g_instance{nullptr};
 }  // namespace
 
 MP3RtpTransportSession* MP3RtpTransportSession::instance() {
-    MP3RtpTransportSession* p = g_instance.load(std::memory_order_acquire);
-    if (p != nullptr) return p;
-    TLock::Scoped hold(g_class_lock);
-    p = g_instance.load(std::memory_order_relaxed);
-    if (p == nullptr) {
-        p = new MP3RtpTransportSession();
-        g_instance.store(p, std::memory_order_release);
-    }
-    return p;
+    return LazyInstance(g_instance, g_class_lock, [] { return new MP3RtpTransportSession(); });
 }
 
 void MP3RtpTransportSession::CloseInstance() {

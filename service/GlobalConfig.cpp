@@ -6,6 +6,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "media/LazyInstance.h"
 #include "service/OrvexLog.h"
 
 namespace {
@@ -18,15 +19,7 @@ TLock g_create_lock;
 }  // namespace
 
 Global_Config* Global_Config::instance() {
-    Global_Config* p = g_instance.load(std::memory_order_acquire);
-    if (p != nullptr) return p;
-    TLock::Scoped hold(g_create_lock);
-    p = g_instance.load(std::memory_order_relaxed);
-    if (p == nullptr) {
-        p = new Global_Config();
-        g_instance.store(p, std::memory_order_release);
-    }
-    return p;
+    return LazyInstance(g_instance, g_create_lock, [] { return new Global_Config(); });
 }
 
 void Global_Config::CloseInstance() {
