@@ -85,22 +85,6 @@ TEST_F(PipTest, ListenerRegisteredThroughTheClientReceivesPlatformEvents) {
     EXPECT_EQ(g_pip_stop_flag.load(), 1u);
 }
 
-TEST_F(PipTest, ConfigStartsAtDefaultsWithTheSourceTable) {
-    orvexPIPCfg cfg;
-    EXPECT_EQ(cfg.MainInputSource(), -1);
-    EXPECT_EQ(cfg.SubInputSource(), -1);
-    EXPECT_EQ(cfg.AudioCaptureState(), -1);
-    const std::map<std::string, int> expected = {
-        {"PIP_VGA", 0},      {"PIP_ATV", 1},    {"PIP_DTV", 28},   {"PIP_CVBS", 2},
-        {"PIP_STORAGE", 34}, {"PIP_YPBPR", 16}, {"PIP_HDMI1", 23}, {"PIP_HDMI2", 24},
-        {"PIP_HDMI3", 25},   {"PIP_HDMI4", 26}};
-    EXPECT_EQ(cfg.PipSources(), expected);
-    EXPECT_EQ(fake.log.Texts("orvex:::orvexPIPCfg"),
-              (Calls{"orvexPIPCfg::orvexPIPCfg", "orvexPIPCfg::initialize",
-                     "orvexPIPCfg::SetTVParameterDefault", "orvexPIPCfg::iniPipInfo"}));
-    cfg.SetTVParameterDefault();
-    EXPECT_TRUE(fake.journal.Calls().empty());  // the sound was never switched: no call
-}
 
 TEST_F(PipTest, FlavourPropertyIsExactAndUnknownIsLookedUpAgain) {
     const std::pair<const char*, PlatformFlavour> cases[] = {

@@ -117,15 +117,6 @@ TEST(HostLogTest, FileSinkWritesLogcatLinesOnePerTextLine) {
     unlink(path.c_str());
 }
 
-TEST(HostLogTest, PriorityLetters) {
-    EXPECT_EQ(platform::host::PriorityLetter(2), 'V');
-    EXPECT_EQ(platform::host::PriorityLetter(3), 'D');
-    EXPECT_EQ(platform::host::PriorityLetter(4), 'I');
-    EXPECT_EQ(platform::host::PriorityLetter(5), 'W');
-    EXPECT_EQ(platform::host::PriorityLetter(6), 'E');
-    EXPECT_EQ(platform::host::PriorityLetter(7), 'F');
-    EXPECT_EQ(platform::host::PriorityLetter(9), '?');
-}
 
 // The default ports read the property file named by the environment and log where it says.
 TEST(HostPlatformTest, DefaultPortsFollowThePropertyFile) {

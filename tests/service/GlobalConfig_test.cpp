@@ -17,21 +17,6 @@ protected:
     platform::fake::FakePlatform fake;
 };
 
-TEST_F(GlobalConfigTest, StartsWithItsDefaults) {
-    Global_Config* c = Global_Config::instance();
-    EXPECT_EQ(c->m_video_rtp_frequency, 0u);
-    EXPECT_EQ(c->m_audio_rtp_frequency, 0u);
-    EXPECT_EQ(c->m_video_payload_type, 96);
-    EXPECT_EQ(c->m_audio_payload_type, 98);
-    EXPECT_EQ(c->m_h264_rtp_port, 8000u);
-    EXPECT_EQ(c->m_audio_rtp_port, 8002u);
-    EXPECT_EQ(c->m_server_address, "");
-    EXPECT_FALSE(c->InIISOK());
-    EXPECT_FALSE(c->isPause());
-    EXPECT_FALSE(c->isSub());
-    EXPECT_EQ(c->get_timestamp(true), 0u);
-    EXPECT_EQ(c->get_timestamp(false), 0u);
-}
 
 // Input is ready once both clock rates were configured, whichever came first.
 TEST_F(GlobalConfigTest, ReadinessInEitherOrder) {
@@ -84,13 +69,6 @@ TEST_F(GlobalConfigTest, SettersLogFixedTexts) {
               (std::vector<std::string>{"m_flag_run_pause = pausestat", "m_flag_sub = sub"}));
 }
 
-TEST_F(GlobalConfigTest, TimestampsAreKeptPerStream) {
-    Global_Config* c = Global_Config::instance();
-    c->set_timestamp(1234, true);
-    c->set_timestamp(99, false);
-    EXPECT_EQ(c->get_timestamp(true), 1234u);
-    EXPECT_EQ(c->get_timestamp(false), 99u);
-}
 
 TEST_F(GlobalConfigTest, ConcurrentFirstUseCreatesOneObject) {
     Global_Config::CloseInstance();

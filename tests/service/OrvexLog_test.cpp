@@ -12,7 +12,6 @@ protected:
     platform::fake::FakePlatform fake;
 };
 
-TEST_F(OrvexLogTest, DebugSwitchStartsOff) { EXPECT_EQ(GET_ORVEX_API_DEBUG_PRINTF(), 0); }
 
 TEST_F(OrvexLogTest, LogGoesToSystemBufferAtDebugPriority) {
     OrvexLog("orvex:::unit", "value %d,", 7);
@@ -51,13 +50,5 @@ TEST_F(OrvexLogTest, StdoutMirrorFollowsTheSwitch) {
     }
 }
 
-TEST_F(OrvexLogTest, PriorityVariantDoesNotMirror) {
-    g_orvex_debug_printf = 1;
-    ::testing::internal::CaptureStdout();
-    OrvexLogPriority(6, "orvex:::RtspSession", "set reuse rtsp address wrong %s", "x");
-    EXPECT_EQ(::testing::internal::GetCapturedStdout(), "");
-    ASSERT_EQ(fake.log.Entries().size(), 1u);
-    EXPECT_EQ(fake.log.Entries()[0].priority, 6);
-}
 
 }  // namespace
