@@ -15,6 +15,7 @@
 #include "platform/Ports.h"
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
+#include "rtp/h264_sps.h"
 #include "platform/host/video/TestPattern.h"
 
 namespace {
@@ -201,6 +202,26 @@ TEST_F(HostVideoRecorderTest, DeliversEveryFrameAsOneAnnexBBuffer) {
         EXPECT_TRUE(i > 0 || IsKeyFrame(types)) << "the first frame must be SPS+PPS+IDR";
         EXPECT_TRUE(IsKeyFrame(types) || IsPFrame(types)) << "frame " << i;
     }
+}
+
+// The send session inspects the encoder's SPS: it must parse to the picture size, and a
+// time_scale of 0 (which the session rejects) must not come from it.
+TEST_F(HostVideoRecorderTest, EncoderSpsParsesToThePictureSize) {
+    std::vector<Bytes> frames = Record(200);
+    ASSERT_FALSE(frames.empty());
+    const Bytes& key = frames[0];
+    size_t next = 4;
+    while (next + 4 <= key.size() && !(key[next] == 0 && key[next + 1] == 0 && key[next + 2] == 0 &&
+                                       key[next + 3] == 1)) {
+        ++next;
+    }
+    ASSERT_EQ(key[4] & 0x1F, 7);
+    h264_sps_t sps;
+    uint32_t time_scale = h264_parse_sps(key.data() + 5, static_cast<unsigned>(next - 5), 1, &sps);
+    EXPECT_EQ(sps.profile_idc, 66u);
+    EXPECT_EQ((sps.pic_width_in_mbs_minus1 + 1) * 16, 320u);
+    EXPECT_EQ((sps.pic_height_in_map_units_minus1 + 1) * 16, 240u);
+    EXPECT_NE(time_scale, 0u);
 }
 
 TEST_F(HostVideoRecorderTest, SurvivesRefusedDeliveriesAndResumesWithAKeyFrame) {
