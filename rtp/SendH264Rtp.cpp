@@ -31,40 +31,15 @@ void H264RtpTransportSession::CloseInstance() {
     delete g_instance.exchange(nullptr, std::memory_order_acq_rel);
 }
 
-H264RtpTransportSession::H264RtpTransportSession() : m_dests(g_class_lock) {}
+H264RtpTransportSession::H264RtpTransportSession()
+    : RtpSendSession(g_class_lock, 8000, "\n H264RtpTransportSession CloseThread() \n ") {}
 
+// The loop runs a virtual of this object: it must stop before the object goes.
 H264RtpTransportSession::~H264RtpTransportSession() { CloseSendThread(); }
 
-int H264RtpTransportSession::StartSendThread() {
-    if (m_thread_started) return 0;  // one send thread at a time
-    m_running.store(1, std::memory_order_relaxed);
+void H264RtpTransportSession::BeforeStart() {
     m_dests.MarkChanged();
     m_sps_seen = false;
-    int rc = pthread_create(&m_thread, nullptr, event_loop_thread, this);
-    m_thread_started = rc == 0;
-    return rc;
-}
-
-void H264RtpTransportSession::CloseSendThread() {
-    m_running.store(0, std::memory_order_relaxed);
-    if (m_thread_started) {
-        pthread_join(m_thread, nullptr);
-        m_thread_started = false;
-        OrvexPrint("\n H264RtpTransportSession CloseThread() \n ");
-    }
-    m_dests.Clear();
-}
-
-void H264RtpTransportSession::add_dest_socket_info(void* key, int port, std::string ip) {
-    m_dests.Add(key, port, ip);
-}
-
-void H264RtpTransportSession::del_dest_socket_info(void* key) { m_dests.Del(key); }
-
-void* H264RtpTransportSession::event_loop_thread(void* self) {
-    static_cast<H264RtpTransportSession*>(self)->procH264Thread();
-    OrvexPrintLog(kTag, "\n H264RtpTransportSession::event_loop_thread \n ");
-    return nullptr;
 }
 
 void H264RtpTransportSession::InspectParameterSets(const Buffer_Item& item) {
@@ -146,4 +121,5 @@ void H264RtpTransportSession::procH264Thread() {
     }
     close(sock);
     OrvexPrint("\n exit H264RtpTransportSession::SendH264RTPPACKET ");
+    OrvexPrintLog(kTag, "\n H264RtpTransportSession::event_loop_thread \n ");
 }

@@ -30,39 +30,11 @@ void MP3RtpTransportSession::CloseInstance() {
     delete g_instance.exchange(nullptr, std::memory_order_acq_rel);
 }
 
-MP3RtpTransportSession::MP3RtpTransportSession() : m_dests(g_class_lock) {}
+MP3RtpTransportSession::MP3RtpTransportSession()
+    : RtpSendSession(g_class_lock, 8002, "\n MP3RtpTransportSession CloseThread() \n ") {}
 
+// The loop runs a virtual of this object: it must stop before the object goes.
 MP3RtpTransportSession::~MP3RtpTransportSession() { CloseSendThread(); }
-
-int MP3RtpTransportSession::StartSendThread() {
-    if (m_thread_started) return 0;  // one send thread at a time
-    // Unlike the video session, the destination copy is not marked for a rebuild here.
-    m_running.store(1, std::memory_order_relaxed);
-    int rc = pthread_create(&m_thread, nullptr, event_loop_thread, this);
-    m_thread_started = rc == 0;
-    return rc;
-}
-
-void MP3RtpTransportSession::CloseSendThread() {
-    m_running.store(0, std::memory_order_relaxed);
-    if (m_thread_started) {
-        pthread_join(m_thread, nullptr);
-        m_thread_started = false;
-        OrvexPrint("\n MP3RtpTransportSession CloseThread() \n ");
-    }
-    m_dests.Clear();
-}
-
-void MP3RtpTransportSession::add_dest_socket_info(void* key, int port, std::string ip) {
-    m_dests.Add(key, port, ip);
-}
-
-void MP3RtpTransportSession::del_dest_socket_info(void* key) { m_dests.Del(key); }
-
-void* MP3RtpTransportSession::event_loop_thread(void* self) {
-    static_cast<MP3RtpTransportSession*>(self)->procMP3Thread();
-    return nullptr;
-}
 
 void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, int sockfd,
                                               uint32_t timestamp, uint16_t sequence) {

@@ -1,0 +1,38 @@
+#include "rtp/RtpSendSession.h"
+
+#include "service/OrvexLog.h"
+
+RtpSendSession::RtpSendSession(TLock& class_lock, unsigned server_port, const char* closed_text)
+    : m_dests(class_lock), m_server_port(server_port), m_closed_text(closed_text) {}
+
+RtpSendSession::~RtpSendSession() { CloseSendThread(); }
+
+void* RtpSendSession::Trampoline(void* self) {
+    static_cast<RtpSendSession*>(self)->Run();
+    return nullptr;
+}
+
+int RtpSendSession::StartSendThread() {
+    if (m_thread_started) return 0;  // one send thread at a time
+    m_running.store(1, std::memory_order_relaxed);
+    BeforeStart();
+    int rc = pthread_create(&m_thread, nullptr, Trampoline, this);
+    m_thread_started = rc == 0;
+    return rc;
+}
+
+void RtpSendSession::CloseSendThread() {
+    m_running.store(0, std::memory_order_relaxed);
+    if (m_thread_started) {
+        pthread_join(m_thread, nullptr);
+        m_thread_started = false;
+        OrvexPrint("%s", m_closed_text);
+    }
+    m_dests.Clear();
+}
+
+void RtpSendSession::add_dest_socket_info(void* key, int port, std::string ip) {
+    m_dests.Add(key, port, ip);
+}
+
+void RtpSendSession::del_dest_socket_info(void* key) { m_dests.Del(key); }
