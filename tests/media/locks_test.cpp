@@ -9,10 +9,10 @@
 
 namespace {
 
-void Acquire(thread_mutex& m) { m.lock(); }
-void Release(thread_mutex& m) { m.unlock(); }
-void Acquire(TLock& l) { l.Lock(); }
-void Release(TLock& l) { l.UnLock(); }
+void Acquire(thread_mutex& m) ORVEX_ACQUIRE(m) { m.lock(); }
+void Release(thread_mutex& m) ORVEX_RELEASE(m) { m.unlock(); }
+void Acquire(TLock& l) ORVEX_ACQUIRE(l) { l.Lock(); }
+void Release(TLock& l) ORVEX_RELEASE(l) { l.UnLock(); }
 
 template <typename T>
 class LockTest : public ::testing::Test {};
