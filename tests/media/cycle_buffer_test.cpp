@@ -146,17 +146,6 @@ TEST_F(CycleBufferTest, TimestampZeroIsStampedWithMonotonicMilliseconds) {
     EXPECT_LE(item->timestamp - before, after - before);  // within [before, after], wrap-safe
 }
 
-TEST_F(CycleBufferTest, ResetEmptiesTheRing) {
-    cycle_buffer ring(64);
-    auto data = Bytes(20, 1);
-    ASSERT_TRUE(ring.newwrite(data.data(), 20, 1, false));
-    ring.reset();
-    EXPECT_EQ(ring.used_space(), 0u);
-    EXPECT_FALSE(ring.newread(*item));
-    ASSERT_TRUE(ring.newwrite(data.data(), 20, 2, false));
-    ASSERT_TRUE(ring.newread(*item));
-    EXPECT_EQ(item->timestamp, 2u);
-}
 
 // A producer and a consumer thread move 100 MB of random-sized items; every byte, length and
 // time stamp is checked, in order.

@@ -227,24 +227,6 @@ TEST_F(HostBinderTest, NobodyListeningIsANegativeStatus) {
     }
 }
 
-TEST_F(HostBinderTest, ServicesComeAndGoUnderOneName) {
-    HostBinder client;
-    ParcelWriter p;
-    p.writeInt32(3);
-    for (int round = 0; round < 3; ++round) {
-        auto service = std::make_shared<RecordingService>();
-        HostBinder server;
-        ASSERT_EQ(server.addService("svc", service), 0) << round;
-        EXPECT_LT(HostBinder().addService("svc", service), 0) << "a live name taken over";
-        server.startThreadPool();
-        // The client's connection to the previous round's service is dead: it reconnects.
-        EXPECT_EQ(client.transact("svc", 101, p), 0) << round;
-        EXPECT_EQ(service->Take().size(), 1u);
-    }
-    for (const char* bad : {"", ".", "..", "a/b", "a b", "x\n"}) {
-        EXPECT_LT(HostBinder().addService(bad, std::make_shared<RecordingService>()), 0) << bad;
-    }
-}
 
 
 // The units one call gives, and the same input fed in chunks as orvex-feed reads it.

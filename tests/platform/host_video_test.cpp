@@ -167,27 +167,6 @@ TEST_F(HostVideoRecorderTest, RefusesWrongOrderAndWrongSettings) {
     EXPECT_NE(r.start(), 0);
 }
 
-TEST_F(HostVideoRecorderTest, ReadsTheBitrateParameter) {
-    const int kDefault = HostMediaRecorder().videoBitrate();
-    struct Case {
-        const char* params;
-        bool ok;
-        int bitrate;
-    } cases[] = {
-        {"", true, kDefault},
-        {"video-param-camera-id=5", true, kDefault},
-        {"video-param-encoding-bitrate=2048000", true, 2048000},
-        {"video-param-camera-id=5; video-param-encoding-bitrate = 512000 ;", true, 512000},
-        {"video-param-encoding-bitrate=fast", false, kDefault},
-        {"video-param-encoding-bitrate=", false, kDefault},
-        {"video-param-encoding-bitrate=-5", false, kDefault},
-    };
-    for (const Case& c : cases) {
-        HostMediaRecorder r;
-        EXPECT_EQ(r.setParameters(c.params) == 0, c.ok) << c.params;
-        EXPECT_EQ(r.videoBitrate(), c.bitrate) << c.params;
-    }
-}
 
 TEST_F(HostVideoRecorderTest, DeliversEveryFrameAsOneAnnexBBuffer) {
     std::vector<Bytes> frames = Record(500);
@@ -317,19 +296,5 @@ TEST(HostVideoPatternTest, FlashSquareFollowsTheHostClock) {
     }
 }
 
-TEST(HostVideoPatternTest, EveryFrameNumberGivesANewPictureAndEveryByteIsDrawn) {
-    TestPattern pattern(320, 240);
-    Bytes a(pattern.frameSize(), 0x00), b(pattern.frameSize(), 0xFF);
-    for (uint32_t n : {0u, 9u, 99u, 159u, 999999u}) {
-        pattern.draw(n, 500, a.data());
-        pattern.draw(n + 1, 500, b.data());
-        EXPECT_NE(a, b) << "frames " << n << " and " << n + 1;
-    }
-    std::fill(a.begin(), a.end(), 0x00);
-    std::fill(b.begin(), b.end(), 0xFF);
-    pattern.draw(42, 500, a.data());
-    pattern.draw(42, 700, b.data());
-    EXPECT_EQ(a, b) << "outside the flash the picture depends on the frame number alone";
-}
 
 }  // namespace

@@ -92,17 +92,6 @@ TEST_F(SocketTest, RtspReadSplitsLinesAndDropsTheByteAfterCr) {
     }
 }
 
-TEST_F(SocketTest, RtspWritesLinesAndQueuedFields) {
-    RtspWire wire;
-    wire.server->WriteFields();
-    EXPECT_EQ(wire.Received(), "");
-    wire.server->AddField("A: 1");
-    wire.server->AddField("B: 2");
-    wire.server->WriteFields();
-    wire.server->WriteFields();
-    EXPECT_EQ(wire.server->Write(""), 2);
-    EXPECT_EQ(wire.Received(), "A: 1\r\nB: 2\r\n\r\n");
-}
 
 TEST_F(SocketTest, ParseMrlTable) {
     struct Case {
