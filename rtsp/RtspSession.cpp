@@ -20,12 +20,6 @@ namespace {
 
 constexpr const char* kTag = "orvex:::RtspSession";
 
-std::string Dotted(const sockaddr_in& a) {
-    char text[INET_ADDRSTRLEN] = {};
-    inet_ntop(AF_INET, &a.sin_addr, text, sizeof text);
-    return text;
-}
-
 unsigned CameraCode(const std::string& v) {
     if (v == "hd0") return 5;
     if (v == "hd1") return 6;
@@ -148,8 +142,8 @@ bool RtspSession::TransportDescribe(std::string* sdp) {
         return false;
     }
     m_session_name = name;
-    std::string local = Dotted(m_response->GetBindAddr());
-    std::string client = Dotted(m_response->GetConnectAddr());
+    std::string local = DottedAddress(m_response->GetBindAddr());
+    std::string client = DottedAddress(m_response->GetConnectAddr());
     *sdp = session->GenerateMediaSdp(local.c_str(), client.c_str(), 1);
     if (sdp->empty()) return false;
     m_rtp_info.clear();
@@ -203,7 +197,7 @@ bool RtspSession::TransportSetup(MediaSession* session, unsigned* server_port, i
 }
 
 bool RtspSession::StreamSetup(MediaStream* stream, unsigned* server_port, int* client_port) {
-    std::string client = Dotted(m_response->GetConnectAddr());
+    std::string client = DottedAddress(m_response->GetConnectAddr());
     int rtp = 0, rtcp = 0;
     if (!m_response->GetRequestTransportInfo(&rtp, &rtcp)) {
         m_response->ResponseError("RTSP/1.0 400 Bad Request");

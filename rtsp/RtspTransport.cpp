@@ -33,12 +33,6 @@ void ResetOnClose(int fd) {
     setsockopt(fd, SOL_SOCKET, SO_LINGER, &reset, sizeof reset);
 }
 
-std::string Dotted(const sockaddr_in& a) {
-    char text[INET_ADDRSTRLEN] = {};
-    inet_ntop(AF_INET, &a.sin_addr, text, sizeof text);
-    return text;
-}
-
 // Three tries, 1 ms apart; a frame that finds no room is dropped whole.
 int AddWithRetries(cycle_buffer& ring, unsigned char* data, unsigned len, unsigned timestamp) {
     if (data == nullptr || len == 0) return 0;
@@ -208,7 +202,7 @@ int RtspTransport::ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, in
         close(fd);
         return 0;
     }
-    std::string ip = Dotted(peer);
+    std::string ip = DottedAddress(peer);
     OrvexPrint("\n rtsp session new connection client[%d] %s:%d --2 \n", count, ip.c_str(),
                ntohs(peer.sin_port));
     if (fd > maxFd) maxFd = fd;
@@ -241,7 +235,7 @@ void RtspTransport::StartStreaming(int fd) {
     sockaddr_in local{};
     socklen_t len = sizeof local;
     if (getsockname(fd, reinterpret_cast<sockaddr*>(&local), &len) == 0) {
-        config->m_server_address = Dotted(local);
+        config->m_server_address = DottedAddress(local);
     }
     if (g_capture_running.load(std::memory_order_relaxed) != 0) return;
     g_capture_running.store(1, std::memory_order_relaxed);

@@ -1,5 +1,6 @@
 #include "rtsp/Socket.h"
 
+#include <arpa/inet.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -19,6 +20,12 @@ int Socket::ReadinessWaitMs() { return g_wait_ms.load(std::memory_order_relaxed)
 bool IsMulticastAddress(in_addr_t addr) {
     uint32_t first_octet = ntohl(addr) >> 24;
     return first_octet >= 224 && first_octet <= 239;
+}
+
+std::string DottedAddress(const sockaddr_in& a) {
+    char text[INET_ADDRSTRLEN] = {};
+    inet_ntop(AF_INET, &a.sin_addr, text, sizeof text);
+    return text;
 }
 
 Socket::Socket(unsigned mtu) : m_mtu(mtu) {}

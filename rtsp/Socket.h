@@ -2,6 +2,8 @@
 
 #include <netinet/in.h>
 
+#include <string>
+
 // Base of every network endpoint: one descriptor, a bound and a connected IPv4 address, and
 // reads and writes behind a readiness wait of fixed length (ten seconds), so that no reader or
 // writer blocks for ever. Descriptor 0 means "no socket": it is never treated as live.
@@ -41,6 +43,9 @@ protected:
     sockaddr_in m_connect_addr{};
     unsigned m_mtu;
 };
+
+// The address in dotted form ("192.168.1.20"), as inet_ntoa gives it.
+std::string DottedAddress(const sockaddr_in& a);
 
 // True for 224.0.0.0 to 239.255.255.255; `addr` in network order.
 bool IsMulticastAddress(in_addr_t addr);
