@@ -37,7 +37,8 @@ VO_U32 Init(VO_HANDLE* handle, int type, VO_CODEC_INIT_USERDATA* user) {
 VO_U32 SetInputData(VO_HANDLE, VO_CODECBUFFER* input) {
     int n = g_record.set_input_calls++;
     if (input == nullptr) return kVoErrInvalidArg;
-    if (input->Length != kBlockBytes) g_record.input_length_other = static_cast<uint32_t>(input->Length);
+    uint32_t length = static_cast<uint32_t>(input->Length);
+    if (length != kBlockBytes) g_record.input_length_other = length;
     if (n < 16 && input->Buffer != nullptr) g_record.input_first_byte[n] = input->Buffer[0];
     return kVoErrNone;
 }
@@ -45,11 +46,12 @@ VO_U32 SetInputData(VO_HANDLE, VO_CODECBUFFER* input) {
 VO_U32 GetOutputData(VO_HANDLE, VO_CODECBUFFER* output, VO_AUDIO_OUTPUTINFO*) {
     ++g_record.get_output_calls;
     if (output == nullptr) return kVoErrInvalidArg;
-    if (output->Length != kBlockBytes) g_record.offered_length_other = static_cast<uint32_t>(output->Length);
+    uint32_t offered = static_cast<uint32_t>(output->Length);
+    if (offered != kBlockBytes) g_record.offered_length_other = offered;
     if (g_next >= g_script.step_count) return kVoErrOutputBufferSmall;
     const ScriptedAacStep& step = g_steps[g_next++];
     if (step.result == kVoErrNone) {
-        uint32_t n = step.frame_length < output->Length ? step.frame_length : static_cast<uint32_t>(output->Length);
+        uint32_t n = step.frame_length < offered ? step.frame_length : offered;
         if (n > 0) memcpy(output->Buffer, step.frame, n);
         output->Length = n;
     }
@@ -93,6 +95,8 @@ __attribute__((visibility("default"))) void scripted_aac_load(const ScriptedAacS
     g_memory = nullptr;
 }
 
-__attribute__((visibility("default"))) const ScriptedAacRecord* scripted_aac_record() { return &g_record; }
+__attribute__((visibility("default"))) const ScriptedAacRecord* scripted_aac_record() {
+    return &g_record;
+}
 
 }  // extern "C"

@@ -42,7 +42,9 @@ struct Step {
     Bytes frame;
 };
 
-std::vector<Step> Repeat(int n, Step step) { return std::vector<Step>(static_cast<size_t>(n), step); }
+std::vector<Step> Repeat(int n, Step step) {
+    return std::vector<Step>(static_cast<size_t>(n), step);
+}
 std::vector<Step> Cat(std::initializer_list<std::vector<Step>> parts) {
     std::vector<Step> out;
     for (const auto& p : parts) out.insert(out.end(), p.begin(), p.end());
@@ -157,9 +159,11 @@ TEST_F(AacEncoderLoopTest, OutputResultsDecideWhatReachesTheRingAndWhenTheThread
          {{0, {}}, {0, kFrameB}, {kEnd, {}}}, {kFrameB}, 1, 0, kStarted},
         {"64 unknown results for a block skip it, logged once", 2,
          Cat({Repeat(64, {0x8000000A, {}}), {{0, kFrameA}, {kEnd, {}}}}), {kFrameA}, 2, 0,
-         {"audio_aac_enc", "encoder gave 64 unknown results for one block (last 0x8000000a): block skipped"}},
+         {"audio_aac_enc",
+          "encoder gave 64 unknown results for one block (last 0x8000000a): block skipped"}},
         {"63 unknown results keep the block", 2,
-         Cat({Repeat(63, {0x8000000A, {}}), {{0, kFrameA}, {kEnd, {}}}}), {kFrameA}, 1, 1, kStarted},
+         Cat({Repeat(63, {0x8000000A, {}}), {{0, kFrameA}, {kEnd, {}}}}), {kFrameA}, 1, 1,
+         kStarted},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.name);
@@ -173,7 +177,8 @@ TEST_F(AacEncoderLoopTest, OutputResultsDecideWhatReachesTheRingAndWhenTheThread
         EXPECT_EQ(printed, kRanToTheEnd);
         EXPECT_EQ(RingItems(), c.items);
         EXPECT_EQ(fake.log.Texts(kTag), c.logged);
-        EXPECT_EQ(fake.journal.Calls(), (Texts{std::string("dlopen(") + ORVEX_SCRIPTED_AAC + ")", "dlclose"}));
+        EXPECT_EQ(fake.journal.Calls(),
+                  (Texts{std::string("dlopen(") + ORVEX_SCRIPTED_AAC + ")", "dlclose"}));
         EXPECT_EQ(audio_pcm_ring().used_space(), c.blocks_left * kPcmBlockBytes);
 
         const ScriptedAacRecord& r = Record();
@@ -216,7 +221,8 @@ TEST_F(AacEncoderLoopTest, LoadAndInitFailuresEndOnlyTheEncoderThread) {
         {"API table refused", scripted, "", 1, 0, "\npGetAPI function return error\n",
          {"dlopen(" + scripted + ")", "dlclose"}, 0},
         {"Init fails", scripted, "", 0, 0x80000001,
-         "\n#### VOI_Error2:fail to initialize the Encoderr###\n", {"dlopen(" + scripted + ")", "dlclose"}, 1},
+         "\n#### VOI_Error2:fail to initialize the Encoderr###\n",
+         {"dlopen(" + scripted + ")", "dlclose"}, 1},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.name);

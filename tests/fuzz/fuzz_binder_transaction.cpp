@@ -23,7 +23,8 @@ struct Service {
 
     Service() {
         skyvo_rtsp_sever_init();
-        if (skyvo_rtsp_sever_open(0) != 0 || android::OrvexService::instantiate() != 0) __builtin_trap();
+        if (skyvo_rtsp_sever_open(0) != 0) __builtin_trap();
+        if (android::OrvexService::instantiate() != 0) __builtin_trap();
         binder = fake.binder.service("orvex.rtp");
         if (!binder) __builtin_trap();
     }

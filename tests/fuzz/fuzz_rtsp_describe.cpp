@@ -41,7 +41,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     server->fake.properties.Set("kelvo.build.kelvotv", kFlavours[data[0] & 3]);
     g_url_check_switch = (data[0] & 4) != 0;
     std::string url(reinterpret_cast<const char*>(data + 1), size - 1);
-    std::string request = "DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 2\r\nAccept: application/sdp\r\n\r\n" +
+    std::string request = "DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 2\r\n" +
+                          "Accept: application/sdp\r\n\r\n" +
                           "SETUP " + url + " RTSP/1.0\r\nCSeq: 3\r\n" +
                           "Transport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n";
     int fds[2];
