@@ -24,6 +24,8 @@ public:
     static const char* FmtpForWidth(unsigned width);
 
 private:
+    class NalPayloads;
+
     unsigned m_param1 = 0;
     unsigned m_param2 = 0;
     unsigned m_param3 = 0;
