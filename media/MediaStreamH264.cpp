@@ -3,11 +3,10 @@
 #include <cstdio>
 
 #include "capture/LivecameraResolution.h"
+#include "rtp/RtpPackets.h"
 #include "service/GlobalConfig.h"
 
 namespace {
-
-constexpr unsigned char kFuA = 28;  // RFC 6184 §5.8
 
 // Index of the next 0 0 1 at or after `from`, or `len`.
 unsigned FindStartCode(const unsigned char* p, unsigned len, unsigned from) {
@@ -81,31 +80,32 @@ int MediaStreamH264::TransportData(unsigned char* data, unsigned len, int timest
     return total;
 }
 
+// Each payload through the track's transport; the marker only at the end of the last unit.
+class MediaStreamH264::NalPayloads final : public H264PayloadSink {
+public:
+    NalPayloads(MediaStreamH264& track, int timestamp, bool last)
+        : track_(track), timestamp_(timestamp), last_(last) {}
+    void Payload(unsigned char* packet, unsigned length, bool end) override {
+        int marker = last_ && end ? 1 : 0;
+        total += track_.SendPacket(packet + kRtpHeaderSize, length, timestamp_, marker);
+    }
+    int total = 0;
+
+private:
+    MediaStreamH264& track_;
+    int timestamp_;
+    bool last_;
+};
+
 int MediaStreamH264::TransportH264Nal(unsigned char* nal, unsigned len, int timestamp, bool last) {
     if (nal == nullptr || len < 5 || m_packet_size <= kRtpHeaderSize + 2) return 0;
-    unsigned char header = nal[3];
-    unsigned type = header & 0x1F;
+    unsigned type = nal[3] & 0x1F;
     if (type == 7 || type == 8) return 0;
-    if (len - 3 <= m_packet_size - kRtpHeaderSize) {
-        return SendPacket(nal + 3, len - 3, timestamp, last ? 1 : 0);
-    }
-    const unsigned max_piece = m_packet_size - kRtpHeaderSize - 2;
-    unsigned char* piece = nal + 4;
-    unsigned remaining = len - 4;
-    int total = 0;
-    bool first = true;
-    m_fu_buffer.ExtendBuffer(max_piece + 2);
-    while (remaining > 0) {
-        unsigned n = remaining < max_piece ? remaining : max_piece;
-        bool end = n == remaining;
-        unsigned char* out = m_fu_buffer.GetData();
-        out[0] = static_cast<unsigned char>((header & 0xE0) | kFuA);
-        out[1] = static_cast<unsigned char>(type | (first ? 0x80 : 0) | (end ? 0x40 : 0));
-        for (unsigned i = 0; i < n; ++i) out[2 + i] = piece[i];
-        total += SendPacket(out, n + 2, timestamp, last && end ? 1 : 0);
-        piece += n;
-        remaining -= n;
-        first = false;
-    }
-    return total;
+    // Whole up to the packet size, else FU-A pieces that fill it; the unit's F bit is kept.
+    const H264Packing packing = {m_packet_size - kRtpHeaderSize, m_packet_size - kRtpHeaderSize - 2,
+                                 false, false};
+    m_fu_buffer.ExtendBuffer(m_packet_size);
+    NalPayloads payloads(*this, timestamp, last);
+    PacketiseH264Nal(nal + 3, len - 3, packing, m_fu_buffer.GetData(), payloads);
+    return payloads.total;
 }

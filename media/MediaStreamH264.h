@@ -24,9 +24,11 @@ public:
     static const char* FmtpForWidth(unsigned width);
 
 private:
+    class NalPayloads;
+
     unsigned m_param1 = 0;
     unsigned m_param2 = 0;
     unsigned m_param3 = 0;
     std::string m_text;
-    Buffer m_fu_buffer;
+    Buffer m_fu_buffer;  // each packet's payload is built here
 };

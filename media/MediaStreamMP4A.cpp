@@ -1,11 +1,9 @@
 #include "media/MediaStreamMP4A.h"
 
 #include <cstdio>
+#include <cstring>
 
-namespace {
-constexpr unsigned kAdtsHeaderSize = 7;
-constexpr unsigned kAuHeaderSectionSize = 4;  // AU-headers-length (16 bits) + one AU header
-}  // namespace
+#include "rtp/RtpPackets.h"
 
 MediaStreamMP4A::MediaStreamMP4A(const char* name, int object)
     : MediaStream(name, kMediaTypeMP4A), m_object(object) {}
@@ -69,32 +67,29 @@ std::string MediaStreamMP4A::GenerateMediaSdp(unsigned payload_type, int with_co
 
 int MediaStreamMP4A::TransportData(unsigned char* frame, unsigned len, int timestamp) {
     TLock::Scoped hold(m_state_lock);
-    if (m_playing == 0 || frame == nullptr || len < kAdtsHeaderSize ||
-        m_packet_size <= kRtpHeaderSize + kAuHeaderSectionSize) {
+    if (m_playing == 0 || frame == nullptr || len < kAdtsHeaderBytes ||
+        m_packet_size <= kRtpHeaderSize + kAuHeaderSectionBytes) {
         return 0;
     }
     unsigned frame_length = ((frame[3] & 0x03u) << 11) | (frame[4] << 3) | (frame[5] >> 5);
-    unsigned header = kAdtsHeaderSize + ((frame[1] & 0x01) == 0 ? 2 : 0);  // CRC when not absent
+    unsigned header = kAdtsHeaderBytes + ((frame[1] & 0x01) == 0 ? 2 : 0);  // CRC when not absent
     if (frame_length > len) frame_length = len;
     if (frame_length <= header) return 0;
     unsigned size = frame_length - header;
-    const unsigned max_piece = m_packet_size - kRtpHeaderSize - kAuHeaderSectionSize;
-    m_au_buffer.ExtendBuffer(max_piece + kAuHeaderSectionSize);
+    const unsigned max_piece = m_packet_size - kRtpHeaderSize - kAuHeaderSectionBytes;
+    m_au_buffer.ExtendBuffer(max_piece + kAuHeaderSectionBytes);
     unsigned char* out = m_au_buffer.GetData();
-    // RFC 3640 §3.2.1: 16 bits of AU headers; AU-size 13 bits (the whole AU), AU-Index 0.
-    out[0] = 0x00;
-    out[1] = 0x10;
-    out[2] = static_cast<unsigned char>(size >> 5);
-    out[3] = static_cast<unsigned char>((size << 3) & 0xF8);
+    // Every piece repeats the AU header with the size of the whole access unit.
+    WriteAuHeaderSection(out, size);
     unsigned char* piece = frame + header;
     unsigned remaining = size;
     int total = 0;
     while (remaining > 0) {
         unsigned n = remaining < max_piece ? remaining : max_piece;
-        for (unsigned i = 0; i < n; ++i) out[kAuHeaderSectionSize + i] = piece[i];
+        memcpy(out + kAuHeaderSectionBytes, piece, n);
         remaining -= n;
         piece += n;
-        total += SendPacket(out, n + kAuHeaderSectionSize, timestamp, remaining == 0 ? 1 : 0);
+        total += SendPacket(out, n + kAuHeaderSectionBytes, timestamp, remaining == 0 ? 1 : 0);
     }
     return total;
 }

@@ -2,7 +2,7 @@
 
 #include <cstring>
 
-#include "service/GlobalConfig.h"
+#include "service/Clocks.h"
 #include "service/OrvexLog.h"
 
 namespace {

@@ -2,14 +2,9 @@
 
 #include <cstring>
 
-namespace {
+#include "rtp/RtpPackets.h"
 
-void PutBig32(unsigned char* p, uint32_t v) {
-    p[0] = static_cast<unsigned char>(v >> 24);
-    p[1] = static_cast<unsigned char>(v >> 16);
-    p[2] = static_cast<unsigned char>(v >> 8);
-    p[3] = static_cast<unsigned char>(v);
-}
+namespace {
 
 uint32_t GetBig32(const unsigned char* p) {
     return (uint32_t{p[0]} << 24) | (uint32_t{p[1]} << 16) | (uint32_t{p[2]} << 8) | p[3];
@@ -25,13 +20,8 @@ bool Rtp::CreateRtpPacket(unsigned char* payload, unsigned short length, unsigne
                           int timestamp, int ssrc, int marker) {
     unsigned needed = static_cast<unsigned>(length) + kRtpHeaderSize;
     if (m_packet.GetCapacity() < needed) m_packet.ExtendBuffer(needed);
-    unsigned char* h = m_packet.GetData();
-    h[0] = 0x80;  // V=2, P=0, X=0, CC=0
-    h[1] = static_cast<unsigned char>((marker != 0 ? 0x80 : 0) | payloadType);
-    h[2] = static_cast<unsigned char>(m_sequence >> 8);
-    h[3] = static_cast<unsigned char>(m_sequence);
-    PutBig32(h + 4, static_cast<uint32_t>(timestamp));
-    PutBig32(h + 8, static_cast<uint32_t>(ssrc));
+    WriteRtpHeader(m_packet.GetData(), marker != 0, payloadType, m_sequence,
+                   static_cast<uint32_t>(timestamp), static_cast<uint32_t>(ssrc));
     ++m_sequence;
     m_packet.Rewind(kRtpHeaderSize);
     return m_packet.AppendData(payload, length);

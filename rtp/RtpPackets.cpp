@@ -9,7 +9,7 @@
 void WriteRtpHeader(unsigned char* p, bool marker, unsigned payload_type, uint16_t sequence,
                     uint32_t timestamp, uint32_t ssrc) {
     p[0] = 0x80;
-    p[1] = static_cast<unsigned char>((marker ? 0x80 : 0) | (payload_type & 0x7F));
+    p[1] = static_cast<unsigned char>((marker ? 0x80 : 0) | (payload_type & 0xFF));
     p[2] = static_cast<unsigned char>(sequence >> 8);
     p[3] = static_cast<unsigned char>(sequence);
     p[4] = static_cast<unsigned char>(timestamp >> 24);
@@ -22,37 +22,73 @@ void WriteRtpHeader(unsigned char* p, bool marker, unsigned payload_type, uint16
     p[11] = static_cast<unsigned char>(ssrc);
 }
 
+void PacketiseH264Nal(const unsigned char* nal, unsigned size, const H264Packing& packing,
+                      unsigned char* packet, H264PayloadSink& sink) {
+    if (nal == nullptr || size == 0 || packing.fragment_max == 0) return;
+    unsigned char* payload = packet + 12;
+    const unsigned char h = nal[0];
+    const unsigned char f_mask = packing.clear_forbidden ? 0x7F : 0xFF;
+    if (size <= packing.single_max) {
+        payload[0] = h & f_mask;
+        memcpy(payload + 1, nal + 1, size - 1);
+        sink.Payload(packet, size, true);
+        return;
+    }
+    const unsigned body = size - 1;
+    const unsigned counted = packing.count_header ? size : body;
+    const unsigned fragments = (counted + packing.fragment_max - 1) / packing.fragment_max;
+    const unsigned char* piece = nal + 1;
+    for (unsigned i = 0; i < fragments; ++i) {
+        bool first = i == 0;
+        bool last = i + 1 == fragments;
+        // Full pieces, then what is left (nothing when the header byte was counted in).
+        unsigned n = last ? body - i * packing.fragment_max : packing.fragment_max;
+        payload[0] = static_cast<unsigned char>((h & 0xE0 & f_mask) | 28);  // FU indicator: type 28
+        payload[1] =  // FU header: S, E and the unit's type
+            static_cast<unsigned char>((h & 0x1F) | (first ? 0x80 : 0) | (last ? 0x40 : 0));
+        memcpy(payload + 2, piece, n);
+        piece += n;
+        sink.Payload(packet, n + 2, last);
+    }
+}
+
+namespace {
+
+// The send sessions' packets: 1400 bytes of a unit at most, F cleared, marker at every unit's
+// end, SSRC 10.
+constexpr H264Packing kSessionPacking = {kH264FragmentPayload, kH264FragmentPayload, true, true};
+
+class SessionPackets final : public H264PayloadSink {
+public:
+    SessionPackets(uint32_t timestamp, unsigned payload_type, uint16_t* sequence, PacketSink& sink)
+        : timestamp_(timestamp), payload_type_(payload_type), sequence_(sequence), sink_(sink) {}
+    void Payload(unsigned char* packet, unsigned length, bool end) override {
+        WriteRtpHeader(packet, end, payload_type_ & 0x7F, (*sequence_)++, timestamp_, kRtpSsrc);
+        sink_.Send(packet, 12 + length);
+    }
+
+private:
+    uint32_t timestamp_;
+    unsigned payload_type_;
+    uint16_t* sequence_;
+    PacketSink& sink_;
+};
+
+}  // namespace
+
 void PacketiseH264Item(const unsigned char* item, unsigned length, uint32_t timestamp,
                        unsigned payload_type, uint16_t* sequence, PacketSink& sink) {
     if (item == nullptr || length < 5) return;  // no NAL header byte: nothing to send
     unsigned char packet[kRtpPacketMax];
-    const unsigned n = length - 4;
-    const unsigned char h = item[4];
-    if (n <= kH264FragmentPayload) {
-        // The marker is set on every single NAL unit packet, whatever its type.
-        WriteRtpHeader(packet, true, payload_type, (*sequence)++, timestamp, kRtpSsrc);
-        packet[12] = h & 0x7F;
-        memcpy(packet + 13, item + 5, n - 1);
-        sink.Send(packet, 12 + n);
-        return;
-    }
-    const unsigned r = n % kH264FragmentPayload;
-    const unsigned fragments = n / kH264FragmentPayload + (r == 0 ? 0 : 1);
-    const unsigned last_share = r == 0 ? kH264FragmentPayload : r;
-    const unsigned char* piece = item + 5;
-    for (unsigned i = 0; i < fragments; ++i) {
-        bool first = i == 0;
-        bool last = i + 1 == fragments;
-        // The last piece is one byte short of its share (the NAL header went first), so a
-        // unit of 1400k + 1 bytes ends with a fragment that carries no payload; kept.
-        unsigned size = last ? last_share - 1 : kH264FragmentPayload;
-        WriteRtpHeader(packet, last, payload_type, (*sequence)++, timestamp, kRtpSsrc);
-        packet[12] = static_cast<unsigned char>((h & 0x60) | 28);  // FU indicator: NRI, type 28
-        packet[13] = static_cast<unsigned char>((h & 0x1F) | (first ? 0x80 : 0) | (last ? 0x40 : 0));
-        memcpy(packet + 14, piece, size);
-        piece += size;
-        sink.Send(packet, 14 + size);
-    }
+    SessionPackets packets(timestamp, payload_type, sequence, sink);
+    PacketiseH264Nal(item + 4, length - 4, kSessionPacking, packet, packets);
+}
+
+void WriteAuHeaderSection(unsigned char* p, unsigned au_size) {
+    p[0] = 0x00;
+    p[1] = 0x10;
+    p[2] = static_cast<unsigned char>(au_size >> 5);
+    p[3] = static_cast<unsigned char>((au_size << 3) & 0xF8);
 }
 
 unsigned BuildAacPacket(const unsigned char* frame, unsigned length, uint32_t timestamp,
@@ -61,11 +97,7 @@ unsigned BuildAacPacket(const unsigned char* frame, unsigned length, uint32_t ti
     unsigned raw = length - kAdtsHeaderBytes;
     if (raw > kAacRawFrameMax) return 0;
     WriteRtpHeader(packet, true, payload_type, sequence, timestamp, kRtpSsrc);
-    // RFC 3640 §3.2.1: AU-headers-length 16 bits; AU-size 13 bits, AU-Index 3 bits (0).
-    packet[12] = 0x00;
-    packet[13] = 0x10;
-    packet[14] = static_cast<unsigned char>(raw >> 5);
-    packet[15] = static_cast<unsigned char>((raw << 3) & 0xF8);
+    WriteAuHeaderSection(packet + 12, raw);
     memcpy(packet + 16, frame + kAdtsHeaderBytes, raw);
     return 16 + raw;
 }

@@ -1,11 +1,5 @@
 #include "service/GlobalConfig.h"
 
-#include <time.h>
-
-#include <cstdio>
-#include <cstdlib>
-#include <cstring>
-
 #include "media/LazyInstance.h"
 #include "platform/Ports.h"
 #include "service/OrvexLog.h"
@@ -96,29 +90,4 @@ void Global_Config::set_timestamp(unsigned value, bool video) {
 unsigned Global_Config::get_timestamp(bool video) {
     TLock::Scoped hold(m_timestamp_lock);
     return video ? m_video_time : m_audio_time;
-}
-
-unsigned GetTimeHeartbeatSec() {
-    char line[100] = {};
-    FILE* f = fopen("/proc/uptime", "r");
-    if (f != nullptr) {
-        char* got = fgets(line, sizeof line, f);
-        fclose(f);
-        if (got != nullptr) return static_cast<unsigned>(atof(line));
-    }
-    timespec ts{};
-    clock_gettime(CLOCK_BOOTTIME, &ts);
-    return static_cast<unsigned>(ts.tv_sec);
-}
-
-unsigned MillisecondsOf(int64_t seconds, long nanoseconds) {
-    // Unsigned arithmetic: the result wraps modulo 2^32 like the 32-bit stamps it feeds.
-    return static_cast<unsigned>(static_cast<uint64_t>(seconds) * 1000u +
-                                 static_cast<uint64_t>(nanoseconds / 1000000));
-}
-
-unsigned GetTimeStampMillsec() {
-    timespec ts{};
-    clock_gettime(CLOCK_MONOTONIC, &ts);
-    return MillisecondsOf(ts.tv_sec, ts.tv_nsec);
 }

@@ -6,6 +6,7 @@
 
 #include "capture/orvexPIPCfg.h"
 #include "media/TLock.h"
+#include "service/Clocks.h"  // the program's two clocks live with the configuration
 
 // The process-wide configuration: stream parameters, readiness, pause and sub-stream state,
 // the capture callbacks and the two send threads' playing positions.
@@ -83,10 +84,3 @@ private:
     unsigned m_video_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;
     unsigned m_audio_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;
 };
-
-// Whole seconds since boot ("/proc/uptime"; the boot-time clock when that cannot be read).
-unsigned GetTimeHeartbeatSec();
-// Milliseconds of the monotonic clock, wrapping modulo 2^32 (about 49.7 days).
-unsigned GetTimeStampMillsec();
-// The arithmetic of GetTimeStampMillsec, for any clock reading.
-unsigned MillisecondsOf(int64_t seconds, long nanoseconds);

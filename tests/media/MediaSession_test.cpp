@@ -131,6 +131,22 @@ TEST_F(MediaModelTest, AacConfigAndFrequencyIndexThresholds) {
 }
 
 // The track's own packetisers, into a loopback receiver.
+using Bytes = std::vector<unsigned char>;
+
+// "80 e0 00 01" -> bytes.
+Bytes Hex(const char* text) {
+    Bytes out;
+    for (const char* p = text; *p != '\0';) {
+        if (*p == ' ') {
+            ++p;
+            continue;
+        }
+        out.push_back(static_cast<unsigned char>(std::stoul(std::string(p, 2), nullptr, 16)));
+        p += 2;
+    }
+    return out;
+}
+
 class TrackPacketiserTest : public MediaModelTest {
 protected:
     void SetUp() override {
@@ -146,65 +162,120 @@ protected:
         setsockopt(receiver, SOL_SOCKET, SO_RCVTIMEO, &tv, sizeof tv);
     }
     void TearDown() override { close(receiver); }
-    std::vector<std::vector<unsigned char>> Packets(size_t n) {
-        std::vector<std::vector<unsigned char>> out;
-        for (size_t i = 0; i < n; ++i) {
-            std::vector<unsigned char> b(2000);
-            ssize_t got = recv(receiver, b.data(), b.size(), 0);
+    // Everything queued: loopback delivers within the sendto call.
+    std::vector<Bytes> Drain() {
+        std::vector<Bytes> out;
+        for (;;) {
+            Bytes b(2000);
+            ssize_t got = recv(receiver, b.data(), b.size(), MSG_DONTWAIT);
             if (got < 0) break;
             b.resize(static_cast<size_t>(got));
             out.push_back(b);
         }
         return out;
     }
+    // Sets the track up on a fresh transport (sequence 0) and plays it.
+    void Play(MediaStream& track, unsigned packet_size, unsigned payload_type) {
+        track.Init(1000000, packet_size);
+        track.GenerateMediaSdp(payload_type, 0);
+        ASSERT_TRUE(track.TransportSetup("127.0.0.1", 0, "127.0.0.1", port));
+        ASSERT_TRUE(track.TransportStart());
+    }
+    struct Case {
+        const char* what;
+        const char* in;
+        std::vector<const char*> out;  // whole packets
+        int sent;                      // payload bytes reported
+    };
+    void Check(MediaStream& track, const Case& c) {
+        Bytes in = Hex(c.in);
+        EXPECT_EQ(track.TransportData(in.data(), static_cast<unsigned>(in.size()), 0x01020304),
+                  c.sent)
+            << c.what;
+        std::vector<Bytes> expected;
+        for (const char* p : c.out) expected.push_back(Hex(p));
+        EXPECT_EQ(Drain(), expected) << c.what;
+    }
     int receiver = -1;
     unsigned port = 0;
 };
 
-TEST_F(TrackPacketiserTest, H264SingleUnitsAndFuAFragments) {
-    MediaStreamH264 video("h264");
-    video.Init(1000000, 100);
-    ASSERT_TRUE(video.TransportSetup("127.0.0.1", 0, "127.0.0.1", port));
-    std::vector<unsigned char> frame = {0, 0, 0, 1, 0x67, 1, 2, 3, 4};   // SPS: skipped
-    std::vector<unsigned char> small = {0, 0, 1, 0x41, 9, 9, 9, 9};       // 5 bytes after the code
-    std::vector<unsigned char> big(3 + 1 + 170, 0x33);                    // 171-byte unit
-    big[0] = 0; big[1] = 0; big[2] = 1; big[3] = 0x65;
-    frame.insert(frame.end(), small.begin(), small.end());
-    frame.push_back(0);  // 0 0 0 1: the unit ends before this zero
-    frame.insert(frame.end(), big.begin(), big.end());
-    EXPECT_EQ(video.TransportData(frame.data(), static_cast<unsigned>(frame.size()), 7), 0);  // not playing
-    ASSERT_TRUE(video.TransportStart());
-    int sent = video.TransportData(frame.data(), static_cast<unsigned>(frame.size()), 7);
-    auto packets = Packets(4);
-    ASSERT_EQ(packets.size(), 3u);
-    EXPECT_EQ(packets[0].size(), 12u + 5);
-    EXPECT_EQ(packets[0][1] & 0x80, 0);       // not the last unit: no marker
-    EXPECT_EQ(packets[0][12], 0x41);
-    EXPECT_EQ(packets[1].size(), 100u);       // 12 + 2 + 86
-    EXPECT_EQ(packets[1][12], 0x60 | 28);     // NRI kept, FU-A
-    EXPECT_EQ(packets[1][13], 0x80 | 5);      // start bit
-    EXPECT_EQ(packets[2].size(), 12u + 2 + 84);
-    EXPECT_EQ(packets[2][13], 0x40 | 5);      // end bit
-    EXPECT_EQ(packets[2][1] & 0x80, 0x80);    // marker on the last fragment of the last unit
-    EXPECT_EQ(sent, 5 + 88 + 86);
+// Packets of 20 bytes: NAL units up to 8 bytes go whole, larger ones in FU-A pieces of 6.
+TEST_F(TrackPacketiserTest, H264BytesOnTheWire) {
+    const Case cases[] = {
+        {"one unit, forbidden bit kept, marker on the last unit", "00 00 01 e5 01 02 03",
+         {"80 e0 0000 01020304 00000000 e5 01 02 03"}, 4},
+        {"SPS and PPS skipped; 4-byte codes end the unit before the extra zero",
+         "00 00 00 01 67 aa bb 00 00 00 01 68 cc dd 00 00 00 01 41 01 02",
+         {"80 e0 0000 01020304 00000000 41 01 02"}, 3},
+        {"two units: marker on the second only", "00 00 01 41 0a 0b 00 00 01 41 0c 0d",
+         {"80 60 0000 01020304 00000000 41 0a 0b", "80 e0 0001 01020304 00000000 41 0c 0d"}, 6},
+        {"a unit under 5 bytes with its code is skipped; leading bytes ignored",
+         "aa bb 00 00 01 41 00 00 01 41 0c", {"80 e0 0000 01020304 00000000 41 0c"}, 2},
+        {"the largest single unit", "00 00 01 41 01 02 03 04 05 06 07",
+         {"80 e0 0000 01020304 00000000 41 01 02 03 04 05 06 07"}, 8},
+        {"one byte over: two fragments, the F bit kept in the indicator",
+         "00 00 01 e5 01 02 03 04 05 06 07 08",
+         {"80 60 0000 01020304 00000000 fc 85 01 02 03 04 05 06",
+          "80 e0 0001 01020304 00000000 fc 45 07 08"},
+         12},
+        {"three fragments, the last short", "00 00 01 65 01 02 03 04 05 06 07 08 09 0a 0b 0c 0d",
+         {"80 60 0000 01020304 00000000 7c 85 01 02 03 04 05 06",
+          "80 60 0001 01020304 00000000 7c 05 07 08 09 0a 0b 0c",
+          "80 e0 0002 01020304 00000000 7c 45 0d"},
+         19},
+        {"fragments of a unit that is not the last carry no marker",
+         "00 00 01 41 01 02 03 04 05 06 07 08 00 00 01 41 0f",
+         {"80 60 0000 01020304 00000000 5c 81 01 02 03 04 05 06",
+          "80 60 0001 01020304 00000000 5c 41 07 08", "80 e0 0002 01020304 00000000 41 0f"},
+         14},
+        {"no start code", "01 02 03 04 05 06", {}, 0},
+        {"too short", "00 00 01 41", {}, 0},
+    };
+    for (const Case& c : cases) {
+        MediaStreamH264 video("h264");
+        Play(video, 20, 96);
+        Check(video, c);
+    }
 }
 
-TEST_F(TrackPacketiserTest, AacFramesGetOneAuHeaderSection) {
-    MediaStreamMP4A audio("aac", -1);
-    audio.Init(128000, 100);
-    ASSERT_TRUE(audio.TransportSetup("127.0.0.1", 0, "127.0.0.1", port));
-    ASSERT_TRUE(audio.TransportStart());
-    // ADTS, no CRC, frame length 7 + 100.
-    std::vector<unsigned char> frame = {0xFF, 0xF1, 0x4C, 0x80, 0x0D, 0x7F, 0xFC};
-    frame.resize(107, 0x21);
-    audio.TransportData(frame.data(), static_cast<unsigned>(frame.size()), 0);
-    auto packets = Packets(3);
-    ASSERT_EQ(packets.size(), 2u);
-    EXPECT_EQ(packets[0].size(), 100u);  // 12 + 4 + 84
-    EXPECT_EQ(std::vector<unsigned char>(packets[0].begin() + 12, packets[0].begin() + 16),
-              (std::vector<unsigned char>{0x00, 0x10, 100 >> 5, (100 << 3) & 0xFF}));
-    EXPECT_EQ(packets[1].size(), 12u + 4 + 16);
-    EXPECT_EQ(packets[1][1] & 0x80, 0x80);
+TEST_F(TrackPacketiserTest, H264PayloadTypeAndSequenceComeFromTheTrackAndTransport) {
+    MediaStreamH264 video("h264");
+    Bytes in = Hex("00 00 01 41 0a");
+    // Not set up yet: nothing is sent.
+    EXPECT_EQ(video.TransportData(in.data(), static_cast<unsigned>(in.size()), 7), 0);
+    Play(video, 20, 200);  // not masked: its top bit lands on the marker bit
+    ASSERT_EQ(video.TransportData(in.data(), static_cast<unsigned>(in.size()), 7), 2);
+    ASSERT_EQ(video.TransportData(in.data(), static_cast<unsigned>(in.size()), -2), 2);
+    EXPECT_EQ(Drain(), (std::vector<Bytes>{Hex("80 c8 0000 00000007 00000000 41 0a"),
+                                           Hex("80 c8 0001 fffffffe 00000000 41 0a")}));
+    video.TransportStop();
+    EXPECT_EQ(video.TransportData(in.data(), static_cast<unsigned>(in.size()), 7), 0);
+    EXPECT_TRUE(Drain().empty());
+}
+
+// Packets of 20 bytes: pieces of at most 4 bytes of the access unit after the AU headers.
+TEST_F(TrackPacketiserTest, AacBytesOnTheWire) {
+    const Case cases[] = {
+        {"no CRC: 6 bytes in two pieces, the AU size whole in each",
+         "ff f1 4c 80 01 bf fc 01 02 03 04 05 06",
+         {"80 61 0000 01020304 00000000 0010 0030 01 02 03 04",
+          "80 e1 0001 01020304 00000000 0010 0030 05 06"},
+         14},
+        {"CRC: two more header bytes skipped", "ff f0 4c 80 01 bf fc c1 c2 01 02 03 04",
+         {"80 e1 0000 01020304 00000000 0010 0020 01 02 03 04"}, 8},
+        {"the ADTS length beyond the data is cut to it", "ff f1 4c 80 02 1f fc 01 02 03",
+         {"80 e1 0000 01020304 00000000 0010 0018 01 02 03"}, 7},
+        {"bytes after the ADTS length are not sent", "ff f1 4c 80 01 1f fc 01 02 03",
+         {"80 e1 0000 01020304 00000000 0010 0008 01"}, 5},
+        {"header only", "ff f1 4c 80 00 ff fc", {}, 0},
+        {"shorter than a header", "ff f1 4c 80 00 ff", {}, 0},
+    };
+    for (const Case& c : cases) {
+        MediaStreamMP4A audio("aac", -1);
+        Play(audio, 20, 97);
+        Check(audio, c);
+    }
 }
 
 }  // namespace

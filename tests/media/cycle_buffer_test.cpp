@@ -10,7 +10,7 @@
 #include <vector>
 
 #include "platform/fake/FakePlatform.h"
-#include "service/GlobalConfig.h"
+#include "service/Clocks.h"
 
 namespace {
 

@@ -29,7 +29,8 @@ TEST(RtpTest, HeaderBytesForMarkerAndPayloadType) {
         unsigned char pt;
         unsigned char byte1;
     };
-    const Case cases[] = {{1, 96, 0xE0}, {0, 96, 0x60}, {0, 98, 0x62}, {5, 0, 0x80}, {0, 200, 0xC8}};
+    const Case cases[] = {{1, 96, 0xE0}, {0, 96, 0x60}, {0, 98, 0x62},
+                          {5, 0, 0x80}, {0, 200, 0xC8}, {1, 200, 0xC8}};
     for (const Case& c : cases) {
         Rtp rtp(1500);
         unsigned char payload[3] = {1, 2, 3};
