@@ -3,7 +3,7 @@
 #include "service/OrvexLog.h"
 
 DumpFile::DumpFile(const char* tag, std::string internal, std::string external, long limit,
-                   Texts texts, const bool* quiet_unless)
+                   Texts texts, const std::atomic<bool>* quiet_unless)
     : m_tag(tag),
       m_internal(std::move(internal)),
       m_external(std::move(external)),
@@ -14,16 +14,27 @@ DumpFile::DumpFile(const char* tag, std::string internal, std::string external, 
 DumpFile::~DumpFile() { Close(); }
 
 void DumpFile::Close() {
+    thread_mutex::Scoped hold(m_lock);
+    CloseLocked();
+}
+
+void DumpFile::CloseLocked() {
     if (m_file != nullptr) fclose(m_file);
     m_file = nullptr;
 }
 
+bool DumpFile::is_open() {
+    thread_mutex::Scoped hold(m_lock);
+    return m_file != nullptr;
+}
+
 void DumpFile::Say(const char* text) {
-    if (m_quiet_unless != nullptr && !*m_quiet_unless) return;
+    if (m_quiet_unless != nullptr && !m_quiet_unless->load(std::memory_order_relaxed)) return;
     OrvexPrintLog(m_tag, "%s", text);
 }
 
 void DumpFile::Write(const void* data, size_t n, bool to_external) {
+    thread_mutex::Scoped hold(m_lock);
     if (m_file == nullptr) {
         m_external_open = to_external;
         m_file = fopen(to_external ? m_external.c_str() : m_internal.c_str(), "wb");
@@ -33,8 +44,7 @@ void DumpFile::Write(const void* data, size_t n, bool to_external) {
         }
     }
     if (!m_external_open && ftell(m_file) > m_limit) {
-        fclose(m_file);
-        m_file = nullptr;
+        CloseLocked();
         Say(remove(m_internal.c_str()) == 0 ? m_texts.removed : m_texts.remove_failed);
         m_file = fopen(m_internal.c_str(), "wb");
         if (m_file == nullptr) {

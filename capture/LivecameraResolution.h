@@ -1,5 +1,7 @@
 #pragma once
 
+#include <atomic>
+
 #include "capture/PlatformFlavour.h"
 
 // The capture parameters a client chose, the platform facts they are checked against, and the
@@ -14,8 +16,9 @@ struct CaptureState {
     unsigned traveling_mode = 0;  // 0 default, 1/2 whole screen with/without OSD, 4 sub, 6 main
     unsigned sub_input_type = 0;
     unsigned frame_rate = 0;
-    bool log_switch = false;         // "kv.orvex.log"
-    bool dump_to_sd = false;         // "kv.orvex.dumptosd"
+    // Read by the dump writers on the binder and audio threads.
+    std::atomic<bool> log_switch{false};  // "kv.orvex.log"
+    std::atomic<bool> dump_to_sd{false};  // "kv.orvex.dumptosd"
     char board[256] = "android";     // "ro.board.platform"
     PlatformFlavourCache flavour;    // shared with the capture control
 };

@@ -36,7 +36,7 @@ Worker g_aac;
 cycle_buffer g_pcm_ring(100000);
 PlatformFlavourCache g_flavour;  // this module's own cache
 
-const bool kAlwaysSay = true;
+const std::atomic<bool> kAlwaysSay{true};
 DumpFile g_pcm_dump(kTag, "/data/app/orvextestaudio.pcm", "/mnt/usb/sda1/orvextestaudio.pcm", 209715200,
                     {"/n open /data/app/orvextestaudio.pcm failed /n",
                      "/n open /mnt/usb/sda1/orvextestaudio.pcm failed /n",
@@ -238,7 +238,14 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
 int start_audio_record_enc() {
     OrvexLog(kTag, "start_audio_record_enc");
     // Old threads are stopped first, so that none is left without a handle to join it by.
-    if (g_pcm.started || g_aac.started) stop_audio_record_enc();
+    // The stop clears the dump switches, which the client set for this start: keep them.
+    if (g_pcm.started || g_aac.started) {
+        unsigned char pcm = get_write_pcm_file();
+        unsigned char aac = get_write_aac_file();
+        stop_audio_record_enc();
+        if (pcm) set_write_pcm_file();
+        if (aac) set_write_aac_file();
+    }
     g_pcm_ring.reset();
     g_pcm.run = 1;
     g_aac.run = 1;
@@ -250,11 +257,12 @@ void stop_audio_record_enc() {
     OrvexLog(kTag, "stop_audio_record_enc");
     if (get_write_pcm_file()) reset_write_pcm_file();
     if (get_write_aac_file()) reset_write_aac_file();
-    g_pcm_dump.Close();
-    g_aac_dump.Close();
     g_pcm.run = 0;
     g_aac.run = 0;
     Join(g_pcm, "thread_join(g_thread_audio_pcm.thread_handle)");
     Join(g_aac, "thread_join(g_thread_audio_aac.thread_handle)");
+    // Only now: a thread still running could otherwise open its dump again.
+    g_pcm_dump.Close();
+    g_aac_dump.Close();
     OrvexPrint("stop_audio_record_enc end");
 }

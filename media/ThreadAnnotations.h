@@ -12,3 +12,4 @@
 #define ORVEX_GUARDED_BY(x) ORVEX_TSA(guarded_by(x))
 #define ORVEX_ACQUIRE(...) ORVEX_TSA(acquire_capability(__VA_ARGS__))
 #define ORVEX_RELEASE(...) ORVEX_TSA(release_capability(__VA_ARGS__))
+#define ORVEX_REQUIRES(...) ORVEX_TSA(requires_capability(__VA_ARGS__))

@@ -33,7 +33,10 @@ uint32_t cycle_buffer::UsedOf(const Snapshot& s) const {
     return m_capacity - (s.read + m_capacity - s.write) % m_capacity;
 }
 
-unsigned cycle_buffer::free_space() { return FreeOf(Snap()); }
+unsigned cycle_buffer::free_space() {
+    thread_mutex::Scoped hold(m_lock);
+    return FreeOf(Snapshot{m_read.load(std::memory_order_acquire), m_reserved});
+}
 unsigned cycle_buffer::used_space() { return UsedOf(Snap()); }
 
 uint32_t cycle_buffer::Advance(uint32_t at, uint32_t len) const {
@@ -68,19 +71,48 @@ void cycle_buffer::CountWritten(uint32_t len) {
     if (m_written_before_readable > m_threshold) m_readable.store(1, std::memory_order_relaxed);
 }
 
+void cycle_buffer::Wait() {
+    ++m_waiters;
+    m_changed.wait(m_lock);
+    --m_waiters;
+}
+
+// Takes len bytes after every earlier reservation; false (with the free space) when they do not
+// fit. A reset that is waiting for writes under way holds new writers back until it is done.
+bool cycle_buffer::Reserve(uint64_t len, uint32_t* at, uint32_t* ticket, uint32_t* free) {
+    thread_mutex::Scoped hold(m_lock);
+    while (m_resets_waiting > 0) Wait();
+    *free = FreeOf(Snapshot{m_read.load(std::memory_order_acquire), m_reserved});
+    if (*free < len) return false;
+    CountWritten(static_cast<uint32_t>(len));
+    *at = m_reserved;
+    m_reserved = Advance(m_reserved, static_cast<uint32_t>(len));
+    *ticket = m_next_ticket++;
+    ++m_in_flight;
+    return true;
+}
+
+// Makes a copied reservation readable once every reservation before it is.
+void cycle_buffer::Publish(uint32_t at, uint32_t len, uint32_t ticket) {
+    thread_mutex::Scoped hold(m_lock);
+    while (m_published_ticket != ticket) Wait();
+    m_write.store(Advance(at, len), std::memory_order_release);
+    ++m_published_ticket;
+    --m_in_flight;
+    if (m_waiters > 0) m_changed.notify_all();
+}
+
 int cycle_buffer::write(const unsigned char* data, int len) {
-    if (len < 0 || (data == nullptr && len > 0)) return 0;
-    Snapshot s = Snap();
-    uint32_t free = FreeOf(s);
-    if (free < static_cast<uint32_t>(len)) {
+    if (len <= 0 || data == nullptr) return 0;
+    uint32_t at = 0, ticket = 0, free = 0;
+    if (!Reserve(static_cast<uint32_t>(len), &at, &ticket, &free)) {
         OrvexPrintLog(kTag,
                       "\n cycle_buffer::write:free_space_size < len free_space_size:%d,len:%d,\n",
                       static_cast<int>(free), len);
         return 0;
     }
-    CountWritten(static_cast<uint32_t>(len));
-    CopyIn(s.write, data, static_cast<uint32_t>(len));
-    m_write.store(Advance(s.write, static_cast<uint32_t>(len)), std::memory_order_release);
+    CopyIn(at, data, static_cast<uint32_t>(len));
+    Publish(at, static_cast<uint32_t>(len), ticket);
     return len;
 }
 
@@ -96,26 +128,24 @@ int cycle_buffer::read(unsigned char* dst, int len) {
 
 bool cycle_buffer::newwrite(const unsigned char* data, int len, unsigned timestamp, bool) {
     if (len < 0 || (data == nullptr && len > 0)) return false;
-    Snapshot s = Snap();
-    uint32_t free = FreeOf(s);
-    if (static_cast<uint64_t>(free) < static_cast<uint64_t>(len) + kItemHeaderSize) {
+    if (timestamp == 0) timestamp = GetTimeStampMillsec();
+    uint32_t total = static_cast<uint32_t>(len) + kItemHeaderSize;
+    uint32_t at = 0, ticket = 0, free = 0;
+    if (!Reserve(static_cast<uint64_t>(len) + kItemHeaderSize, &at, &ticket, &free)) {
         OrvexPrintLog(kTag,
                       "\n cycle_buffer::newwrite:free_space_size < ( len + buffer_item_header_size "
                       ") free_space_size:%d,len:%d,buffer_item_header_size:%d,\n",
                       static_cast<int>(free), len, kItemHeaderSize);
         return false;
     }
-    if (timestamp == 0) timestamp = GetTimeStampMillsec();
     unsigned char header[kItemHeaderSize];
     int32_t length = len;
     memcpy(header, &length, 4);
     memcpy(header + 4, &timestamp, 4);
-    uint32_t total = static_cast<uint32_t>(len) + kItemHeaderSize;
-    CountWritten(total);
     // Header and payload are published by one store, so the consumer never sees half an item.
-    CopyIn(s.write, header, kItemHeaderSize);
-    CopyIn(Advance(s.write, kItemHeaderSize), data, static_cast<uint32_t>(len));
-    m_write.store(Advance(s.write, total), std::memory_order_release);
+    CopyIn(at, header, kItemHeaderSize);
+    CopyIn(Advance(at, kItemHeaderSize), data, static_cast<uint32_t>(len));
+    Publish(at, total, ticket);
     return true;
 }
 
@@ -153,7 +183,14 @@ bool cycle_buffer::newread(Buffer_Item& item) {
     return true;
 }
 
+// Writes already under way finish first (their items are emptied with the rest); new ones wait.
 void cycle_buffer::reset() {
+    thread_mutex::Scoped hold(m_lock);
+    ++m_resets_waiting;
+    while (m_in_flight > 0) Wait();
+    --m_resets_waiting;
     m_read.store(0, std::memory_order_release);
     m_write.store(0, std::memory_order_release);
+    m_reserved = 0;
+    if (m_waiters > 0) m_changed.notify_all();
 }

@@ -1,6 +1,7 @@
 #pragma once
 
 #include <atomic>
+#include <condition_variable>
 #include <cstdint>
 
 #include "media/thread_mutex.h"
@@ -17,10 +18,12 @@ struct Buffer_Item {
     unsigned char data[kFrameSizeMax];
 };
 
-// Byte ring between one producer thread and one consumer thread, used either raw (write/read)
-// or framed (newwrite/newread). One byte always stays unused so that full and empty differ.
-// Thread contract: one producer (write, newwrite) and one consumer (read, newread) at a time;
-// reset only while the consumer is stopped. No allocation after construction.
+// Byte ring from producer threads to one consumer thread, used either raw (write/read) or framed
+// (newwrite/newread). One byte always stays unused so that full and empty differ.
+// Thread contract: any number of threads may write (write, newwrite) and reset at once; each
+// write lands whole or not at all, and a reset waits for the writes already under way, then
+// empties the ring. One consumer (read, newread) at a time; reset only while it is stopped.
+// No allocation after construction.
 class cycle_buffer {
 public:
     explicit cycle_buffer(unsigned size);
@@ -41,7 +44,9 @@ public:
     void reset();
 
     unsigned capacity() const { return m_capacity; }
+    // What a writer can put in now (writes under way count as used).
     unsigned free_space();
+    // What the consumer can take now.
     unsigned used_space();
     bool item_stream_valid() const { return m_item_stream_valid.load(std::memory_order_relaxed); }
 
@@ -56,18 +61,30 @@ private:
     void CopyIn(uint32_t at, const unsigned char* src, uint32_t len);
     void CopyOut(uint32_t at, unsigned char* dst, uint32_t len) const;
     uint32_t Advance(uint32_t at, uint32_t len) const;
-    void CountWritten(uint32_t len);
+    void CountWritten(uint32_t len) ORVEX_REQUIRES(m_lock);
+    bool Reserve(uint64_t len, uint32_t* at, uint32_t* ticket, uint32_t* free);
+    void Publish(uint32_t at, uint32_t len, uint32_t ticket);
+    void Wait() ORVEX_REQUIRES(m_lock);
 
     thread_mutex m_lock;
     unsigned char* m_start;
     unsigned char* m_end;  // last byte of the storage
     uint32_t m_capacity;
-    // Offsets from m_start. Each side alone moves its own: the consumer m_read, the producer
-    // m_write; the release store of a position publishes the bytes copied before it.
+    // Offsets from m_start. The consumer alone moves m_read; writers move m_write under the
+    // lock; the release store of a position publishes the bytes copied before it.
     std::atomic<uint32_t> m_read{0};
     std::atomic<uint32_t> m_write{0};
+    // Writers reserve [m_write, m_reserved) under the lock, copy into their part outside it and
+    // publish in the order they reserved (tickets), so m_write only ever covers whole copies.
+    uint32_t m_reserved ORVEX_GUARDED_BY(m_lock) = 0;
+    uint32_t m_next_ticket ORVEX_GUARDED_BY(m_lock) = 0;
+    uint32_t m_published_ticket ORVEX_GUARDED_BY(m_lock) = 0;
+    uint32_t m_in_flight ORVEX_GUARDED_BY(m_lock) = 0;
+    uint32_t m_resets_waiting ORVEX_GUARDED_BY(m_lock) = 0;
+    uint32_t m_waiters ORVEX_GUARDED_BY(m_lock) = 0;
+    std::condition_variable_any m_changed;  // a publish or a reset finished
     uint32_t m_threshold = 0;
     std::atomic<int> m_readable{0};
-    uint32_t m_written_before_readable = 0;  // producer only
+    uint32_t m_written_before_readable ORVEX_GUARDED_BY(m_lock) = 0;
     std::atomic<int> m_item_stream_valid{1};
 };

@@ -88,6 +88,8 @@ bool RtspTransport::Open(const char* ip, unsigned port, unsigned extra) {
     if (setsockopt(m_listen_fd, SOL_SOCKET, SO_REUSEADDR, &on, sizeof on) != 0) {
         OrvexLogPriority(platform::kLogError, "orvex:::RtspSession", "set reuse rtsp address wrong %s",
                          strerror(errno));
+        close(m_listen_fd);
+        m_listen_fd = -1;
         return false;
     }
     m_listen_addr = sockaddr_in{};
@@ -125,7 +127,12 @@ void* RtspTransport::StartListenThread(void* self) {
 }
 
 bool RtspTransport::Close() {
-    if (m_opened == 0) return true;
+    if (m_opened == 0) {
+        // A failed Open may have left its socket behind.
+        if (m_listen_fd >= 0) close(m_listen_fd);
+        m_listen_fd = -1;
+        return true;
+    }
     for (auto& entry : m_sessions) delete entry.second;
     m_sessions.clear();
     m_addresses.clear();

@@ -1,16 +1,41 @@
 #include "server/skyvo_rtsp.h"
 
 #include <atomic>
+#include <thread>
 
 #include "server/RtspService_t.h"
 #include "server/skyvo_service.h"
 #include "service/OrvexLog.h"
 
 namespace {
-// Created before and destroyed after every producer runs; atomic so a late producer sees null.
+// Producers may still run while the server closes: they enter (count up) before they load the
+// pointer, and a closing server takes the pointer away before it waits for the count to drop.
+// Both sides use sequentially consistent order, so either the producer sees null or the closer
+// sees it counted.
 std::atomic<RtspService_t*> g_pRtspService{nullptr};
+std::atomic<int> g_producers_inside{0};
 
 RtspService_t* Service() { return g_pRtspService.load(std::memory_order_acquire); }
+
+class ProducerScope {
+public:
+    ProducerScope() {
+        g_producers_inside.fetch_add(1);
+        service_ = g_pRtspService.load();
+    }
+    ~ProducerScope() { g_producers_inside.fetch_sub(1); }
+    ProducerScope(const ProducerScope&) = delete;
+    ProducerScope& operator=(const ProducerScope&) = delete;
+    RtspTransport* listener() const { return service_ != nullptr ? service_->listener() : nullptr; }
+
+private:
+    RtspService_t* service_;
+};
+
+// The pointer is already null: no new producer can reach `service`.
+void WaitForProducers() {
+    while (g_producers_inside.load() != 0) std::this_thread::yield();
+}
 }  // namespace
 
 RtspService_t* skyvo_rtsp_service() { return Service(); }
@@ -28,17 +53,19 @@ int skyvo_rtsp_sever_open(unsigned port) {
     if (service == nullptr) return 1;
     if (service->Open(port)) return 0;
     OrvexDebugPuts("Rtsp Transport open failed.");
-    g_pRtspService.store(nullptr, std::memory_order_release);
+    g_pRtspService.store(nullptr);
+    WaitForProducers();
     delete service;
     return 1;
 }
 
 void skyvo_rtsp_sever_close(void) {
-    RtspService_t* service = g_pRtspService.exchange(nullptr, std::memory_order_acq_rel);
+    RtspService_t* service = g_pRtspService.exchange(nullptr);
     if (service == nullptr) {
         OrvexDebugPuts("\n g_pRtspService is NULL ! ");
         return;
     }
+    WaitForProducers();
     service->Release();
     delete service;
 }
@@ -64,15 +91,17 @@ void skyvo_set_h264_rtp_config(unsigned rate) {
 }
 
 int skyvo_add_h264_data(unsigned char* data, unsigned len) {
-    RtspService_t* service = Service();
-    if (data == nullptr || len == 0 || service == nullptr || service->listener() == nullptr) return 0;
-    return service->listener()->skyvo_add_h264_data(data, len);
+    if (data == nullptr || len == 0) return 0;
+    ProducerScope inside;
+    RtspTransport* listener = inside.listener();
+    return listener != nullptr ? listener->skyvo_add_h264_data(data, len) : 0;
 }
 
 int skyvo_add_mp3_data(unsigned char* data, unsigned len, unsigned timestamp) {
-    RtspService_t* service = Service();
-    if (data == nullptr || len == 0 || service == nullptr || service->listener() == nullptr) return 0;
-    return service->listener()->skyvo_add_mp3_data(data, len, timestamp);
+    if (data == nullptr || len == 0) return 0;
+    ProducerScope inside;
+    RtspTransport* listener = inside.listener();
+    return listener != nullptr ? listener->skyvo_add_mp3_data(data, len, timestamp) : 0;
 }
 
 // The registrations need a server; without one they are ignored rather than crash.

@@ -3,8 +3,8 @@
 // The C interface of the streaming server ("sever" is the interface's own spelling).
 // Pointers are the caller's and are not kept, except the quit flag (set_live_quit_flag_var),
 // which must outlive the server. Thread contract: init, open, close, the configuration and
-// the registrations from the main thread; skyvo_add_h264_data from one producer thread and
-// skyvo_add_mp3_data from one other, while the server is open.
+// the registrations from the main thread; skyvo_add_h264_data and skyvo_add_mp3_data from any
+// threads at any time (close waits for the calls under way).
 
 #ifdef __cplusplus
 extern "C" {

@@ -12,6 +12,7 @@
 #include "capture/DumpFile.h"
 #include "capture/orvexaudiomain.h"
 #include "platform/fake/FakePlatform.h"
+#include "server/DumpSwitches.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
@@ -135,11 +136,61 @@ TEST_F(AudioTest, StartFillsTheRingAndStopJoinsAndClearsTheSubState) {
     EXPECT_EQ(add_audio_pcm_data(reinterpret_cast<const unsigned char*>("x"), 0), 0);
 }
 
+// A PIP reopen followed by a PLAY starts the audio threads over running ones: the dump switches
+// the client asked for stay on.
+TEST_F(AudioTest, StartOverRunningThreadsKeepsTheDumpSwitches) {
+    fake.properties.Set("kelvo.build.kelvotv", "px");
+    ::testing::internal::CaptureStdout();
+    EXPECT_EQ(start_audio_record_enc(), 0);
+    set_write_pcm_file();
+    set_write_aac_file();
+    EXPECT_EQ(start_audio_record_enc(), 0);
+    EXPECT_EQ(get_write_pcm_file(), 1);
+    EXPECT_EQ(get_write_aac_file(), 1);
+    stop_audio_record_enc();
+    ::testing::internal::GetCapturedStdout();
+    EXPECT_EQ(get_write_pcm_file(), 0);
+    EXPECT_EQ(get_write_aac_file(), 0);
+}
+
+// Writers on several threads (binder pool threads) across many restarts: the file only ever
+// holds whole blocks, each from one writer.
+TEST(DumpFileTest, ConcurrentWritersAcrossRestartsKeepBlocksWhole) {
+    platform::fake::FakePlatform fake;
+    std::string path = ::testing::TempDir() + "orvex_dump_mt_" + std::to_string(getpid());
+    constexpr size_t kBlock = 100;
+    constexpr int kRounds = 20;
+    int bad = 0;
+    for (int round = 0; round < kRounds; ++round) {
+        std::atomic<bool> say{false};
+        DumpFile dump("orvex:::orvexservice", path, path + "_ex", 1000, {"a", "b", "c", "d", "e"},
+                      &say);
+        std::vector<std::thread> writers;
+        for (int w = 0; w < 3; ++w) {
+            writers.emplace_back([&dump, w] {
+                std::vector<unsigned char> block(kBlock, static_cast<unsigned char>('A' + w));
+                for (int i = 0; i < 200; ++i) dump.Write(block.data(), block.size(), false);
+            });
+        }
+        for (auto& t : writers) t.join();
+        dump.Close();
+        FILE* f = fopen(path.c_str(), "rb");
+        std::vector<unsigned char> content(4096);
+        size_t n = f != nullptr ? fread(content.data(), 1, content.size(), f) : 0;
+        if (f != nullptr) fclose(f);
+        bool whole = f != nullptr && n % kBlock == 0 && n <= 1000 + kBlock;
+        for (size_t i = 0; whole && i < n; ++i) whole = content[i] == content[i - i % kBlock];
+        if (!whole) ++bad;
+    }
+    EXPECT_EQ(bad, 0) << "of " << kRounds << " rounds";
+    unlink(path.c_str());
+}
+
 TEST(DumpFileTest, InternalDumpStartsOverPastItsLimitExternalNever) {
     platform::fake::FakePlatform fake;
     std::string dir = ::testing::TempDir() + "orvex_dump_" + std::to_string(getpid());
     std::string internal = dir + "_in", external = dir + "_ex";
-    bool say = true;
+    std::atomic<bool> say{true};
     DumpFile dump("orvex:::orvexaudiomain", internal, external, 100,
                   {"open in failed", "open ex failed", "removed", "remove failed", "reopen failed"}, &say);
     std::vector<unsigned char> block(60, 7);

@@ -2,6 +2,7 @@
 
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <cstring>
 #include <memory>
 #include <random>
@@ -187,6 +188,121 @@ TEST_F(CycleBufferTest, ProducerAndConsumerMove100MegabytesIntact) {
     EXPECT_EQ(bad, 0u);
     EXPECT_EQ(ring.used_space(), 0u);
     EXPECT_TRUE(fake.log.Texts(kTag).empty());
+}
+
+// Stress rounds for writers that run alongside each other and alongside reset. Items carry
+// their own check: the time stamp is (writer << 16 | sequence + 1), the length follows from it and
+// payload byte i is (stamp + i) mod 256. Each round starts with the positions one byte before
+// the end of storage that is filled with junk, so a stale position points into the middle of an
+// item that wrapped. Items are a few kilobytes, so writers spend their time copying.
+constexpr int kStressItemMax = 3000;
+
+struct StressItem {
+    // Never 0, which would have the ring stamp the item itself.
+    static unsigned Stamp(unsigned writer, unsigned seq) { return writer << 16 | (seq + 1); }
+    static int Length(unsigned stamp) { return 9 + static_cast<int>(stamp * 997 % kStressItemMax); }
+    static const unsigned char* Payload(unsigned stamp) {
+        static const std::vector<unsigned char> ramp = [] {
+            std::vector<unsigned char> v(kStressItemMax + 300);
+            for (size_t i = 0; i < v.size(); ++i) v[i] = static_cast<unsigned char>(i);
+            return v;
+        }();
+        return ramp.data() + (stamp & 0xFF);
+    }
+};
+
+void WrapAtEndOverJunk(cycle_buffer& ring) {
+    std::vector<unsigned char> junk(ring.capacity() - 1, 0xEE);
+    int n = static_cast<int>(junk.size());
+    ASSERT_EQ(ring.write(junk.data(), n), n);
+    ASSERT_EQ(ring.read(junk.data(), n), n);
+}
+
+bool WriteStressItem(cycle_buffer& ring, unsigned writer, unsigned seq) {
+    unsigned stamp = StressItem::Stamp(writer, seq);
+    return ring.newwrite(StressItem::Payload(stamp), StressItem::Length(stamp), stamp, false);
+}
+
+// Drains the ring; true when every item is whole and each writer's items come in order.
+bool DrainIsWellFormed(cycle_buffer& ring, Buffer_Item& item, unsigned writers, size_t* count) {
+    std::vector<int> last(writers, -1);
+    *count = 0;
+    while (ring.newread(item)) {
+        unsigned writer = item.timestamp >> 16;
+        int seq = static_cast<int>(item.timestamp & 0xFFFF);
+        if (writer >= writers || item.length != StressItem::Length(item.timestamp) ||
+            seq <= last[writer]) {
+            return false;
+        }
+        if (memcmp(item.data, StressItem::Payload(item.timestamp),
+                   static_cast<size_t>(item.length)) != 0) {
+            return false;
+        }
+        last[writer] = seq;
+        ++*count;
+    }
+    return ring.item_stream_valid() && ring.used_space() == 0;
+}
+
+// A reset while a producer is inside newwrite must leave an empty ring or whole items behind,
+// never a write position that the reset already took back.
+TEST_F(CycleBufferTest, ResetDuringWritesLeavesAWellFormedRing) {
+    constexpr int kRounds = 200;
+    constexpr unsigned kItems = 64;
+    int bad = 0;
+    for (int round = 0; round < kRounds; ++round) {
+        cycle_buffer ring(kItems * (kStressItemMax + 20));
+        WrapAtEndOverJunk(ring);
+        std::atomic<unsigned> written{0};
+        std::atomic<bool> reset_done{false};
+        // Writes until a few items after the reset, or until the ring is full.
+        std::thread producer([&] {
+            unsigned after_reset = 0;
+            for (unsigned seq = 0; seq < 0xFFFF && after_reset < 4; ++seq) {
+                unsigned stamp = StressItem::Stamp(0, seq);
+                if (ring.free_space() < StressItem::Length(stamp) + 8u) {
+                    while (!reset_done.load()) std::this_thread::yield();
+                }
+                WriteStressItem(ring, 0, seq);
+                written.store(seq + 1);
+                if (reset_done.load()) ++after_reset;
+            }
+        });
+        while (written.load() < 1 + static_cast<unsigned>(round) % 4) std::this_thread::yield();
+        ring.reset();
+        reset_done.store(true);
+        producer.join();
+        size_t count = 0;
+        if (!DrainIsWellFormed(ring, *item, 1, &count)) ++bad;
+    }
+    EXPECT_EQ(bad, 0) << "of " << kRounds << " rounds";
+}
+
+// Producers on several threads at once (binder pool threads): every item arrives whole.
+TEST_F(CycleBufferTest, ConcurrentWritersEachItemArrivesWhole) {
+    constexpr int kRounds = 100;
+    constexpr unsigned kWriters = 3;
+    constexpr unsigned kItems = 40;
+    int bad = 0;
+    for (int round = 0; round < kRounds; ++round) {
+        cycle_buffer ring(kWriters * kItems * (kStressItemMax + 20));
+        WrapAtEndOverJunk(ring);
+        std::atomic<unsigned> ready{0};
+        std::vector<std::thread> producers;
+        for (unsigned w = 0; w < kWriters; ++w) {
+            producers.emplace_back([&, w] {
+                ready.fetch_add(1);
+                while (ready.load() < kWriters) std::this_thread::yield();
+                for (unsigned seq = 0; seq < kItems; ++seq) WriteStressItem(ring, w, seq);
+            });
+        }
+        for (auto& t : producers) t.join();
+        size_t count = 0;
+        if (!DrainIsWellFormed(ring, *item, kWriters, &count) || count != kWriters * kItems) {
+            ++bad;
+        }
+    }
+    EXPECT_EQ(bad, 0) << "of " << kRounds << " rounds";
 }
 
 }  // namespace

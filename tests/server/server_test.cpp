@@ -1,5 +1,6 @@
 #include <gtest/gtest.h>
 
+#include <atomic>
 #include <chrono>
 #include <mutex>
 #include <string>
@@ -392,6 +393,39 @@ TEST(ServerLifecycleTest, PortInUseLeavesNoServerAndCloseTwiceIsHarmless) {
     EXPECT_EQ(out.substr(out.size() - std::string("\n g_pRtspService is NULL ! \n").size()),
               "\n g_pRtspService is NULL ! \n");
     close(taken);
+}
+
+// Producers keep feeding both rings while the server closes under them: no call may reach a
+// server that is being destroyed (under AddressSanitizer a use after free fails the round).
+TEST(ServerLifecycleTest, CloseWhileProducersFeedTouchesNoFreedServer) {
+    platform::fake::FakePlatform fake;
+    RtspTransport::SetSelectWaitMs(5);
+    constexpr int kRounds = 40;
+    for (int round = 0; round < kRounds; ++round) {
+        skyvo_rtsp_sever_init();
+        ASSERT_EQ(skyvo_rtsp_sever_open(static_cast<unsigned>(FreePort())), 0);
+        std::atomic<int> calls{0};
+        std::atomic<bool> stop{false};
+        auto feed = [&](bool video) {
+            unsigned char frame[4000] = {0, 0, 0, 1, 0x41};
+            while (!stop.load()) {
+                if (video) {
+                    skyvo_add_h264_data(frame, sizeof frame);
+                } else {
+                    skyvo_add_mp3_data(frame, 400, 1);
+                }
+                calls.fetch_add(1);
+            }
+        };
+        std::thread video(feed, true), audio(feed, false);
+        while (calls.load() < 2 + round % 16) std::this_thread::yield();
+        skyvo_rtsp_sever_close();
+        stop.store(true);
+        video.join();
+        audio.join();
+        EXPECT_EQ(skyvo_rtsp_service(), nullptr);
+    }
+    RtspTransport::SetSelectWaitMs(2000);
 }
 
 }  // namespace
