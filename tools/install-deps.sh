@@ -8,7 +8,7 @@ set -euo pipefail
 packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock-dev
           libbenchmark-dev libopenh264-dev libvo-aacenc-dev)
 if [[ "${1:-}" == ci ]]; then
-  packages+=(clang libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
+  packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
 fi
 if [[ "${1:-}" == ci || "${1:-}" == e2e ]]; then
   packages+=(ffmpeg gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good

@@ -3,6 +3,8 @@
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 "$top/tools/install-deps.sh"
-cmake -S "$top" -B "$top/build" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
+# CI sets ORVEX_WERROR=ON: warnings fail the build there.
+cmake -S "$top" -B "$top/build" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo \
+      -DORVEX_WERROR="${ORVEX_WERROR:-OFF}" >/dev/null
 cmake --build "$top/build"
 ctest --test-dir "$top/build" --output-on-failure -j "$(nproc)"
