@@ -122,9 +122,11 @@ std::string VideoPipeline(const SourceChoice& source, int width, int height, int
         default:
             return std::string();
     }
+    // BT.601, as the pattern: the stream carries no colour description, and players take
+    // an undescribed picture for BT.601.
     return head +
            " ! videoconvert ! videoscale add-borders=true ! videorate ! "
-           "video/x-raw,format=I420,width=" +
+           "video/x-raw,format=I420,colorimetry=bt601,width=" +
            std::to_string(width) + ",height=" + std::to_string(height) +
            ",framerate=" + std::to_string(fps) +
            "/1,pixel-aspect-ratio=1/1 ! appsink name=orvexsink max-buffers=2 drop=true";
