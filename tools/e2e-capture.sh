@@ -4,8 +4,8 @@
 # orvex.host.audio=pulse), and a stock ffmpeg client that decodes the stream and must find that
 # colour and that tone. Runs in its own network namespace, so port 554 is its own.
 #   tools/e2e-capture.sh [BUILD_DIR]            the check (needs root: namespace, port 554)
-#   tools/e2e-capture.sh [BUILD_DIR] measure    CPU of orvex, bitrate and frame rate while a
-#                                               ball moves on the screen, at 720p and 1080p
+#   tools/e2e-capture.sh [BUILD_DIR] measure    CPU of orvex, bitrate and frame rate while
+#                                               the screen moves, at 720p and 1080p
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
@@ -86,33 +86,38 @@ kill -0 "$orvex" 2>/dev/null || fail "orvex did not start"
 sleep 0.5
 
 if [[ $mode == measure ]]; then
-  # Something that moves over the whole screen, drawn by an X client.
-  gst-launch-1.0 -q videotestsrc pattern=ball is-live=true \
-    ! "video/x-raw,width=$screen_w,height=$screen_h,framerate=30/1" ! ximagesink \
-    >"$work/ball.log" 2>&1 &
-  pids+=($!)
-  sleep 2
+  # Something that moves, drawn by an X client: a small ball (little changes per frame), then
+  # colour bars scrolling over the whole screen (every pixel changes).
   hz=$(getconf CLK_TCK)
-  for size in "1280 720" "1920 1080"; do
-    set -- $size
-    timeout -k 5 60 ffmpeg -hide_banner -nostats -loglevel error -rtsp_transport udp \
-      -i "$(url "$1" "$2")" -map 0:v -c copy -t 25 -f h264 "$work/video.h264" &
-    client=$!
-    sleep 8
-    cpu0=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
-    load0=$(cut -d' ' -f1 /proc/loadavg)
-    sleep 10
-    cpu1=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
-    wait "$client" || true
-    frames=$(ffprobe -v error -count_frames -select_streams v:0 \
-      -show_entries stream=nb_read_frames -of csv=p=0 "$work/video.h264")
-    bytes=$(stat -c %s "$work/video.h264")
-    echo "e2e-capture: measure: ${1}x${2}@30 (ball on a ${screen_w}x${screen_h} screen):" \
-      "orvex CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core," \
-      "$(( bytes * 8 / 25 / 1000 )) kbit/s, $(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}') fps" \
-      "(load average $load0, $(nproc) cores)"
-    grep -h 'frames dropped' "$work/orvex.log" | tail -1 || true
+  for scene in "ball:pattern=ball" "bars:pattern=smpte horizontal-speed=4"; do
+    gst-launch-1.0 -q videotestsrc ${scene#*:} is-live=true \
+      ! "video/x-raw,width=$screen_w,height=$screen_h,framerate=30/1" ! ximagesink \
+      >"$work/scene.log" 2>&1 &
+    drawer=$!
     sleep 2
+    for size in "1280 720" "1920 1080"; do
+      set -- $size
+      timeout -k 5 60 ffmpeg -y -hide_banner -nostats -loglevel error -rtsp_transport udp \
+        -i "$(url "$1" "$2")" -map 0:v -c copy -t 25 -f h264 "$work/video.h264" </dev/null &
+      client=$!
+      sleep 8
+      cpu0=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
+      load0=$(cut -d' ' -f1 /proc/loadavg)
+      sleep 10
+      cpu1=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
+      wait "$client" || true
+      frames=$(ffprobe -v error -count_frames -select_streams v:0 \
+        -show_entries stream=nb_read_frames -of csv=p=0 "$work/video.h264")
+      bytes=$(stat -c %s "$work/video.h264")
+      echo "e2e-capture: measure: ${1}x${2}@30, ${scene%%:*} on a ${screen_w}x${screen_h}" \
+        "screen: orvex CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core," \
+        "$(( bytes * 8 / 25 / 1000 )) kbit/s, $(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}')" \
+        "fps (load average $load0 on $(nproc) cores)"
+      grep -h 'frames dropped' "$work/orvex.log" | tail -1 | sed 's/.*MediaRecorder::stop: /  /'
+      sleep 2
+    done
+    kill "$drawer"
+    wait "$drawer" 2>/dev/null || true
   done
   exit 0
 fi

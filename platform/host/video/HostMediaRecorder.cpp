@@ -295,8 +295,9 @@ int HostMediaRecorder::stop() {
         wake_.notify_all();
         thread_.join();
         Note("MediaRecorder::stop: %" PRIu64 " frames delivered, %" PRIu64
-             " transactions failed, %" PRIu64 " frames dropped",
-             framesDelivered(), failedTransacts(), framesDropped());
+             " transactions failed, %" PRIu64 " frames dropped, %" PRIu64
+             " skipped by the encoder",
+             framesDelivered(), failedTransacts(), framesDropped(), framesSkipped());
     }
     closeEncoder();
     live_.reset();
@@ -344,6 +345,8 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_
         return Encoded{};
     }
     if (info.eFrameType == videoFrameTypeSkip || info.eFrameType == videoFrameTypeInvalid) {
+        // The rate control leaves frames out when the picture costs more than the bitrate.
+        skipped_.fetch_add(1, std::memory_order_relaxed);
         return Encoded{};
     }
 

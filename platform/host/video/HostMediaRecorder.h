@@ -80,6 +80,8 @@ public:
     const SourceChoice& source() const { return source_; }
     // Frames the thread had no time for (it was more than a frame period late) and left out.
     uint64_t framesDropped() const { return dropped_.load(std::memory_order_relaxed); }
+    // Frames the encoder's rate control left out.
+    uint64_t framesSkipped() const { return skipped_.load(std::memory_order_relaxed); }
 
 private:
     enum class State { kIdle, kPrepared, kRecording, kReleased };
@@ -122,6 +124,7 @@ private:
     std::atomic<uint64_t> delivered_{0};
     std::atomic<uint64_t> failed_{0};
     std::atomic<uint64_t> dropped_{0};
+    std::atomic<uint64_t> skipped_{0};
 };
 
 // Every create gives a fresh HostMediaRecorder. Thread contract: any thread.
