@@ -7,6 +7,7 @@ namespace host {
 
 // What the host captures, chosen by the host properties orvex.host.video (main window),
 // orvex.host.video.sub (sub window) and orvex.host.audio, read at every capture start.
+// Thread contract: a plain value; the functions below may run on any thread.
 struct SourceChoice {
     enum Kind { kPattern, kTone, kNone, kX11, kV4l2, kPulse, kAlsa, kGst };
     Kind kind = kPattern;
