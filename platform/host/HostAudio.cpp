@@ -60,6 +60,7 @@ public:
             mode_ = Mode::kLive;
         }
         restartClock();
+        stalled_ = false;
         started_ = true;
         return 0;
     }
