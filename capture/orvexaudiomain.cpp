@@ -223,8 +223,9 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
             } else if (r == kVoErrOutputBufferSmall) {
                 ended = true;
                 break;
-            } else {
-                ++unknown;
+            } else if (++unknown == kUnknownResultsMax) {
+                OrvexLog(kTag, "encoder gave %d unknown results for one block (last 0x%lx): "
+                         "block skipped", kUnknownResultsMax, static_cast<unsigned long>(r));
             }
         }
     }

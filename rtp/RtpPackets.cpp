@@ -56,11 +56,11 @@ void PacketiseH264Item(const unsigned char* item, unsigned length, uint32_t time
 }
 
 unsigned BuildAacPacket(const unsigned char* frame, unsigned length, uint32_t timestamp,
-                        uint16_t sequence, unsigned char* packet) {
+                        uint16_t sequence, unsigned char* packet, unsigned payload_type) {
     if (frame == nullptr || length < kAdtsHeaderBytes) return 0;
     unsigned raw = length - kAdtsHeaderBytes;
     if (raw > kAacRawFrameMax) return 0;
-    WriteRtpHeader(packet, true, kAacPayloadType, sequence, timestamp, kRtpSsrc);
+    WriteRtpHeader(packet, true, payload_type, sequence, timestamp, kRtpSsrc);
     // RFC 3640 §3.2.1: AU-headers-length 16 bits; AU-size 13 bits, AU-Index 3 bits (0).
     packet[12] = 0x00;
     packet[13] = 0x10;

@@ -14,6 +14,7 @@ constexpr uint32_t kRtpSsrc = 10;  // every packet of every client
 // and UDP headers (20 + 8) and room to spare.
 constexpr unsigned kH264FragmentPayload = 1400;
 constexpr unsigned kAdtsHeaderBytes = 7;
+// What the audio packets carry unless kv.orvex.audiopt says otherwise; the SDP announces 97.
 constexpr unsigned kAacPayloadType = 98;
 // 1500 - 12 (RTP) - 4 (AU headers): the largest raw AAC frame one packet carries.
 constexpr unsigned kAacRawFrameMax = kRtpPacketMax - 16;
@@ -35,11 +36,12 @@ void WriteRtpHeader(unsigned char* p, bool marker, unsigned payload_type, uint16
 void PacketiseH264Item(const unsigned char* item, unsigned length, uint32_t timestamp,
                        unsigned payload_type, uint16_t* sequence, PacketSink& sink);
 
-// One ADTS frame (no CRC) as one RFC 3640 AAC-hbr packet with one AU header, marker set,
-// payload type 98. Returns the packet length, 0 when the frame is shorter than its header or
-// its raw data does not fit one packet.
+// One ADTS frame (no CRC) as one RFC 3640 AAC-hbr packet with one AU header, marker set.
+// Returns the packet length, 0 when the frame is shorter than its header or its raw data does
+// not fit one packet.
 unsigned BuildAacPacket(const unsigned char* frame, unsigned length, uint32_t timestamp,
-                        uint16_t sequence, unsigned char* packet);
+                        uint16_t sequence, unsigned char* packet,
+                        unsigned payload_type = kAacPayloadType);
 
 // Sends packets with sendto to a list of destinations in order. Video stops a packet at the
 // first failing destination; audio goes on with the others.

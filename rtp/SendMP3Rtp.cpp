@@ -40,7 +40,7 @@ void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, int sockf
                                               uint32_t timestamp, uint16_t sequence) {
     unsigned char packet[kRtpPacketMax];
     unsigned length = BuildAacPacket(item.data, static_cast<unsigned>(item.length), timestamp,
-                                     sequence, packet);
+                                     sequence, packet, m_payload_type);
     if (length == 0) {
         // Not an ADTS frame that fits one packet: dropped, the stream goes on.
         OrvexLog(kTag, "\n  mp3 frame of %d bytes dropped ! \n", static_cast<int>(item.length));
@@ -60,6 +60,7 @@ void MP3RtpTransportSession::procMP3Thread() {
     local.sin_addr.s_addr = htonl(INADDR_ANY);
     (void)bind(sock, reinterpret_cast<sockaddr*>(&local), sizeof local);  // unchecked, as ever
     const unsigned rate = config->m_audio_rtp_frequency;
+    m_payload_type = static_cast<unsigned>(config->m_audio_payload_type);
     auto item = std::make_unique<Buffer_Item>();
     AacSendState state;
     uint32_t ts = 0;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include "rtp/RtpPackets.h"
 #include "rtp/RtpSendSession.h"
 
 // The process-wide audio sender (AAC despite the name): one thread takes ADTS frames from the
@@ -20,4 +21,6 @@ private:
     void Run() override { procMP3Thread(); }
     void procMP3Thread();
     void sendMP3RtpPacket(const Buffer_Item& item, int sockfd, uint32_t timestamp, uint16_t sequence);
+
+    unsigned m_payload_type = kAacPayloadType;  // the send thread's own, taken when it starts
 };

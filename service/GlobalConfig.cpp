@@ -7,11 +7,14 @@
 #include <cstring>
 
 #include "media/LazyInstance.h"
+#include "platform/Ports.h"
 #include "service/OrvexLog.h"
 
 namespace {
 
 constexpr const char* kTag = "globalconfig";
+// The television's own clients expect 98, although the SDP announces 97.
+constexpr int32_t kAudioPayloadTypeDefault = 98;
 
 std::atomic<Global_Config*> g_instance{nullptr};
 TLock g_create_lock;
@@ -37,6 +40,21 @@ void Global_Config::video_audio_open_cap() {
 void Global_Config::video_audio_close_cap() {
     if (m_video_close != nullptr) m_video_close();
     if (m_audio_close != nullptr) m_audio_close();
+}
+
+void Global_Config::read_audio_payload_type() {
+    char value[platform::kPropertyValueMax] = {};
+    platform::Properties().Get("kv.orvex.audiopt", value, "");
+    m_audio_payload_type = kAudioPayloadTypeDefault;
+    if (value[0] == '\0') return;  // unset, as on the television
+    char* end = nullptr;
+    long pt = strtol(value, &end, 10);
+    if (end == value || *end != '\0' || pt < 96 || pt > 127) {
+        OrvexLog(kTag, "kv.orvex.audiopt=\"%s\" is not a payload type from 96 to 127; audio RTP keeps 98",
+                 value);
+        return;
+    }
+    m_audio_payload_type = static_cast<int32_t>(pt);
 }
 
 void Global_Config::mp3_config_ok() {

@@ -25,7 +25,7 @@ public:
     uint32_t m_audio_rtp_frequency = 0;  // Hz; the audio sample rate, 48000 once configured
     uint32_t m_rtsp_port = 0;
     int32_t m_video_payload_type = 96;
-    int32_t m_audio_payload_type = 98;  // what the audio RTP headers carry
+    int32_t m_audio_payload_type = 98;  // what the audio RTP headers carry (kv.orvex.audiopt)
     uint32_t m_h264_rtp_port = 8000;
     uint32_t m_audio_rtp_port = 8002;
     // Local dotted IPv4 address of the last accepted RTSP connection.
@@ -38,6 +38,10 @@ public:
     // Video first, then audio. An unregistered callback is skipped.
     void video_audio_open_cap();
     void video_audio_close_cap();
+
+    // Takes the audio RTP payload type from the property kv.orvex.audiopt: a number from 96
+    // to 127; anything else is logged and leaves 98. Called once, when the server opens.
+    void read_audio_payload_type();
 
     void mp3_config_ok();
     void h264_config_frequency_ok();

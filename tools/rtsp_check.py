@@ -4,9 +4,10 @@
     rtsp_check.py packets URL [SECONDS]   receive RTP, check packet formats, print rates
     rtsp_check.py measure URL [SECONDS]   decode with ffmpeg, print frame rate and A/V offset
 
-The service announces audio as payload type 97 and sends it as 98 (kept for its clients on the
-television). ffmpeg and GStreamer drop packets whose type differs from the SDP, so 'measure'
-hands ffmpeg its own SDP with type 98 for the ports this client set up.
+The service announces audio as payload type 97. Its packets carry 97 too when the property
+kv.orvex.audiopt says so (the host default), and then 'measure' plays the URL with stock ffmpeg.
+Left at the television's 98, ffmpeg would drop every audio packet (it keeps to the SDP's type),
+so 'measure' then hands ffmpeg its own SDP with the type the packets carry.
 """
 import os
 import re
@@ -46,11 +47,12 @@ class Session:
             return head.decode(), body.decode()
 
     def play(self, ports):
-        self.request("DESCRIBE", self.url)
+        _, sdp = self.request("DESCRIBE", self.url)
         for i, port in enumerate(ports):
             self.request("SETUP", "%s/trackID=%d" % (self.url, i + 1),
                          "Transport: RTP/AVP;unicast;client_port=%d-%d\r\n" % (port, port + 1))
         self.request("PLAY", self.url)
+        return sdp
 
     def keep_alive(self, seconds):
         """The service drops a connection that is quiet for 10 s."""
@@ -115,33 +117,53 @@ t=0 0
 m=video %d RTP/AVP 96
 a=rtpmap:96 H264/90000
 a=fmtp:96 packetization-mode=1
-m=audio %d RTP/AVP 98
-a=rtpmap:98 MPEG4-GENERIC/48000/2
-a=fmtp:98 streamtype=5; profile-level-id=1; mode=AAC-hbr; config=1190; SizeLength=13; IndexLength=3; IndexDeltaLength=3;
+m=audio %d RTP/AVP %d
+a=rtpmap:%d MPEG4-GENERIC/48000/2
+a=fmtp:%d streamtype=5; profile-level-id=1; mode=AAC-hbr; config=1190; SizeLength=13; IndexLength=3; IndexDeltaLength=3;
 """
 
 
-def measure(url, seconds):
+def audio_payload_types(url):
+    """The audio payload type the SDP announces and the one the packets carry."""
     video, audio = udp_pair(), udp_pair()
-    ports = [video.getsockname()[1], audio.getsockname()[1]]
-    video.close()
-    audio.close()
     session = Session(url)
-    session.play(ports)
-    with tempfile.NamedTemporaryFile("w", suffix=".sdp", delete=False) as f:
-        f.write(SDP % tuple(ports))
+    sdp = session.play([video.getsockname()[1], audio.getsockname()[1]])
+    audio.settimeout(5)
+    carried = audio.recv(2048)[1] & 0x7F
+    session.sock.close()
+    announced = int(re.search(r"m=audio \d+ RTP/AVP (\d+)", sdp).group(1))
+    return announced, carried
+
+
+def measure(url, seconds):
+    announced, carried = audio_payload_types(url)
+    time.sleep(1)  # the service stops capture when that client leaves
+    session = sdp_file = None
+    if carried == announced:
+        source = ["-rtsp_transport", "udp", "-t", str(seconds), "-i", url]
+    else:
+        video, audio = udp_pair(), udp_pair()
+        ports = [video.getsockname()[1], audio.getsockname()[1]]
+        video.close()
+        audio.close()
+        session = Session(url)
+        session.play(ports)
+        with tempfile.NamedTemporaryFile("w", suffix=".sdp", delete=False) as f:
+            f.write(SDP % (ports[0], ports[1], carried, carried, carried))
+        sdp_file = f.name
+        source = ["-protocol_whitelist", "file,udp,rtp", "-t", str(seconds), "-i", sdp_file]
     # The flash square's middle: it lies at about 1/48 to 9/48 of the height from the corner.
     graph = ("[0:v]crop=ih/16:ih/16:ih/12:ih/12,showinfo[v];"
              "[0:a]astats=metadata=1:reset=1,"
              "ametadata=mode=print:key=lavfi.astats.Overall.RMS_level[a]")
-    cmd = ["ffmpeg", "-hide_banner", "-nostats", "-protocol_whitelist", "file,udp,rtp",
-           "-t", str(seconds), "-i", f.name, "-filter_complex", graph,
+    cmd = ["ffmpeg", "-hide_banner", "-nostats"] + source + ["-filter_complex", graph,
            "-map", "[v]", "-f", "null", "-", "-map", "[a]", "-f", "null", "-"]
-    alive = threading.Thread(target=session.keep_alive, args=(seconds + 8,), daemon=True)
-    alive.start()
+    if session:
+        threading.Thread(target=session.keep_alive, args=(seconds + 8,), daemon=True).start()
     out = subprocess.run(cmd, stderr=subprocess.PIPE, stdout=subprocess.DEVNULL, text=True,
                          timeout=seconds + 30).stderr
-    os.unlink(f.name)
+    if sdp_file:
+        os.unlink(sdp_file)
     video_t = [(float(t), int(y) > 128) for t, y in
                re.findall(r"pts_time:\s*([0-9.]+).*?mean:\[(\d+)", out)]
     audio_t, last = [], None
@@ -166,8 +188,9 @@ def measure(url, seconds):
             diffs.append((a - v) * 1000.0)
     errors = len(re.findall(r"(?i)error while decoding|concealing", out))
     offset = sum(diffs) / len(diffs) if diffs else float("nan")
-    print("frames=%d fps=%.2f audio_frames=%d av_offset_ms=%.1f onsets=%d decode_errors=%d" %
-          (len(video_t), fps, len(audio_t), offset, len(diffs), errors))
+    print("frames=%d fps=%.2f audio_frames=%d av_offset_ms=%.1f onsets=%d decode_errors=%d "
+          "audio_pt=%d/%d client=%s" % (len(video_t), fps, len(audio_t), offset, len(diffs), errors,
+                                        announced, carried, "rtsp" if session is None else "sdp"))
     return 0 if video_t and audio_t and errors == 0 else 1
 
 

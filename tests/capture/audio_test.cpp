@@ -43,7 +43,9 @@ void FeedSine(int blocks) {
     }
 }
 
-TEST_F(AudioTest, EncoderTurnsBlocksIntoAdtsFramesForTheServer) {
+// The host's real encoder behind the same loop: its frames are the ADTS the parameters ask for
+// (the loop's paths are covered against the scripted library in aac_encoder_test.cpp).
+TEST_F(AudioTest, HostEncoderTurnsBlocksIntoAdtsFramesForTheServer) {
     fake.aac_library.set_library("libvo-aacenc.so.0");
     void* probe = dlopen("libvo-aacenc.so.0", RTLD_NOW);
     if (probe == nullptr) GTEST_SKIP() << "libvo-aacenc is not installed for this machine";
@@ -81,30 +83,6 @@ TEST_F(AudioTest, EncoderTurnsBlocksIntoAdtsFramesForTheServer) {
     EXPECT_LE(frames, 24);
     skyvo_rtsp_sever_close();
     RtspTransport::SetSelectWaitMs(2000);
-}
-
-TEST_F(AudioTest, EncoderLoadFailuresEndOnlyTheEncoder) {
-    void* probe = dlopen("libvo-aacenc.so.0", RTLD_NOW);
-    if (probe == nullptr) GTEST_SKIP() << "libvo-aacenc is not installed for this machine";
-    dlclose(probe);
-    struct Case {
-        std::string library, refused, printed;
-    };
-    const Case cases[] = {
-        {"", "", "open dll error......"},
-        {"libvo-aacenc.so.0", "voGetAACEncAPI", "open function error......"},
-    };
-    for (const Case& c : cases) {
-        fake.aac_library.set_library(c.library);
-        fake.aac_library.refuse_symbol(c.refused);
-        std::atomic<int> run{1};
-        ::testing::internal::CaptureStdout();
-        EXPECT_EQ(audio_aac_enc(&run), -1);
-        EXPECT_NE(::testing::internal::GetCapturedStdout().find(c.printed), std::string::npos);
-    }
-    ::testing::internal::CaptureStdout();
-    EXPECT_EQ(audio_aac_enc(nullptr), 1);
-    EXPECT_NE(::testing::internal::GetCapturedStdout().find("\n Stsrt param error !"), std::string::npos);
 }
 
 TEST_F(AudioTest, PcmThreadSetUpFailures) {

@@ -89,6 +89,9 @@ protected:
         g_follow_main_flag = 0;
         port = FreePort();
         url = "rtsp://127.0.0.1:" + std::to_string(port) + "/skyvo.0" + kQuery;
+        OpenServer();
+    }
+    void OpenServer() {
         skyvo_rtsp_sever_init();
         register_audio_open_thread_func(AudioOpen);
         register_video_open_thread_func(VideoOpen);
@@ -105,9 +108,11 @@ protected:
     }
     int Clients() { return skyvo_rtsp_service()->listener()->client_count(); }
     // DESCRIBE, SETUP of both tracks and PLAY, as ffmpeg sends them.
-    void Play(RtspClient& c, int video_port, int audio_port) {
-        ASSERT_NE(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n\r\n")
-                      .find("200 OK"), std::string::npos);
+    void Play(RtspClient& c, int video_port, int audio_port, std::string* describe = nullptr) {
+        std::string answer =
+            c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n\r\n");
+        if (describe != nullptr) *describe = answer;
+        ASSERT_NE(answer.find("200 OK"), std::string::npos);
         c.Exchange("SETUP " + url + "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;client_port=" +
                    std::to_string(video_port) + "-" + std::to_string(video_port + 1) + "\r\nCSeq: 3\r\n\r\n");
         c.Exchange("SETUP " + url + "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;client_port=" +
@@ -181,6 +186,37 @@ TEST_F(ServerTest, FullExchangeIsByteExactAndRtpFollowsTheFrames) {
     EXPECT_EQ(RecordedCalls(), (Calls{"video open", "audio open", "video close", "audio close"}));
     EXPECT_EQ(H264RtpTransportSession::instance()->dest_count(), 0u);
     EXPECT_TRUE(WaitFor([&] { return Clients() == 0; }));
+}
+
+// kv.orvex.audiopt changes what the audio packets carry and nothing that the client is told.
+TEST_F(ServerTest, AudioPayloadTypeSwitchChangesOnlyTheAudioPackets) {
+    std::string unset_describe;
+    for (int pt : {98, 97, 120}) {
+        skyvo_rtsp_sever_close();
+        fake.properties.Clear();
+        if (pt != 98) fake.properties.Set("kv.orvex.audiopt", std::to_string(pt));
+        {
+            std::lock_guard<std::mutex> hold(g_mutex);
+            g_calls.clear();
+        }
+        OpenServer();
+        UdpReceiver video, audio;
+        RtspClient c("127.0.0.1", port);
+        std::string describe;
+        Play(c, video.port(), audio.port(), &describe);
+        ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));  // rings reset, capture on
+        if (pt == 98) unset_describe = describe;
+        EXPECT_EQ(describe, unset_describe) << pt;
+        unsigned char adts[30] = {0xFF, 0xF1};
+        EXPECT_EQ(skyvo_add_mp3_data(adts, sizeof adts, 0), 1);
+        std::vector<unsigned char> p = audio.Receive();
+        ASSERT_EQ(p.size(), 30u + 9) << pt;
+        EXPECT_EQ(p[1], 0x80 | pt);
+        c.Send("TEARDOWN " + url + " RTSP/1.0\r\nCSeq: 6\r\n\r\n");
+        EXPECT_TRUE(c.ClosedWithoutAnswer());
+        ASSERT_TRUE(WaitFor([&] { return Clients() == 0; }));
+    }
+    EXPECT_NE(unset_describe.find("m=audio 0 RTP/AVP 97\r\n"), std::string::npos);
 }
 
 TEST_F(ServerTest, PlayWithTwoClientsConnectedDoesNotStartCapture) {

@@ -69,6 +69,36 @@ TEST_F(GlobalConfigTest, SettersLogFixedTexts) {
               (std::vector<std::string>{"m_flag_run_pause = pausestat", "m_flag_sub = sub"}));
 }
 
+// kv.orvex.audiopt: a number from 96 to 127 is taken; anything else is logged once and 98
+// stays. An empty value reads as unset, as property_get gives it.
+TEST_F(GlobalConfigTest, AudioPayloadTypeProperty) {
+    const std::string bad = "\" is not a payload type from 96 to 127; audio RTP keeps 98";
+    struct Case {
+        const char* value;  // null: the property is missing
+        int32_t payload_type;
+        std::vector<std::string> log;
+    } cases[] = {
+        {nullptr, 98, {}},
+        {"97", 97, {}},
+        {"98", 98, {}},
+        {"127", 127, {}},
+        {"", 98, {}},
+        {"128", 98, {"kv.orvex.audiopt=\"128" + bad}},
+        {"95", 98, {"kv.orvex.audiopt=\"95" + bad}},
+        {"abc", 98, {"kv.orvex.audiopt=\"abc" + bad}},
+        {"97x", 98, {"kv.orvex.audiopt=\"97x" + bad}},
+    };
+    for (const Case& c : cases) {
+        fake.properties.Clear();
+        if (c.value != nullptr) fake.properties.Set("kv.orvex.audiopt", c.value);
+        fake.log.Clear();
+        Global_Config* config = Global_Config::instance();
+        config->m_audio_payload_type = 0;
+        config->read_audio_payload_type();
+        EXPECT_EQ(config->m_audio_payload_type, c.payload_type) << (c.value ? c.value : "missing");
+        EXPECT_EQ(fake.log.Texts("globalconfig"), c.log) << (c.value ? c.value : "missing");
+    }
+}
 
 TEST_F(GlobalConfigTest, ConcurrentFirstUseCreatesOneObject) {
     Global_Config::CloseInstance();

@@ -1,0 +1,65 @@
+// Arbitrary bytes as the URL of a DESCRIBE and then of a SETUP on one client connection, each
+// answered as the listener runs it: DESCRIBE hands the query keys to the capture rules and the
+// name to the served presentation and its SDP; SETUP takes the name, the stream and the
+// transport through the URL extractors. The first byte picks the platform flavour and whether
+// the URL time check is on. Run with -close_fd_mask=1: the query search traces to standard
+// output.
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+
+#include "media/MediaSessionList.h"
+#include "media/MediaStreamH264.h"
+#include "media/MediaStreamMP4A.h"
+#include "platform/fake/FakePlatform.h"
+#include "rtsp/RtspSession.h"
+
+namespace {
+
+struct Server {
+    platform::fake::FakePlatform fake;
+    MediaSessionList list;
+
+    Server() {
+        Socket::SetReadinessWaitMs(10);
+        auto* session = new MediaSession("skyvo");
+        session->AddMediaStream(new MediaStreamH264("h264"));
+        session->AddMediaStream(new MediaStreamMP4A("aac", -1));
+        list.AddMediaSession(session);
+    }
+};
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+    static Server* server = new Server();  // lives as long as the process
+    if (size < 1 || size > 8192) return 0;
+    static const char* const kFlavours[] = {"sa", "px", "dqx", ""};
+    server->fake.properties.Set("kelvo.build.kelvotv", kFlavours[data[0] & 3]);
+    g_url_check_switch = (data[0] & 4) != 0;
+    std::string url(reinterpret_cast<const char*>(data + 1), size - 1);
+    std::string request = "DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 2\r\n" +
+                          "Accept: application/sdp\r\n\r\n" +
+                          "SETUP " + url + " RTSP/1.0\r\nCSeq: 3\r\n" +
+                          "Transport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n";
+    int fds[2];
+    if (socketpair(AF_UNIX, SOCK_STREAM, 0, fds) != 0) return 0;
+    if (write(fds[1], request.data(), request.size()) == static_cast<ssize_t>(request.size())) {
+        close(fds[1]);  // the client is gone once it has asked: answers fail fast
+        RtspSession session(fds[0], sockaddr_in{}, sockaddr_in{}, &server->list);  // closes fds[0]
+        int type = 0;
+        // Both requests, even after a failed DESCRIBE: SETUP then judges the URL on its own.
+        session.RtspSessionThread(type);
+        session.RtspSessionThread(type);
+    } else {
+        close(fds[0]);
+        close(fds[1]);
+    }
+    g_url_check_switch = 0;
+    server->fake.log.Clear();
+    server->fake.journal.Clear();
+    return 0;
+}
