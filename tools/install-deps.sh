@@ -2,15 +2,21 @@
 # Installs the Debian 12 packages a build needs, and only those that are missing.
 #   install-deps.sh          what building, running and testing on this machine needs
 #   install-deps.sh e2e      that, plus the clients of the end-to-end check (ffmpeg, GStreamer)
+#   install-deps.sh capture-e2e  that, plus a virtual screen and a sound server to capture
 #   install-deps.sh ci       all of it, plus the sanitizer, fuzzing and 32-bit ARM tool chains
 set -euo pipefail
 
 packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock-dev
-          libbenchmark-dev libopenh264-dev libvo-aacenc-dev)
+          libbenchmark-dev libopenh264-dev libvo-aacenc-dev
+          libgstreamer1.0-dev libgstreamer-plugins-base1.0-dev gstreamer1.0-plugins-base
+          gstreamer1.0-plugins-good gstreamer1.0-alsa)
 if [[ "${1:-}" == ci ]]; then
   packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
 fi
-if [[ "${1:-}" == ci || "${1:-}" == e2e ]]; then
+if [[ "${1:-}" == ci || "${1:-}" == capture-e2e ]]; then
+  packages+=(xvfb gstreamer1.0-x pulseaudio pulseaudio-utils)
+fi
+if [[ "${1:-}" == ci || "${1:-}" == e2e || "${1:-}" == capture-e2e ]]; then
   packages+=(ffmpeg gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
              gstreamer1.0-plugins-bad gstreamer1.0-libav python3)
 fi

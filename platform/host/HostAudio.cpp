@@ -4,10 +4,15 @@
 #include <time.h>
 
 #include <cmath>
+#include <cstring>
+#include <memory>
+#include <string>
 #include <vector>
 
 #include "platform/Ports.h"
 #include "platform/host/HostClock.h"
+#include "platform/host/capture/GstSource.h"
+#include "platform/host/capture/HostSources.h"
 
 namespace platform {
 namespace host {
@@ -17,6 +22,9 @@ constexpr unsigned kRate = 48000;
 constexpr size_t kMinFrames = 960;  // 20 ms: one encoder block of 3840 bytes
 constexpr double kToneHz = 1000.0;
 constexpr double kAmplitude = 12000.0;
+// A live source that gives nothing for this long is bridged with silence until it does.
+constexpr int kStallMs = 100;
+constexpr char kTag[] = "orvex:::host";
 
 void SleepUntilMs(uint64_t ms) {
     timespec ts{};
@@ -25,6 +33,8 @@ void SleepUntilMs(uint64_t ms) {
     clock_nanosleep(CLOCK_MONOTONIC, TIMER_ABSTIME, &ts, nullptr);
 }
 
+// The record's sound: the beeping tone, silence ("none", or a live source lost or stalled),
+// or a GStreamer source (PulseAudio, ALSA, a pipeline) chosen by the host properties at start.
 class HostAudioRecord final : public AudioRecord {
 public:
     int set(int, unsigned sample_rate, int format, unsigned, size_t frame_count) override {
@@ -33,29 +43,84 @@ public:
         return 0;
     }
     int start() override {
-        start_ms_ = HostClockMs();
-        next_ = 0;
+        SourceChoice source = ChooseAudioSource();
+        live_.reset();
+        mode_ = source.kind == SourceChoice::kTone ? Mode::kTone : Mode::kSilence;
+        if (source.live()) {
+            auto live = std::make_unique<GstSource>();
+            std::string error;
+            if (!live->start(AudioPipeline(source), &error)) {
+                std::string line = "AudioRecord: audio source " + source.text +
+                                   " cannot start: " + error;
+                Log().Write(kLogIdSystem, kLogError, kTag, line.c_str());
+                return -1;
+            }
+            live_ = std::move(live);
+            source_text_ = source.text;
+            mode_ = Mode::kLive;
+        }
+        restartClock();
+        stalled_ = false;
         started_ = true;
         return 0;
     }
-    void stop() override { started_ = false; }
+    void stop() override {
+        started_ = false;
+        live_.reset();
+    }
     long read(void* buffer, size_t size) override {
         if (!started_) return -1;
         size_t frames = size / 4;
         if (frames > frames_per_read_) frames = frames_per_read_;
         if (frames == 0) return -1;
+        auto* out = static_cast<uint8_t*>(buffer);
+        if (mode_ == Mode::kLive) {
+            std::string why;
+            if (live_->ended(&why)) {
+                std::string line = "AudioRecord: audio source " + source_text_ + " stopped: " +
+                                   why + "; silence until the next start";
+                Log().Write(kLogIdSystem, kLogError, kTag, line.c_str());
+                live_.reset();
+                mode_ = Mode::kSilence;
+                restartClock();
+            } else {
+                size_t got = live_->readBytes(out, frames * 4, stalled_ ? 0 : kStallMs);
+                if (got > 0) {
+                    stalled_ = false;
+                    return static_cast<long>(got);
+                }
+                // Keep the sound going (the picture waits for it) until the source is back.
+                if (!stalled_) restartClock();
+                stalled_ = true;
+            }
+        }
         // Real time: a block is there once its last sample has been "recorded".
         SleepUntilMs(start_ms_ + (next_ + frames) * 1000 / kRate);
-        FillTone(static_cast<int16_t*>(buffer), frames, next_, start_ms_);
+        if (mode_ == Mode::kTone) {
+            FillTone(static_cast<int16_t*>(buffer), frames, next_, start_ms_);
+        } else {
+            memset(out, 0, frames * 4);
+        }
         next_ += frames;
         return static_cast<long>(frames * 4);
     }
 
 private:
+    enum class Mode { kTone, kSilence, kLive };
+
+    void restartClock() {
+        start_ms_ = HostClockMs();
+        next_ = 0;
+    }
+
     size_t frames_per_read_ = kMinFrames;
     uint64_t start_ms_ = 0;
     uint64_t next_ = 0;
     bool started_ = false;
+    bool stalled_ = false;
+    Mode mode_ = Mode::kTone;
+    std::unique_ptr<GstSource> live_;
+    std::string source_text_;
 };
 
 }  // namespace

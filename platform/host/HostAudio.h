@@ -9,9 +9,11 @@
 namespace platform {
 namespace host {
 
-// Sound on Linux: a record that delivers 48000 Hz stereo 16-bit PCM in real time from a test
-// tone (1 kHz, beeping during the first 100 ms of every second of the host clock, as the test
-// picture flashes), in blocks of at most the minimum buffer size (20 ms).
+// Sound on Linux: a record that delivers 48000 Hz stereo 16-bit PCM in real time, in blocks of
+// at most the minimum buffer size (20 ms), from the source the property orvex.host.audio names
+// at start: a test tone (1 kHz, beeping during the first 100 ms of every second of the host
+// clock, as the test picture flashes), silence, or a GStreamer source (PulseAudio, ALSA, any
+// pipeline). A source that cannot start fails start; one lost while recording gives silence.
 // Thread contract: one reader thread per record.
 class HostAudioRecordPort final : public AudioRecordPort {
 public:

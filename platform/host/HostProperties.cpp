@@ -71,6 +71,15 @@ void HostProperties::ReloadIfChanged() {
     size_ = st.st_size;
 }
 
+bool HostProperties::Lookup(const std::string& key, std::string* value) {
+    std::lock_guard<std::mutex> hold(mutex_);
+    ReloadIfChanged();
+    auto it = values_.find(key);
+    if (it == values_.end() || it->second.empty()) return false;
+    *value = it->second;
+    return true;
+}
+
 int HostProperties::Get(const char* key, char* value, const char* default_value) {
     std::lock_guard<std::mutex> hold(mutex_);
     ReloadIfChanged();

@@ -21,6 +21,8 @@ public:
     explicit HostProperties(std::string path);
 
     int Get(const char* key, char* value, const char* default_value) override;
+    // The whole value of `key` (Get stops at kPropertyValueMax); false when unset or empty.
+    bool Lookup(const std::string& key, std::string* value);
     const std::string& path() const { return path_; }
 
     // Parses file text into its key/value pairs (later lines win).

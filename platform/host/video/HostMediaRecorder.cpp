@@ -12,6 +12,7 @@
 #include <system_error>
 
 #include "platform/Ports.h"
+#include "platform/host/capture/GstSource.h"
 #include "platform/host/video/HostCamera.h"
 
 namespace platform {
@@ -24,7 +25,7 @@ constexpr float kEncoderMaxFps = 60.0f;
 
 void Note(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
 void Note(const char* fmt, ...) {
-    char text[160];
+    char text[512];
     va_list args;
     va_start(args, fmt);
     vsnprintf(text, sizeof text, fmt, args);
@@ -55,9 +56,23 @@ size_t StartCodeLength(const uint8_t* p, int len) {
     return 0;
 }
 
+// Whether flattened camera parameters select the sub window (traveling-mode 4).
+bool SubWindow(const std::string& flattened) {
+    size_t at = 0;
+    while (at < flattened.size()) {
+        size_t end = flattened.find(';', at);
+        if (end == std::string::npos) end = flattened.size();
+        if (flattened.compare(at, end - at, "traveling-mode=4") == 0) return true;
+        at = end + 1;
+    }
+    return false;
+}
+
 }  // namespace
 
+HostMediaRecorder::HostMediaRecorder() = default;
 HostMediaRecorder::~HostMediaRecorder() { stop(); }
+
 
 int HostMediaRecorder::settable() const {
     return state_ == State::kIdle ? 0 : kInvalidOperation;
@@ -68,6 +83,7 @@ int HostMediaRecorder::setCamera(Camera& camera) {
     // The platform's recorder cannot record from a camera its owner still holds.
     auto* host_camera = dynamic_cast<HostCamera*>(&camera);
     if (host_camera != nullptr && host_camera->locked()) return kInvalidOperation;
+    sub_ = SubWindow(camera.getParameters());
     return 0;
 }
 
@@ -131,7 +147,10 @@ int HostMediaRecorder::setParameters(const std::string& params) {
 int HostMediaRecorder::prepare() {
     if (state_ != State::kIdle || !format_set_ || !encoder_set_) return kInvalidOperation;
     pattern_ = std::make_unique<TestPattern>(width_, height_);
-    picture_.assign(pattern_->frameSize(), 0);
+    // Black, until a live source's first frame.
+    size_t luma = static_cast<size_t>(pattern_->width()) * pattern_->height();
+    picture_.assign(pattern_->frameSize(), TestPattern::kNeutralUV);
+    memset(picture_.data(), TestPattern::kBlackY, luma);
     // Room for a key frame far worse than the pattern ever gives; encodeNext grows it if not.
     frame_.assign(pattern_->frameSize() + 4096, 0);
     // Writing the largest frame once reserves the parcel's storage for the whole recording.
@@ -140,11 +159,52 @@ int HostMediaRecorder::prepare() {
     parcel_.writeInplace(frame_.data(), frame_.size());
     parcel_.writeInt32(0);
     parcel_.clear();
-    if (int rc = openEncoder()) return rc;
+    if (int rc = openSource()) return rc;
+    if (int rc = openEncoder()) {
+        live_.reset();
+        return rc;
+    }
     key_seen_ = false;
     state_ = State::kPrepared;
     Note("MediaRecorder::prepare %dx%d @ %d fps, %d bit/s", width_, height_, fps_, bitrate_);
     return 0;
+}
+
+int HostMediaRecorder::openSource() {
+    source_ = ChooseVideoSource(sub_);
+    label_ = sub_ && source_.kind == SourceChoice::kPattern ? TestPattern::Label::kSub
+                                                              : TestPattern::Label::kNone;
+    live_.reset();
+    if (!source_.live()) return 0;
+    // The pattern's size: the same even size the encoder is given.
+    std::string description =
+        VideoPipeline(source_, pattern_->width(), pattern_->height(), fps_);
+    auto live = std::make_unique<GstSource>();
+    std::string error;
+    if (!live->start(description, &error)) {
+        Note("MediaRecorder: video source %s cannot start: %s", source_.text.c_str(),
+             error.c_str());
+        return kUnknownError;
+    }
+    live_ = std::move(live);
+    Note("MediaRecorder: video from %s", source_.text.c_str());
+    return 0;
+}
+
+void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
+    if (live_ != nullptr && live_->running()) {
+        std::string why;
+        if (!live_->ended(&why)) {
+            // No new frame since the last one: the last picture is sent again.
+            live_->latestFrame(picture_.data(), pattern_->width(), pattern_->height());
+            return;
+        }
+        Note("MediaRecorder: video source %s stopped: %s; showing \"no signal\" until the next "
+             "start", source_.text.c_str(), why.c_str());
+        live_->stop();
+        label_ = TestPattern::Label::kNoSignal;
+    }
+    pattern_->draw(frame, ms, picture_.data(), label_);
 }
 
 int HostMediaRecorder::openEncoder() {
@@ -235,10 +295,12 @@ int HostMediaRecorder::stop() {
         wake_.notify_all();
         thread_.join();
         Note("MediaRecorder::stop: %" PRIu64 " frames delivered, %" PRIu64
-             " transactions failed, %" PRIu64 " frames dropped",
-             framesDelivered(), failedTransacts(), framesDropped());
+             " transactions failed, %" PRIu64 " frames dropped, %" PRIu64
+             " skipped by the encoder",
+             framesDelivered(), failedTransacts(), framesDropped(), framesSkipped());
     }
     closeEncoder();
+    live_.reset();
     if (state_ != State::kReleased) state_ = State::kIdle;
     return 0;
 }
@@ -255,7 +317,7 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeFrame(uint32_t frame, uint64
 }
 
 HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_t ms) {
-    pattern_->draw(frame, ms, picture_.data());
+    takePicture(frame, ms);
     // Force a key frame when waiting for the next frame would stretch the gap past the
     // interval (1 ms of slack absorbs the truncation of frame times to milliseconds).
     uint64_t since = ms - last_key_ms_;
@@ -283,6 +345,8 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_
         return Encoded{};
     }
     if (info.eFrameType == videoFrameTypeSkip || info.eFrameType == videoFrameTypeInvalid) {
+        // The rate control leaves frames out when the picture costs more than the bitrate.
+        skipped_.fetch_add(1, std::memory_order_relaxed);
         return Encoded{};
     }
 
@@ -357,8 +421,11 @@ void HostMediaRecorder::run() {
             dropped_.fetch_add(behind, std::memory_order_relaxed);
             due_ns = start_ns + n * 1000000000u / fps_;
         }
-        Encoded frame = encodeNext(static_cast<uint32_t>(n), due_ns / 1000000u);
-        if (frame.size > 0) deliver(frame);
+        // "none": the frames come from another binder client, such as orvex-feed.
+        if (source_.kind != SourceChoice::kNone) {
+            Encoded frame = encodeNext(static_cast<uint32_t>(n), due_ns / 1000000u);
+            if (frame.size > 0) deliver(frame);
+        }
         ++n;
         lock.lock();
     }

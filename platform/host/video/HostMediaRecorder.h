@@ -12,6 +12,7 @@
 
 #include "platform/BinderPort.h"
 #include "platform/CapturePorts.h"
+#include "platform/host/capture/HostSources.h"
 #include "platform/host/video/TestPattern.h"
 
 class ISVCEncoder;
@@ -19,9 +20,14 @@ class ISVCEncoder;
 namespace platform {
 namespace host {
 
-// The host's media recorder: between start and stop a thread draws the test pattern at the
-// requested frame rate, encodes it as H.264 (Constrained Baseline, OpenH264) and sends every
-// encoded frame to the binder service "orvex.rtp" the way the platform's recorder does.
+class GstSource;
+
+// The host's media recorder: between start and stop a thread takes a picture at the requested
+// frame rate, encodes it as H.264 (Constrained Baseline, OpenH264) and sends every encoded
+// frame to the binder service "orvex.rtp" the way the platform's recorder does. The picture is
+// the test pattern or, as the host properties choose at prepare, the newest frame of a
+// GStreamer source (screen, camera, pipeline); a source lost mid-stream gives way to the
+// pattern marked "no signal". A camera set to the sub window picks the sub window's source.
 // Thread contract: MediaRecorder calls and encodeFrame from one thread; between start and stop
 // the recorder's own thread owns the encoder and buffers; the counters read from any thread.
 class HostMediaRecorder final : public MediaRecorder {
@@ -36,11 +42,12 @@ public:
     static constexpr int kInvalidOperation = -38;
     static constexpr int kUnknownError = -2147483647 - 1;
 
-    HostMediaRecorder() = default;
+    HostMediaRecorder();
     ~HostMediaRecorder() override;
     HostMediaRecorder(const HostMediaRecorder&) = delete;
     HostMediaRecorder& operator=(const HostMediaRecorder&) = delete;
 
+    // Also notes whether the camera is set to the sub window (traveling-mode 4).
     int setCamera(Camera& camera) override;
     int setVideoSource(int source) override;
     int setOutputFormat(int format) override;
@@ -61,7 +68,7 @@ public:
         size_t size = 0;
         bool key = false;
     };
-    // The thread's work for one frame, minus the binder: draws frame `frame` as captured at
+    // The thread's work for one frame, minus the binder: takes frame `frame` as captured at
     // host clock time `ms` and encodes it. Only after prepare and before start (else empty);
     // size 0 when the encoder skipped the frame.
     Encoded encodeFrame(uint32_t frame, uint64_t ms);
@@ -69,13 +76,19 @@ public:
     int videoBitrate() const { return bitrate_; }
     uint64_t framesDelivered() const { return delivered_.load(std::memory_order_relaxed); }
     uint64_t failedTransacts() const { return failed_.load(std::memory_order_relaxed); }
+    // The source prepare chose.
+    const SourceChoice& source() const { return source_; }
     // Frames the thread had no time for (it was more than a frame period late) and left out.
     uint64_t framesDropped() const { return dropped_.load(std::memory_order_relaxed); }
+    // Frames the encoder's rate control left out.
+    uint64_t framesSkipped() const { return skipped_.load(std::memory_order_relaxed); }
 
 private:
     enum class State { kIdle, kPrepared, kRecording, kReleased };
 
     int settable() const;
+    int openSource();
+    void takePicture(uint32_t frame, uint64_t ms);
     int openEncoder();
     void closeEncoder();
     void run();
@@ -90,6 +103,10 @@ private:
     int fps_ = 30;
     int bitrate_ = 4000000;
 
+    bool sub_ = false;
+    SourceChoice source_;
+    std::unique_ptr<GstSource> live_;
+    TestPattern::Label label_ = TestPattern::Label::kNone;
     std::unique_ptr<TestPattern> pattern_;
     ISVCEncoder* encoder_ = nullptr;
     std::vector<uint8_t> picture_;
@@ -107,6 +124,7 @@ private:
     std::atomic<uint64_t> delivered_{0};
     std::atomic<uint64_t> failed_{0};
     std::atomic<uint64_t> dropped_{0};
+    std::atomic<uint64_t> skipped_{0};
 };
 
 // Every create gives a fresh HostMediaRecorder. Thread contract: any thread.

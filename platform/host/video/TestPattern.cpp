@@ -22,6 +22,9 @@ constexpr int kBarCount = sizeof kBars / sizeof kBars[0];
 
 // Seven-segment digits; bit 0 is the top segment "a", then clockwise b..f, bit 6 the middle "g".
 constexpr uint8_t kSegments[10] = {0x3F, 0x06, 0x5B, 0x4F, 0x66, 0x6D, 0x7D, 0x07, 0x7F, 0x6F};
+// The labels in the same segments: "SUb" and "no SIGnAL" (0 is a blank).
+constexpr uint8_t kSubGlyphs[] = {0x6D, 0x3E, 0x7C};
+constexpr uint8_t kNoSignalGlyphs[] = {0x54, 0x5C, 0x00, 0x6D, 0x06, 0x3D, 0x54, 0x77, 0x38};
 
 }  // namespace
 
@@ -45,9 +48,10 @@ size_t TestPattern::frameSize() const {
     return static_cast<size_t>(width_) * height_ * 3 / 2;
 }
 
-void TestPattern::draw(uint32_t frame, uint64_t ms, uint8_t* i420) const {
+void TestPattern::draw(uint32_t frame, uint64_t ms, uint8_t* i420, Label label) const {
     drawBars(frame, i420);
     drawCounter(frame, i420);
+    drawLabel(label, i420);
     // Last, so that nothing on narrow pictures can cover the square the sync measurement reads.
     int outer = flash_size_ + 2 * flash_border_;
     fillRect(i420, 0, 0, outer, outer, kBlackY, kNeutralUV, kNeutralUV);
@@ -106,12 +110,19 @@ void TestPattern::drawCounter(uint32_t frame, uint8_t* i420) const {
     int plate_w = kDigits * digit_w_ + (kDigits + 1) * pad;
     fillRect(i420, counter_x_, counter_y_, plate_w, digit_h_ + 2 * pad, kBlackY, kNeutralUV,
              kNeutralUV);
-    int t = stroke_, w = digit_w_, h = digit_h_;
-    int mid = Even((h - t) / 2);
+    uint8_t glyphs[kDigits];
     uint32_t rest = frame;
-    for (int i = kDigits - 1; i >= 0; --i, rest /= 10) {
-        uint8_t on = kSegments[rest % 10];
-        int x = counter_x_ + pad + i * (w + pad), y = counter_y_ + pad;
+    for (int i = kDigits - 1; i >= 0; --i, rest /= 10) glyphs[i] = kSegments[rest % 10];
+    drawSegments(glyphs, kDigits, counter_x_ + pad, counter_y_ + pad, i420);
+}
+
+void TestPattern::drawSegments(const uint8_t* glyphs, int count, int x0, int y,
+                               uint8_t* i420) const {
+    int t = stroke_, w = digit_w_, h = digit_h_, pad = 2 * stroke_;
+    int mid = Even((h - t) / 2);
+    for (int i = 0; i < count; ++i) {
+        uint8_t on = glyphs[i];
+        int x = x0 + i * (w + pad);
         const int rects[7][4] = {{x, y, w, t},           {x + w - t, y, t, mid + t},
                                  {x + w - t, y + mid, t, h - mid}, {x, y + h - t, w, t},
                                  {x, y + mid, t, h - mid},          {x, y, t, mid + t},
@@ -123,6 +134,25 @@ void TestPattern::drawCounter(uint32_t frame, uint8_t* i420) const {
             }
         }
     }
+}
+
+void TestPattern::drawLabel(Label label, uint8_t* i420) const {
+    const uint8_t* glyphs = nullptr;
+    int count = 0;
+    if (label == Label::kSub) {
+        glyphs = kSubGlyphs;
+        count = sizeof kSubGlyphs;
+    } else if (label == Label::kNoSignal) {
+        glyphs = kNoSignalGlyphs;
+        count = sizeof kNoSignalGlyphs;
+    } else {
+        return;
+    }
+    int pad = 2 * stroke_;
+    int plate_w = count * digit_w_ + (count + 1) * pad, plate_h = digit_h_ + 2 * pad;
+    int x = Even((width_ - plate_w) / 2), y = Even((height_ - plate_h) / 2);
+    fillRect(i420, x, y, plate_w, plate_h, kBlackY, kNeutralUV, kNeutralUV);
+    drawSegments(glyphs, count, x + pad, y + pad, i420);
 }
 
 }  // namespace host

@@ -13,6 +13,10 @@ namespace host {
 // Thread contract: immutable after construction; draw may run on any thread concurrently.
 class TestPattern {
 public:
+    // A word in the middle of the picture: the sub window's pattern says "SUb", and a source
+    // that was lost mid-stream shows "no SIGnAL".
+    enum class Label { kNone, kSub, kNoSignal };
+
     // Odd sizes are rounded down to even (I420 needs them even); at least 2x2.
     TestPattern(int width, int height);
 
@@ -23,7 +27,7 @@ public:
 
     // Draws frame `frame` as captured at host clock time `ms` into `i420` (frameSize() bytes).
     // The picture depends on nothing else.
-    void draw(uint32_t frame, uint64_t ms, uint8_t* i420) const;
+    void draw(uint32_t frame, uint64_t ms, uint8_t* i420, Label label = Label::kNone) const;
 
     // Where the flash square lies, in luma pixels.
     int flashX() const { return flash_x_; }
@@ -40,6 +44,8 @@ private:
                   uint8_t v) const;
     void drawBars(uint32_t frame, uint8_t* i420) const;
     void drawCounter(uint32_t frame, uint8_t* i420) const;
+    void drawSegments(const uint8_t* glyphs, int count, int x, int y, uint8_t* i420) const;
+    void drawLabel(Label label, uint8_t* i420) const;
 
     int width_;
     int height_;

@@ -1,0 +1,160 @@
+#include "platform/host/capture/HostSources.h"
+
+#include <string>
+
+#include "platform/Ports.h"
+#include "platform/host/HostProperties.h"
+
+namespace platform {
+namespace host {
+namespace {
+
+// Splits "kind" or "kind:arg"; true when the kind is `name` (then *arg is what follows).
+bool Is(const std::string& value, const char* name, std::string* arg) {
+    size_t colon = value.find(':');
+    if (value.compare(0, colon, name) != 0) return false;
+    *arg = colon == std::string::npos ? std::string() : value.substr(colon + 1);
+    return true;
+}
+
+// The property's whole value: a host property file holds pipelines longer than Get can copy.
+std::string WholeProperty(const char* key, const char* default_value) {
+    std::string value;
+    auto* host = dynamic_cast<HostProperties*>(&Properties());
+    if (host != nullptr) return host->Lookup(key, &value) ? value : default_value;
+    char text[kPropertyValueMax];
+    Properties().Get(key, text, default_value);
+    return text;
+}
+
+std::string Quoted(const std::string& s) {
+    std::string out = "\"";
+    for (char c : s) {
+        if (c == '"' || c == '\\') out += '\\';
+        out += c;
+    }
+    return out + "\"";
+}
+
+SourceChoice Choose(const char* key, const char* default_value,
+                    bool (*parse)(const std::string&, SourceChoice*)) {
+    std::string value = WholeProperty(key, default_value);
+    SourceChoice choice;
+    if (parse(value, &choice)) return choice;
+    std::string line = std::string(key) + ": unknown value \"" + value + "\", using " +
+                       default_value;
+    Log().Write(kLogIdSystem, kLogError, "orvex:::host", line.c_str());
+    parse(default_value, &choice);
+    return choice;
+}
+
+}  // namespace
+
+bool ParseVideoSource(const std::string& value, SourceChoice* out) {
+    SourceChoice c;
+    c.text = value;
+    std::string arg;
+    if (value == "pattern") {
+        c.kind = SourceChoice::kPattern;
+    } else if (value == "none") {
+        c.kind = SourceChoice::kNone;
+    } else if (Is(value, "x11", &arg)) {
+        c.kind = SourceChoice::kX11;
+        c.arg = arg;
+    } else if (Is(value, "v4l2", &arg)) {
+        c.kind = SourceChoice::kV4l2;
+        c.arg = arg.empty() ? "/dev/video0" : arg;
+    } else if (Is(value, "gst", &arg) && !arg.empty()) {
+        c.kind = SourceChoice::kGst;
+        c.arg = arg;
+    } else {
+        return false;
+    }
+    *out = c;
+    return true;
+}
+
+bool ParseAudioSource(const std::string& value, SourceChoice* out) {
+    SourceChoice c;
+    c.text = value;
+    std::string arg;
+    if (value == "tone") {
+        c.kind = SourceChoice::kTone;
+    } else if (value == "none") {
+        c.kind = SourceChoice::kNone;
+    } else if (Is(value, "pulse", &arg)) {
+        c.kind = SourceChoice::kPulse;
+        c.arg = arg;
+    } else if (Is(value, "alsa", &arg)) {
+        c.kind = SourceChoice::kAlsa;
+        c.arg = arg;
+    } else if (Is(value, "gst", &arg) && !arg.empty()) {
+        c.kind = SourceChoice::kGst;
+        c.arg = arg;
+    } else {
+        return false;
+    }
+    *out = c;
+    return true;
+}
+
+SourceChoice ChooseVideoSource(bool sub) {
+    return Choose(sub ? kSubVideoProperty : kVideoProperty, "pattern", &ParseVideoSource);
+}
+
+SourceChoice ChooseAudioSource() { return Choose(kAudioProperty, "tone", &ParseAudioSource); }
+
+std::string VideoPipeline(const SourceChoice& source, int width, int height, int fps) {
+    std::string head;
+    switch (source.kind) {
+        case SourceChoice::kX11:
+            // Without a name ximagesrc opens $DISPLAY. Damage events would leave out frames
+            // of a still screen; every frame is wanted.
+            head = "ximagesrc use-damage=false";
+            if (!source.arg.empty()) head += " display-name=" + Quoted(source.arg);
+            break;
+        case SourceChoice::kV4l2:
+            head = "v4l2src device=" + Quoted(source.arg);
+            break;
+        case SourceChoice::kGst:
+            head = source.arg;
+            break;
+        default:
+            return std::string();
+    }
+    // BT.601, as the pattern: the stream carries no colour description, and players take
+    // an undescribed picture for BT.601.
+    return head +
+           " ! videoconvert ! videoscale add-borders=true ! videorate ! "
+           "video/x-raw,format=I420,colorimetry=bt601,width=" +
+           std::to_string(width) + ",height=" + std::to_string(height) +
+           ",framerate=" + std::to_string(fps) +
+           "/1,pixel-aspect-ratio=1/1 ! appsink name=orvexsink max-buffers=2 drop=true";
+}
+
+std::string AudioPipeline(const SourceChoice& source) {
+    std::string head;
+    switch (source.kind) {
+        case SourceChoice::kPulse:
+            // The monitor of the default sink is what the machine plays.
+            head = "pulsesrc device=" +
+                   Quoted(source.arg.empty() ? "@DEFAULT_MONITOR@" : source.arg);
+            break;
+        case SourceChoice::kAlsa:
+            head = "alsasrc";
+            if (!source.arg.empty()) head += " device=" + Quoted(source.arg);
+            break;
+        case SourceChoice::kGst:
+            head = source.arg;
+            break;
+        default:
+            return std::string();
+    }
+    return head +
+           " ! audioconvert ! audioresample ! "
+           "audio/x-raw,format=S16LE,rate=48000,channels=2,layout=interleaved ! "
+           "appsink name=orvexsink max-buffers=50 drop=true";
+}
+
+}  // namespace host
+}  // namespace platform

@@ -1,0 +1,376 @@
+#include <gtest/gtest.h>
+#include <stdlib.h>
+
+#include <chrono>
+#include <cstdint>
+#include <cstdlib>
+#include <memory>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/Ports.h"
+#include "platform/fake/FakeLog.h"
+#include "platform/fake/FakeProperties.h"
+#include "platform/host/HostAudio.h"
+#include "platform/host/capture/GstSource.h"
+#include "platform/host/capture/HostSources.h"
+#include "platform/host/video/HostCamera.h"
+#include "platform/host/video/HostMediaRecorder.h"
+#include "platform/host/video/TestPattern.h"
+
+// Leaks that belong to the libraries, not to this code: GLib's allocations while it is loaded,
+// and ximagesrc's copy of its display name. Their stacks pass through libraries built without
+// frame pointers, so only the slow unwinder sees far enough to match them.
+extern "C" const char* __lsan_default_suppressions() {
+    return "leak:_dl_init\nleak:libgstximagesrc.so\n";
+}
+extern "C" const char* __asan_default_options() { return "fast_unwind_on_malloc=0"; }
+
+namespace {
+
+using platform::host::GstSource;
+using platform::host::HostCamera;
+using platform::host::HostMediaRecorder;
+using platform::host::SourceChoice;
+using platform::host::TestPattern;
+using Clock = std::chrono::steady_clock;
+
+constexpr char kTag[] = "orvex:::host";
+
+class CountingBinder final : public platform::BinderPort {
+public:
+    int initWithDriver(const char*) override { return 0; }
+    const void* defaultServiceManager() override { return this; }
+    int addService(const char*, std::shared_ptr<platform::BinderService>) override { return 0; }
+    void startThreadPool() override {}
+    int transact(const char*, uint32_t, const platform::ParcelWriter&) override {
+        ++frames;
+        return 0;
+    }
+    std::atomic<int> frames{0};
+};
+
+// Polls `done` every 10 ms for at most `seconds`; true once it holds.
+template <typename F>
+bool WaitFor(F done, int seconds = 10) {
+    auto end = Clock::now() + std::chrono::seconds(seconds);
+    while (!done()) {
+        if (Clock::now() > end) return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    return true;
+}
+
+class HostCaptureTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        previous_ = platform::Installed();
+        platform::Ports ports = previous_;
+        ports.log = &log_;
+        ports.properties = &properties_;
+        ports.binder = &binder_;
+        platform::Install(ports);
+    }
+    void TearDown() override { platform::Install(previous_); }
+
+    // Host log lines that contain `part`.
+    std::vector<std::string> Lines(const std::string& part) {
+        std::vector<std::string> out;
+        for (const std::string& t : log_.Texts(kTag)) {
+            if (t.find(part) != std::string::npos) out.push_back(t);
+        }
+        return out;
+    }
+
+    // A recorder set up the way capture start does it, up to (not including) prepare.
+    std::unique_ptr<HostMediaRecorder> Recorder(int w, int h, bool sub = false) {
+        HostCamera camera;
+        if (sub) camera.setParameters("traveling-res=12;traveling-mode=4");
+        camera.unlock();
+        auto r = std::make_unique<HostMediaRecorder>();
+        EXPECT_EQ(r->setCamera(camera), 0);
+        EXPECT_EQ(r->setVideoSource(1), 0);
+        EXPECT_EQ(r->setOutputFormat(101), 0);
+        EXPECT_EQ(r->setVideoEncoder(2), 0);
+        EXPECT_EQ(r->setVideoSize(w, h), 0);
+        EXPECT_EQ(r->setVideoFrameRate(30), 0);
+        return r;
+    }
+
+    platform::fake::FakeLog log_;
+    platform::fake::FakeProperties properties_;
+    CountingBinder binder_;
+    platform::Ports previous_;
+};
+
+TEST(HostSourceValues, ParseEveryFormAndRefuseTheRest) {
+    struct Case {
+        const char* value;
+        bool video;
+        bool ok;
+        SourceChoice::Kind kind;
+        const char* arg;
+    };
+    const Case cases[] = {
+        {"pattern", true, true, SourceChoice::kPattern, ""},
+        {"none", true, true, SourceChoice::kNone, ""},
+        {"x11", true, true, SourceChoice::kX11, ""},
+        {"x11::1", true, true, SourceChoice::kX11, ":1"},
+        {"v4l2", true, true, SourceChoice::kV4l2, "/dev/video0"},
+        {"v4l2:/dev/video2", true, true, SourceChoice::kV4l2, "/dev/video2"},
+        {"gst:videotestsrc ! x:y", true, true, SourceChoice::kGst, "videotestsrc ! x:y"},
+        {"gst:", true, false, SourceChoice::kPattern, ""},
+        {"tone", true, false, SourceChoice::kPattern, ""},
+        {"x11x", true, false, SourceChoice::kPattern, ""},
+        {"Pattern", true, false, SourceChoice::kPattern, ""},
+        {"", true, false, SourceChoice::kPattern, ""},
+        {"tone", false, true, SourceChoice::kTone, ""},
+        {"none", false, true, SourceChoice::kNone, ""},
+        {"pulse", false, true, SourceChoice::kPulse, ""},
+        {"pulse:alsa_input.usb-mic", false, true, SourceChoice::kPulse, "alsa_input.usb-mic"},
+        {"alsa", false, true, SourceChoice::kAlsa, ""},
+        {"alsa:hw:1,0", false, true, SourceChoice::kAlsa, "hw:1,0"},
+        {"gst:audiotestsrc", false, true, SourceChoice::kGst, "audiotestsrc"},
+        {"pattern", false, false, SourceChoice::kTone, ""},
+        {"pulseaudio", false, false, SourceChoice::kTone, ""},
+    };
+    for (const Case& c : cases) {
+        SourceChoice out;
+        out.kind = c.video ? SourceChoice::kPattern : SourceChoice::kTone;
+        bool ok = c.video ? platform::host::ParseVideoSource(c.value, &out)
+                          : platform::host::ParseAudioSource(c.value, &out);
+        EXPECT_EQ(ok, c.ok) << c.value;
+        EXPECT_EQ(out.kind, c.kind) << c.value;
+        EXPECT_EQ(out.arg, c.arg) << c.value;
+    }
+}
+
+TEST_F(HostCaptureTest, UnknownValuesAreReportedAndTheDefaultIsUsed) {
+    properties_.Set("orvex.host.video", "webcam");
+    properties_.Set("orvex.host.video.sub", "x11");
+    properties_.Set("orvex.host.audio", "mic");
+    EXPECT_EQ(platform::host::ChooseVideoSource(false).kind, SourceChoice::kPattern);
+    EXPECT_EQ(platform::host::ChooseVideoSource(true).kind, SourceChoice::kX11);
+    EXPECT_EQ(platform::host::ChooseAudioSource().kind, SourceChoice::kTone);
+    EXPECT_EQ(log_.Texts(kTag),
+              (std::vector<std::string>{
+                  "orvex.host.video: unknown value \"webcam\", using pattern",
+                  "orvex.host.audio: unknown value \"mic\", using tone"}));
+}
+
+// Luma of the picture at (x, y).
+int LumaAt(const std::vector<uint8_t>& i420, int width, int x, int y) {
+    return i420[static_cast<size_t>(y) * width + x];
+}
+
+TEST_F(HostCaptureTest, FramesHaveTheAskedSizeRateAndBordersKeepingTheAspect) {
+    struct Case {
+        const char* source;  // a white picture
+        int width, height, fps;
+        bool bars_left_right;
+        bool bars_top_bottom;
+    };
+    const Case cases[] = {
+        // 4:3 into 16:9: bars left and right.
+        {"videotestsrc pattern=white ! video/x-raw,width=320,height=240,framerate=25/1", 640,
+         360, 30, true, false},
+        // 16:9 into 4:3: bars above and below.
+        {"videotestsrc pattern=white ! video/x-raw,width=640,height=360,framerate=60/1", 320,
+         240, 15, false, true},
+        // Same aspect, larger: no bars.
+        {"videotestsrc pattern=white ! video/x-raw,width=160,height=90,framerate=30/1", 1280,
+         720, 30, false, false},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.source);
+        SourceChoice source;
+        ASSERT_TRUE(platform::host::ParseVideoSource(std::string("gst:") + c.source, &source));
+        GstSource live;
+        std::string error;
+        ASSERT_TRUE(live.start(platform::host::VideoPipeline(source, c.width, c.height, c.fps),
+                               &error))
+            << error;
+        std::vector<uint8_t> picture(static_cast<size_t>(c.width) * c.height * 3 / 2, 0);
+        // Frames are stamped on the asked rate's grid.
+        const uint64_t period = 1000000000u / c.fps;
+        for (int n = 0; n < 3; ++n) {
+            ASSERT_TRUE(WaitFor([&] { return live.latestFrame(picture.data(), c.width,
+                                                               c.height); }));
+            uint64_t pts = live.lastFrameTimeNs();
+            uint64_t off = pts % period;
+            EXPECT_TRUE(off < 1000 || period - off < 1000) << pts << " ns";
+        }
+        int w = c.width, h = c.height;
+        EXPECT_GT(LumaAt(picture, w, w / 2, h / 2), 200);
+        EXPECT_EQ(LumaAt(picture, w, 2, h / 2) < 32, c.bars_left_right);
+        EXPECT_EQ(LumaAt(picture, w, w - 3, h / 2) < 32, c.bars_left_right);
+        EXPECT_EQ(LumaAt(picture, w, w / 2, 2) < 32, c.bars_top_bottom);
+        EXPECT_EQ(LumaAt(picture, w, w / 2, h - 3) < 32, c.bars_top_bottom);
+        // Chroma of a white and black picture is neutral.
+        EXPECT_NEAR(picture[static_cast<size_t>(w) * h + 1], 128, 4);
+    }
+}
+
+TEST_F(HostCaptureTest, RecordGivesStereo48kS16InBlocksOfAtMostTheMinimum) {
+    // A mono 44.1 kHz 1 kHz sine must come out as 48 kHz stereo: 2000 zero crossings a second.
+    properties_.Set("orvex.host.audio",
+                    "gst:audiotestsrc freq=1000 volume=0.5 ! audio/x-raw,rate=44100,channels=1");
+    platform::host::HostAudioRecordPort port;
+    size_t min_frames = 0;
+    ASSERT_EQ(port.getMinFrameCount(&min_frames, 48000, 1, 12), 0);
+    auto record = port.create("orvex");
+    ASSERT_EQ(record->set(1, 48000, 1, 12, min_frames), 0);
+    ASSERT_EQ(record->start(), 0);
+    std::vector<int16_t> pcm;
+    std::vector<int16_t> block(min_frames * 2 * 4);
+    while (pcm.size() < 2 * 48000 + 2 * 4800) {
+        long got = record->read(block.data(), block.size() * 2);
+        ASSERT_GT(got, 0);
+        ASSERT_LE(static_cast<size_t>(got), min_frames * 4);
+        ASSERT_EQ(got % 4, 0);
+        pcm.insert(pcm.end(), block.begin(), block.begin() + got / 2);
+    }
+    record->stop();
+    // Skip the first 100 ms (the resampler's start), then count one second.
+    int crossings = 0;
+    for (size_t i = 4800; i < 4800 + 48000; ++i) {
+        ASSERT_EQ(pcm[2 * i], pcm[2 * i + 1]) << "frame " << i;
+        if ((pcm[2 * i] < 0) != (pcm[2 * i + 2] < 0)) ++crossings;
+    }
+    EXPECT_NEAR(crossings, 2000, 10);
+    EXPECT_TRUE(Lines("audio source").empty());
+}
+
+TEST_F(HostCaptureTest, SourcesThatCannotStartFailPrepareWithOneLine) {
+    struct Case {
+        const char* value;
+        const char* line;  // the whole log line up to GStreamer's own text
+    };
+    const Case cases[] = {
+        {"gst:nosuchelement ! videoconvert",
+         "MediaRecorder: video source gst:nosuchelement ! videoconvert cannot start: "
+         "no element \"nosuchelement\""},
+        {"gst:videotestsrc ! ! fakesink", "MediaRecorder: video source gst:videotestsrc ! ! "
+                                          "fakesink cannot start: "},
+        {"x11::4711", "MediaRecorder: video source x11::4711 cannot start: "},
+        {"v4l2:/dev/orvex-no-such-camera",
+         "MediaRecorder: video source v4l2:/dev/orvex-no-such-camera cannot start: "},
+        // Sound is no picture: caps negotiation fails before the first frame.
+        {"gst:audiotestsrc", "MediaRecorder: video source gst:audiotestsrc cannot start: "},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.value);
+        log_.Clear();
+        properties_.Set("orvex.host.video", c.value);
+        auto r = Recorder(320, 240);
+        EXPECT_EQ(r->prepare(), HostMediaRecorder::kUnknownError);
+        std::vector<std::string> lines = Lines("video source");
+        ASSERT_EQ(lines.size(), 1u);
+        EXPECT_EQ(lines[0].compare(0, strlen(c.line), c.line), 0) << lines[0];
+        EXPECT_GT(lines[0].size(), strlen("cannot start: ") + strlen(c.value) + 25) << lines[0];
+        EXPECT_EQ(r->start(), HostMediaRecorder::kInvalidOperation);
+        EXPECT_EQ(r->release(), 0);
+    }
+}
+
+TEST_F(HostCaptureTest, SoundSourcesThatCannotStartFailStartWithOneLine) {
+    const char* saved = getenv("PULSE_SERVER");
+    std::string keep = saved != nullptr ? saved : "";
+    setenv("PULSE_SERVER", "unix:/nonexistent/orvex-pulse", 1);
+    const char* const values[] = {"gst:nosuchelement", "pulse", "gst:audiotestsrc ! !"};
+    for (const char* value : values) {
+        SCOPED_TRACE(value);
+        log_.Clear();
+        properties_.Set("orvex.host.audio", value);
+        platform::host::HostAudioRecordPort port;
+        auto record = port.create("orvex");
+        ASSERT_EQ(record->set(1, 48000, 1, 12, 960), 0);
+        EXPECT_NE(record->start(), 0);
+        std::vector<std::string> lines = Lines("audio source");
+        ASSERT_EQ(lines.size(), 1u);
+        std::string head = std::string("AudioRecord: audio source ") + value + " cannot start: ";
+        EXPECT_EQ(lines[0].compare(0, head.size(), head), 0) << lines[0];
+        EXPECT_GT(lines[0].size(), head.size()) << lines[0];
+        int16_t pcm[64];
+        EXPECT_LT(record->read(pcm, sizeof pcm), 1);
+    }
+    if (saved != nullptr) {
+        setenv("PULSE_SERVER", keep.c_str(), 1);
+    } else {
+        unsetenv("PULSE_SERVER");
+    }
+}
+
+TEST_F(HostCaptureTest, PictureSourceEndingMidStreamIsReportedOnceAndFramesGoOn) {
+    properties_.Set("orvex.host.video", "gst:videotestsrc num-buffers=10");
+    auto r = Recorder(320, 240);
+    ASSERT_EQ(r->prepare(), 0);
+    ASSERT_EQ(r->start(), 0);
+    ASSERT_TRUE(WaitFor([&] { return !Lines("stopped").empty(); }));
+    int after = binder_.frames.load();
+    EXPECT_TRUE(WaitFor([&] { return binder_.frames.load() >= after + 10; }));
+    EXPECT_EQ(r->stop(), 0);
+    EXPECT_EQ(Lines("stopped"),
+              (std::vector<std::string>{
+                  "MediaRecorder: video source gst:videotestsrc num-buffers=10 stopped: end of "
+                  "stream; showing \"no signal\" until the next start"}));
+}
+
+TEST_F(HostCaptureTest, SoundSourceEndingMidStreamIsReportedOnceAndSilenceFollows) {
+    properties_.Set("orvex.host.audio", "gst:audiotestsrc num-buffers=3 volume=0.5");
+    platform::host::HostAudioRecordPort port;
+    auto record = port.create("orvex");
+    ASSERT_EQ(record->set(1, 48000, 1, 12, 960), 0);
+    ASSERT_EQ(record->start(), 0);
+    std::vector<int16_t> block(960 * 2);
+    size_t silent_blocks = 0;
+    for (int i = 0; i < 200 && silent_blocks < 5; ++i) {
+        long got = record->read(block.data(), block.size() * 2);
+        ASSERT_GT(got, 0);
+        bool silent = true;
+        for (long s = 0; s < got / 2; ++s) silent = silent && block[s] == 0;
+        if (silent && !Lines("stopped").empty()) ++silent_blocks;
+    }
+    record->stop();
+    EXPECT_EQ(silent_blocks, 5u);
+    EXPECT_EQ(Lines("stopped"), (std::vector<std::string>{
+                                    "AudioRecord: audio source gst:audiotestsrc num-buffers=3 "
+                                    "volume=0.5 stopped: end of stream; silence until the next "
+                                    "start"}));
+}
+
+TEST_F(HostCaptureTest, TheSubWindowTakesItsOwnSource) {
+    properties_.Set("orvex.host.video", "gst:nosuchelement");
+    properties_.Set("orvex.host.video.sub", "pattern");
+    auto sub = Recorder(320, 240, true);
+    EXPECT_EQ(sub->prepare(), 0);
+    EXPECT_EQ(sub->source().kind, SourceChoice::kPattern);
+    EXPECT_EQ(sub->release(), 0);
+    auto main = Recorder(320, 240, false);
+    EXPECT_EQ(main->prepare(), HostMediaRecorder::kUnknownError);
+    EXPECT_EQ(main->release(), 0);
+}
+
+TEST(HostPatternLabel, LabelsAreDrawnInTheMiddle) {
+    TestPattern pattern(320, 240);
+    std::vector<uint8_t> plain(pattern.frameSize()), sub(plain.size()), lost(plain.size());
+    pattern.draw(7, 500, plain.data());
+    pattern.draw(7, 500, sub.data(), TestPattern::Label::kSub);
+    pattern.draw(7, 500, lost.data(), TestPattern::Label::kNoSignal);
+    auto middle_differs = [&](const std::vector<uint8_t>& a) {
+        int differ = 0;
+        for (int y = 100; y < 140; ++y) {
+            for (int x = 100; x < 220; ++x) differ += a[y * 320 + x] != plain[y * 320 + x];
+        }
+        return differ;
+    };
+    EXPECT_GT(middle_differs(sub), 1000);
+    EXPECT_GT(middle_differs(lost), 1000);
+    EXPECT_NE(sub, lost);
+    // The flash square and the counter stay where they are.
+    EXPECT_EQ(sub[0], plain[0]);
+    EXPECT_EQ(lost[300], plain[300]);
+}
+
+}  // namespace

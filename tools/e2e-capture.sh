@@ -1,0 +1,169 @@
+#!/usr/bin/env bash
+# End to end with real capture: a virtual X screen showing a window of a known colour and a
+# PulseAudio null sink playing a known tone, orvex capturing both (orvex.host.video=x11,
+# orvex.host.audio=pulse), and a stock ffmpeg client that decodes the stream and must find that
+# colour and that tone. Runs in its own network namespace, so port 554 is its own.
+#   tools/e2e-capture.sh [BUILD_DIR]            the check (needs root: namespace, port 554)
+#   tools/e2e-capture.sh [BUILD_DIR] measure    CPU of orvex, bitrate and frame rate while
+#                                               the screen moves, at 720p and 1080p
+set -euo pipefail
+top=$(cd "$(dirname "$0")/.." && pwd)
+build=$(cd "${1:-$top/build}" && pwd)
+mode=${2:-check}
+
+if [[ -z "${ORVEX_E2E_NETNS:-}" ]]; then
+  "$top/tools/install-deps.sh" capture-e2e
+  exec env ORVEX_E2E_NETNS=1 unshare -n bash -c 'ip link set lo up && exec "$0" "$@"' \
+    "$0" "$build" "$mode"
+fi
+
+colour=30a050     # the screen's colour, RGB
+tone_hz=660       # the tone the machine plays
+
+work=$(mktemp -d)
+pids=()
+cleanup() {
+  for p in "${pids[@]}"; do kill "$p" 2>/dev/null || true; done
+  wait 2>/dev/null || true
+  [[ -n "${ORVEX_E2E_KEEP:-}" ]] || rm -rf "$work"
+}
+trap cleanup EXIT
+fail() { echo "e2e-capture: FAILED: $* (work: $work)"; tail -n 20 "$work/orvex.log" 2>/dev/null || true; exit 1; }
+ok() { echo "e2e-capture: ok: $*"; }
+
+# A virtual screen; Xvfb picks a free display number and writes it to fd 3.
+screen_w=1280 screen_h=720
+[[ $mode == measure ]] && screen_w=1920 screen_h=1080
+Xvfb -displayfd 3 -screen 0 "${screen_w}x${screen_h}x24" -nolisten tcp 3>"$work/display" \
+  >"$work/xvfb.log" 2>&1 &
+pids+=($!)
+for _ in $(seq 100); do [[ -s "$work/display" ]] && break; sleep 0.1; done
+[[ -s "$work/display" ]] || fail "Xvfb did not start: $(cat "$work/xvfb.log")"
+export DISPLAY=":$(cat "$work/display")"
+# No window manager paints the root window here, so a window as large as the screen shows
+# the colour.
+if [[ $mode != measure ]]; then
+  gst-launch-1.0 -q videotestsrc pattern=solid-color foreground-color=0xff$colour is-live=true \
+    ! "video/x-raw,width=$screen_w,height=$screen_h,framerate=5/1" ! ximagesink \
+    >"$work/window.log" 2>&1 &
+  pids+=($!)
+fi
+
+# A private sound server with only a null sink: its monitor is "what the machine plays".
+mkdir -p "$work/pulse"
+cat >"$work/pulse/default.pa" <<PA
+load-module module-null-sink sink_name=orvexnull
+load-module module-native-protocol-unix auth-anonymous=1 socket=$work/pulse/native
+set-default-sink orvexnull
+PA
+HOME="$work/pulse" XDG_RUNTIME_DIR="$work/pulse" PULSE_RUNTIME_PATH="$work/pulse/rt" \
+  pulseaudio -n -F "$work/pulse/default.pa" --daemonize=no --exit-idle-time=-1 \
+  --disallow-exit --disable-shm=yes >"$work/pulse.log" 2>&1 &
+pids+=($!)
+export PULSE_SERVER="unix:$work/pulse/native"
+for _ in $(seq 100); do pactl info >/dev/null 2>&1 && break; sleep 0.1; done
+pactl info >/dev/null 2>&1 || fail "pulseaudio did not start: $(tail -3 "$work/pulse.log")"
+gst-launch-1.0 -q audiotestsrc is-live=true freq=$tone_hz volume=0.4 ! pulsesink \
+  >"$work/tone.log" 2>&1 &
+pids+=($!)
+
+cp "$top/platform/host/orvex.prop" "$work/orvex.prop"
+cat >>"$work/orvex.prop" <<PROP
+orvex.host.video=x11
+orvex.host.audio=pulse
+kv.orvex.audiopt=97
+PROP
+export ORVEX_PROP_FILE="$work/orvex.prop"
+export ORVEX_LOG="file:$work/orvex.log"
+export ORVEX_BINDER_DIR="$work/binder"
+url() { echo "rtsp://127.0.0.1/skyvo.0?width=$1&height=$2&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"; }
+
+"$build/orvex" >"$work/stdout" 2>&1 &
+orvex=$!
+pids+=($orvex)
+for _ in $(seq 100); do (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break; sleep 0.1; done
+kill -0 "$orvex" 2>/dev/null || fail "orvex did not start"
+sleep 0.5
+
+if [[ $mode == measure ]]; then
+  # Something that moves, drawn by an X client: a small ball (little changes per frame), then
+  # colour bars scrolling over the whole screen (every pixel changes).
+  hz=$(getconf CLK_TCK)
+  for scene in "ball:pattern=ball" "bars:pattern=smpte horizontal-speed=4"; do
+    gst-launch-1.0 -q videotestsrc ${scene#*:} is-live=true \
+      ! "video/x-raw,width=$screen_w,height=$screen_h,framerate=30/1" ! ximagesink \
+      >"$work/scene.log" 2>&1 &
+    drawer=$!
+    sleep 2
+    for size in "1280 720" "1920 1080"; do
+      set -- $size
+      timeout -k 5 60 ffmpeg -y -hide_banner -nostats -loglevel error -rtsp_transport udp \
+        -i "$(url "$1" "$2")" -map 0:v -c copy -t 25 -f h264 "$work/video.h264" </dev/null &
+      client=$!
+      sleep 8
+      cpu0=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
+      load0=$(cut -d' ' -f1 /proc/loadavg)
+      sleep 10
+      cpu1=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
+      wait "$client" || true
+      frames=$(ffprobe -v error -count_frames -select_streams v:0 \
+        -show_entries stream=nb_read_frames -of csv=p=0 "$work/video.h264")
+      bytes=$(stat -c %s "$work/video.h264")
+      echo "e2e-capture: measure: ${1}x${2}@30, ${scene%%:*} on a ${screen_w}x${screen_h}" \
+        "screen: orvex CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core," \
+        "$(( bytes * 8 / 25 / 1000 )) kbit/s, $(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}')" \
+        "fps (load average $load0 on $(nproc) cores)"
+      grep -h 'frames dropped' "$work/orvex.log" | tail -1 | sed 's/.*MediaRecorder::stop: /  /'
+      sleep 2
+    done
+    kill "$drawer"
+    wait "$drawer" 2>/dev/null || true
+  done
+  exit 0
+fi
+
+# Video: the mean colour of the decoded frames (each scaled to one pixel).
+timeout -k 5 40 ffmpeg -hide_banner -nostats -loglevel error -rtsp_transport udp \
+  -i "$(url 1280 720)" -map 0:v -t 5 -vf scale=1:1,format=rgb24 -fps_mode passthrough \
+  -f rawvideo "$work/rgb" \
+  || fail "ffmpeg (video) exit status"
+python3 - "$work/rgb" "$colour" <<'PY' || fail "colour"
+import sys
+data = open(sys.argv[1], "rb").read()
+want = bytes.fromhex(sys.argv[2])
+frames = [data[i:i + 3] for i in range(0, len(data) - 2, 3)][15:]  # skip the first 0.5 s
+if len(frames) < 60:
+    sys.exit("only %d frames" % len(frames))
+mean = [sum(f[c] for f in frames) / len(frames) for c in range(3)]
+print("e2e-capture: ok: %d frames, mean colour #%02x%02x%02x (screen #%s)"
+      % (len(frames), *[round(m) for m in mean], sys.argv[2]))
+sys.exit(0 if all(abs(m - w) <= 12 for m, w in zip(mean, want)) else 1)
+PY
+sleep 1
+
+# Sound: the dominant frequency of the decoded PCM (1 s, mono, 8 kHz), by a plain DFT scan.
+timeout -k 5 40 ffmpeg -hide_banner -nostats -loglevel error -rtsp_transport udp \
+  -i "$(url 1280 720)" -map 0:a -t 4 -ac 1 -ar 8000 -f s16le "$work/pcm" \
+  || fail "ffmpeg (audio) exit status"
+python3 - "$work/pcm" "$tone_hz" <<'PY' || fail "tone"
+import math, struct, sys
+raw = open(sys.argv[1], "rb").read()
+samples = struct.unpack("<%dh" % (len(raw) // 2), raw)[8000:16000]  # the second second
+if len(samples) < 8000:
+    sys.exit("only %d samples" % len(samples))
+def power(hz):  # Goertzel
+    k = 2 * math.cos(2 * math.pi * hz / 8000)
+    s1 = s2 = 0.0
+    for x in samples:
+        s1, s2 = x + k * s1 - s2, s1
+    return s1 * s1 + s2 * s2 - k * s1 * s2
+best = max(range(100, 2000, 5), key=power)
+rms = math.sqrt(sum(x * x for x in samples) / len(samples))
+print("e2e-capture: ok: dominant frequency %d Hz (played %s Hz), rms %.0f" % (best, sys.argv[2], rms))
+sys.exit(0 if abs(best - int(sys.argv[2])) <= 10 and rms > 300 else 1)
+PY
+
+grep -q "video from x11" "$work/orvex.log" || fail "orvex did not capture the screen"
+kill -TERM "$orvex"
+timeout 15 tail --pid="$orvex" -f /dev/null || fail "orvex still running 15 s after SIGTERM"
+echo "e2e-capture: passed"
