@@ -21,7 +21,8 @@ void BM_AacEncodeBlocks(benchmark::State& state) {
     auto get_api = reinterpret_cast<VoGetAacEncApi>(library.symbol(handle, "voGetAACEncAPI"));
     VO_AUDIO_CODECAPI api{};
     get_api(&api);
-    VO_MEM_OPERATOR memory{cmnMemAlloc, cmnMemFree, cmnMemSet, cmnMemCopy, cmnMemCheck, nullptr, nullptr};
+    VO_MEM_OPERATOR memory{cmnMemAlloc, cmnMemFree, cmnMemSet, cmnMemCopy,
+                           cmnMemCheck, nullptr,    nullptr};
     VO_CODEC_INIT_USERDATA user{kVoImfUserMemOperator, &memory, 0, 0};
     VO_HANDLE codec = nullptr;
     api.Init(&codec, kVoAudioCodingAac, &user);
@@ -30,7 +31,8 @@ void BM_AacEncodeBlocks(benchmark::State& state) {
 
     std::vector<int16_t> pcm(1920);
     for (size_t i = 0; i < 960; ++i) {
-        pcm[2 * i] = pcm[2 * i + 1] = static_cast<int16_t>(8000 * std::sin(2 * M_PI * 1000 * i / 48000.0));
+        pcm[2 * i] = pcm[2 * i + 1] =
+            static_cast<int16_t>(8000 * std::sin(2 * M_PI * 1000 * i / 48000.0));
     }
     unsigned char out[3840];
     int64_t blocks = 0;

@@ -78,8 +78,8 @@ void BM_PacketiseAndSend(benchmark::State& state) {
         packets += seq;
     }
     state.counters["packets"] = benchmark::Counter(static_cast<double>(packets));
-    state.counters["cpu_per_packet_us"] =
-        benchmark::Counter(static_cast<double>(packets), benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
+    state.counters["cpu_per_packet_us"] = benchmark::Counter(
+        static_cast<double>(packets), benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
 }
 
 // Packet building alone, into a sink that only looks at each packet.
@@ -116,14 +116,15 @@ void BM_BareSendto(benchmark::State& state) {
     for (auto _ : state) {
         for (const Bytes& p : built.packets) {
             for (const sockaddr_in& to : c.targets) {
-                sendto(c.sender, p.data(), p.size(), 0, reinterpret_cast<const sockaddr*>(&to), sizeof to);
+                sendto(c.sender, p.data(), p.size(), 0, reinterpret_cast<const sockaddr*>(&to),
+                       sizeof to);
             }
         }
         packets += static_cast<int64_t>(built.packets.size());
     }
     state.counters["packets"] = benchmark::Counter(static_cast<double>(packets));
-    state.counters["cpu_per_packet_us"] =
-        benchmark::Counter(static_cast<double>(packets), benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
+    state.counters["cpu_per_packet_us"] = benchmark::Counter(
+        static_cast<double>(packets), benchmark::Counter::kIsRate | benchmark::Counter::kInvert);
 }
 
 void BM_NewwriteToFirstPacket(benchmark::State& state) {
@@ -149,7 +150,9 @@ void BM_NewwriteToFirstPacket(benchmark::State& state) {
         auto t0 = std::chrono::steady_clock::now();
         ring.newwrite(item.data(), static_cast<int>(item.size()), 0, false);
         recv(c.fds[0], buf, sizeof buf, 0);
-        us.push_back(std::chrono::duration<double, std::micro>(std::chrono::steady_clock::now() - t0).count());
+        us.push_back(
+            std::chrono::duration<double, std::micro>(std::chrono::steady_clock::now() - t0)
+                .count());
     }
     session->CloseSendThread();
     H264RtpTransportSession::CloseInstance();

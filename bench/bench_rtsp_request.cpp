@@ -18,9 +18,10 @@ const std::string kUrl =
 const std::string kDescribe = "DESCRIBE " + kUrl +
                               " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n"
                               "User-Agent: Lavf59.27.100\r\n\r\n";
-const std::string kSetup = "SETUP " + kUrl +
-                           "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
-                           "client_port=15190-15191\r\nCSeq: 3\r\nUser-Agent: Lavf59.27.100\r\n\r\n";
+const std::string kSetup =
+    "SETUP " + kUrl +
+    "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
+    "client_port=15190-15191\r\nCSeq: 3\r\nUser-Agent: Lavf59.27.100\r\n\r\n";
 
 struct Connection {
     Connection() {
@@ -45,7 +46,7 @@ struct Connection {
 
 void BM_Describe(benchmark::State& state) {
     Connection c;
-    static const char* kKeys[] = {"width=",     "height=",    "cameraid=",   "win=",      "sub=",
+    static const char* kKeys[] = {"width=",     "height=",    "cameraid=",    "win=",      "sub=",
                                   "dumpvideo=", "dumpaudio=", "specialcase=", "framerate="};
     for (auto _ : state) {
         c.Send(kDescribe);

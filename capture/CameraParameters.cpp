@@ -24,7 +24,8 @@ std::string CameraParameters::flatten() const {
 
 void CameraParameters::set(const std::string& key, const std::string& value) {
     // '=' and ';' would break the flattened form: such a key or value is not stored.
-    if (key.find_first_of("=;") != std::string::npos || value.find(';') != std::string::npos) return;
+    if (key.find_first_of("=;") != std::string::npos || value.find(';') != std::string::npos)
+        return;
     for (auto& kv : m_values) {
         if (kv.first == key) {
             kv.second = value;

@@ -88,13 +88,15 @@ int StartRecorder(const CaptureState& s, unsigned bitrate) {
     if (g_recorder->setCamera(*g_camera) != 0) return Fail("orvex mediacorder setCamera error");
     if (g_recorder->setVideoSource(1) != 0) return Fail("orvex mediacorder setVideoSource error");
     // 101: the platform's private format that hands encoded frames to the service.
-    if (g_recorder->setOutputFormat(101) != 0) return Fail("orvex mediacorder setOutputFormat error");
+    if (g_recorder->setOutputFormat(101) != 0)
+        return Fail("orvex mediacorder setOutputFormat error");
     if (g_recorder->setVideoEncoder(2) != 0) return Fail("orvex mediacorder setVideoEncoder error");
     g_recorder->setVideoSize(static_cast<int>(s.width), static_cast<int>(s.height));
     g_recorder->setVideoFrameRate(static_cast<int>(s.frame_rate));
     unsigned id = s.camera_id;
     bool named = id == 3 || id == 5 || id == 6 || id == 7;
-    g_recorder->setParameters(named ? "video-param-camera-id=" + std::to_string(id) : std::string());
+    g_recorder->setParameters(named ? "video-param-camera-id=" + std::to_string(id)
+                                    : std::string());
     OrvexLog(kTag, "******videobitrate is %d******", static_cast<int>(bitrate));
     char text[100];
     snprintf(text, sizeof text, "video-param-encoding-bitrate=%u", bitrate);
@@ -130,8 +132,10 @@ void closeAudioManager() {
 int Start_Video_Capture() {
     const CaptureState& s = capture_state();
     OrvexLog(kTag, "Start_Video_Capture--->Cameraid = %d \n", static_cast<int>(s.camera_id));
-    OrvexLog(kTag, "Start_Video_Capture--->travelingMode = %d \n", static_cast<int>(s.traveling_mode));
-    OrvexLog(kTag, "Start_Video_Capture--->subinputtype = %d \n", static_cast<int>(s.sub_input_type));
+    OrvexLog(kTag, "Start_Video_Capture--->travelingMode = %d \n",
+             static_cast<int>(s.traveling_mode));
+    OrvexLog(kTag, "Start_Video_Capture--->subinputtype = %d \n",
+             static_cast<int>(s.sub_input_type));
     OrvexLog(kTag, "Start_Video_Capture--->g_video_fps = %d \n", static_cast<int>(s.frame_rate));
     const unsigned bitrate = s.camera_id > 4 ? 2048000 : 1024000;
 
@@ -189,7 +193,8 @@ void Close_Video_Capture() {
         if (platform::PxAudioOut().Close(g_audio_out_handle) != 0) {
             OrvexLog(kTag, "[ERROR] failed to PX_AOUT_Close  in orvex!");
         }
-        if (platform::PxAudioOut().DeInit() != 0) OrvexLog(kTag, "[ERROR]Aout deinit fail in orvex.");
+        if (platform::PxAudioOut().DeInit() != 0)
+            OrvexLog(kTag, "[ERROR]Aout deinit fail in orvex.");
         g_audio_out_handle = -1;
     } else if (flavour == kFlavourSa) {
         closePipManager();

@@ -87,8 +87,8 @@ int ResolutionCode(unsigned width, unsigned height, const char* board) {
         unsigned width, height;
         int code;
     } kSizes[] = {
-        {640, 480, 3},  {720, 576, 0},  {320, 240, 1},  {480, 320, 5},   {1280, 720, 12},
-        {720, 480, 2},  {720, 400, 9},  {320, 176, 11}, {640, 368, 10},  {1920, 1080, 13},
+        {640, 480, 3}, {720, 576, 0}, {320, 240, 1},  {480, 320, 5},  {1280, 720, 12},
+        {720, 480, 2}, {720, 400, 9}, {320, 176, 11}, {640, 368, 10}, {1920, 1080, 13},
     };
     for (const auto& s : kSizes) {
         if (s.width != width || s.height != height) continue;

@@ -19,8 +19,8 @@ struct CaptureState {
     // Read by the dump writers on the binder and audio threads.
     std::atomic<bool> log_switch{false};  // "kv.orvex.log"
     std::atomic<bool> dump_to_sd{false};  // "kv.orvex.dumptosd"
-    char board[256] = "android";     // "ro.board.platform"
-    PlatformFlavourCache flavour;    // shared with the capture control
+    char board[256] = "android";          // "ro.board.platform"
+    PlatformFlavourCache flavour;         // shared with the capture control
 };
 
 CaptureState& capture_state();

@@ -49,7 +49,8 @@ void PipListener::notify(int, int, int) {}
 void PipListener::eventCallback(int event_type) {
     // The texts say "dataCallback"; operators search for them as they are.
     if (event_type == platform::kEvTravelingCallbackUnsupport) {
-        OrvexLog("orvex:::livecamera", "PipListener::dataCallback ----->EV_TRAVELING_CALLBACK_UNSUPPORT");
+        OrvexLog("orvex:::livecamera",
+                 "PipListener::dataCallback ----->EV_TRAVELING_CALLBACK_UNSUPPORT");
         g_pip_stop_flag.store(1, std::memory_order_relaxed);
     } else if (event_type == platform::kEvTravelingCallbackTvosFastQuit) {
         OrvexLog("orvex:::livecamera",

@@ -26,7 +26,9 @@ int orvexAudioRecord::setaudiorecord() {
     }
     if (!m_record) return 1;
     return m_record->set(m_input_source, m_sample_rate, m_format,
-                         static_cast<unsigned>(m_channel_mask), frames) == 0 ? 0 : 1;
+                         static_cast<unsigned>(m_channel_mask), frames) == 0
+               ? 0
+               : 1;
 }
 
 long orvexAudioRecord::getMinBufferSize() {

@@ -37,7 +37,8 @@ cycle_buffer g_pcm_ring(100000);
 PlatformFlavourCache g_flavour;  // this module's own cache
 
 const std::atomic<bool> kAlwaysSay{true};
-DumpFile g_pcm_dump(kTag, "/data/app/orvextestaudio.pcm", "/mnt/usb/sda1/orvextestaudio.pcm", 209715200,
+DumpFile g_pcm_dump(kTag, "/data/app/orvextestaudio.pcm", "/mnt/usb/sda1/orvextestaudio.pcm",
+                    209715200,
                     {"/n open /data/app/orvextestaudio.pcm failed /n",
                      "/n open /mnt/usb/sda1/orvextestaudio.pcm failed /n",
                      "Remove /data/app/orvextestaudio.pcm. \n",
@@ -45,7 +46,8 @@ DumpFile g_pcm_dump(kTag, "/data/app/orvextestaudio.pcm", "/mnt/usb/sda1/orvexte
                      "/n open /data/app/orvextestaudio.pcm failed /n"},
                     &kAlwaysSay);
 // The two limits differ on purpose: 200 MiB of PCM, 50 MiB of AAC.
-DumpFile g_aac_dump(kTag, "/data/app/orvextestaudio.aac", "/mnt/usb/sda1/orvextestaudio.aac", 52428800,
+DumpFile g_aac_dump(kTag, "/data/app/orvextestaudio.aac", "/mnt/usb/sda1/orvextestaudio.aac",
+                    52428800,
                     {"/n open /data/app/orvextestaudio.aac failed/n",
                      "/n open /mnt/usb/sda1/orvextestaudio.aac failed/n",
                      "Remove /data/app/orvextestaudio.aac. \n",
@@ -171,7 +173,8 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
         OrvexPrint("\n Stsrt param error !");  // the spelling operators know
         return 1;
     }
-    VO_MEM_OPERATOR memory{cmnMemAlloc, cmnMemFree, cmnMemSet, cmnMemCopy, cmnMemCheck, nullptr, nullptr};
+    VO_MEM_OPERATOR memory{cmnMemAlloc, cmnMemFree, cmnMemSet, cmnMemCopy,
+                           cmnMemCheck, nullptr,    nullptr};
     VO_CODEC_INIT_USERDATA user{kVoImfUserMemOperator, &memory, 0, 0};
     AACENC_PARAM params{48000, 128000, 2, 1};  // ADTS headers on
 
@@ -224,8 +227,10 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
                 ended = true;
                 break;
             } else if (++unknown == kUnknownResultsMax) {
-                OrvexLog(kTag, "encoder gave %d unknown results for one block (last 0x%lx): "
-                         "block skipped", kUnknownResultsMax, static_cast<unsigned long>(r));
+                OrvexLog(kTag,
+                         "encoder gave %d unknown results for one block (last 0x%lx): "
+                         "block skipped",
+                         kUnknownResultsMax, static_cast<unsigned long>(r));
             }
         }
     }

@@ -2,7 +2,8 @@
 
 #include <cmath>
 
-MediaStream::MediaStream(const char* name, int type) : m_name(name != nullptr ? name : ""), m_type(type) {}
+MediaStream::MediaStream(const char* name, int type)
+    : m_name(name != nullptr ? name : ""), m_type(type) {}
 
 MediaStream::~MediaStream() {
     TLock::Scoped hold(m_state_lock);
@@ -26,10 +27,12 @@ bool MediaStream::TransportSetup(const char* local_address, unsigned local_port,
     if (m_initialised == 0) return false;
     m_setup = 0;
     m_transport = std::make_unique<Rtp>(m_packet_size);
-    if (!m_transport->Open(local_address != nullptr ? local_address : "", static_cast<int>(local_port))) {
+    if (!m_transport->Open(local_address != nullptr ? local_address : "",
+                           static_cast<int>(local_port))) {
         return false;
     }
-    if (!m_transport->Connect(remote_address != nullptr ? remote_address : "", static_cast<int>(remote_port))) {
+    if (!m_transport->Connect(remote_address != nullptr ? remote_address : "",
+                              static_cast<int>(remote_port))) {
         return false;
     }
     m_remote_port = remote_port;
@@ -64,7 +67,7 @@ float MediaStream::GetBandWidth() { return m_bandwidth; }
 int MediaStream::SendPacket(unsigned char* payload, unsigned len, int timestamp, int marker) {
     if (!m_transport) return 0;
     int sent = m_transport->Write(payload, static_cast<unsigned short>(len),
-                                  static_cast<signed char>(m_rtp_payload_type), timestamp, 0, marker,
-                                  500000);
+                                  static_cast<signed char>(m_rtp_payload_type), timestamp, 0,
+                                  marker, 500000);
     return sent > 0 ? sent : 0;
 }

@@ -58,7 +58,8 @@ std::string MediaStreamH264::GenerateMediaSdp(unsigned payload_type, int with_co
     snprintf(line, sizeof line, "a=fmtp:%d %s\r\n", pt, FmtpForWidth(width));
     sdp += line;
     if (with_control != 0) {
-        snprintf(line, sizeof line, "a=control:trackID=%d\r\n", static_cast<int>(payload_type) - 95);
+        snprintf(line, sizeof line, "a=control:trackID=%d\r\n",
+                 static_cast<int>(payload_type) - 95);
         sdp += line;
     }
     return sdp;

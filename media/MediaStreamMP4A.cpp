@@ -59,7 +59,8 @@ std::string MediaStreamMP4A::GenerateMediaSdp(unsigned payload_type, int with_co
              payload_type, ConfigString(m_sample_rate, m_channels).c_str());
     sdp += line;
     if (with_control != 0) {
-        snprintf(line, sizeof line, "a=control:trackID=%d\r\n", static_cast<int>(payload_type) - 95);
+        snprintf(line, sizeof line, "a=control:trackID=%d\r\n",
+                 static_cast<int>(payload_type) - 95);
         sdp += line;
     }
     return sdp;

@@ -19,7 +19,8 @@ cycle_buffer::~cycle_buffer() { delete[] m_start; }
 
 cycle_buffer::Snapshot cycle_buffer::Snap() {
     thread_mutex::Scoped hold(m_lock);
-    return Snapshot{m_read.load(std::memory_order_acquire), m_write.load(std::memory_order_acquire)};
+    return Snapshot{m_read.load(std::memory_order_acquire),
+                    m_write.load(std::memory_order_acquire)};
 }
 
 // (read - write) modulo capacity, less the byte that always stays unused.

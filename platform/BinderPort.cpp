@@ -9,8 +9,9 @@ int32_t ParcelReader::readInt32() {
         pos_ = size_;
         return 0;
     }
-    int32_t v = static_cast<int32_t>(uint32_t{data_[pos_]} | uint32_t{data_[pos_ + 1]} << 8 |
-                                     uint32_t{data_[pos_ + 2]} << 16 | uint32_t{data_[pos_ + 3]} << 24);
+    int32_t v =
+        static_cast<int32_t>(uint32_t{data_[pos_]} | uint32_t{data_[pos_ + 1]} << 8 |
+                             uint32_t{data_[pos_ + 2]} << 16 | uint32_t{data_[pos_ + 3]} << 24);
     pos_ += 4;
     return v;
 }

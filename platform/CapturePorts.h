@@ -33,7 +33,8 @@ class CameraPort {
 public:
     virtual ~CameraPort() = default;
     // Camera::connect(id, package, uid, pid): null when the camera cannot be had.
-    virtual std::shared_ptr<Camera> connect(int camera_id, const std::string& package, int uid, int pid) = 0;
+    virtual std::shared_ptr<Camera> connect(int camera_id, const std::string& package, int uid,
+                                            int pid) = 0;
 };
 
 class MediaRecorder {

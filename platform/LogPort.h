@@ -6,9 +6,9 @@
 namespace platform {
 
 // Values as the Android log headers number them.
-constexpr int kLogIdSystem = 3;    // LOG_ID_SYSTEM
-constexpr int kLogDebug = 3;       // ANDROID_LOG_DEBUG
-constexpr int kLogError = 6;       // ANDROID_LOG_ERROR
+constexpr int kLogIdSystem = 3;  // LOG_ID_SYSTEM
+constexpr int kLogDebug = 3;     // ANDROID_LOG_DEBUG
+constexpr int kLogError = 6;     // ANDROID_LOG_ERROR
 
 class LogPort {
 public:

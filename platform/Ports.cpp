@@ -43,7 +43,9 @@ public:
 
 class NullCamera final : public CameraPort {
 public:
-    std::shared_ptr<platform::Camera> connect(int, const std::string&, int, int) override { return nullptr; }
+    std::shared_ptr<platform::Camera> connect(int, const std::string&, int, int) override {
+        return nullptr;
+    }
 };
 
 class NullRecorders final : public MediaRecorderPort {

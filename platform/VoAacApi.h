@@ -37,11 +37,11 @@ typedef void* VO_HANDLE;
 typedef long long VO_S64;
 typedef unsigned char* VO_PBYTE;
 
-constexpr VO_U32 kVoErrInputBufferSmall = 0x80000005;   // more input needed
+constexpr VO_U32 kVoErrInputBufferSmall = 0x80000005;  // more input needed
 constexpr VO_U32 kVoErrOutputBufferSmall = 0x80000009;
-constexpr int kVoAudioCodingAac = 8;                    // VO_AUDIO_CodingAAC
-constexpr VO_S32 kVoPidAacEncParam = 0x42211040;        // VO_PID_AAC_ENCPARAM
-constexpr int kVoImfUserMemOperator = 0;                // VO_IMF_USERMEMOPERATOR
+constexpr int kVoAudioCodingAac = 8;              // VO_AUDIO_CodingAAC
+constexpr VO_S32 kVoPidAacEncParam = 0x42211040;  // VO_PID_AAC_ENCPARAM
+constexpr int kVoImfUserMemOperator = 0;          // VO_IMF_USERMEMOPERATOR
 
 typedef struct {
     VO_PBYTE Buffer;
@@ -71,8 +71,11 @@ typedef struct {
 typedef struct VO_AUDIO_CODECAPI {
     VO_U32 (*Init)(VO_HANDLE* phCodec, int vType, VO_CODEC_INIT_USERDATA* pUserData);
     VO_U32 (*SetInputData)(VO_HANDLE hCodec, VO_CODECBUFFER* pInput);
+    // clang-format 14 breaks this declaration differently on every run.
+    // clang-format off
     VO_U32 (*GetOutputData)(VO_HANDLE hCodec, VO_CODECBUFFER* pOutBuffer,
                             VO_AUDIO_OUTPUTINFO* pOutInfo);
+    // clang-format on
     VO_U32 (*SetParam)(VO_HANDLE hCodec, VO_S32 uParamID, VO_PTR pData);
     VO_U32 (*GetParam)(VO_HANDLE hCodec, VO_S32 uParamID, VO_PTR pData);
     VO_U32 (*Uninit)(VO_HANDLE hCodec);

@@ -27,11 +27,12 @@ bool Rtp::CreateRtpPacket(unsigned char* payload, unsigned short length, unsigne
     return m_packet.AppendData(payload, length);
 }
 
-int Rtp::Write(unsigned char* payload, unsigned short length, signed char payloadType, int timestamp,
-               int ssrc, int marker, unsigned int timeout) {
-    CreateRtpPacket(payload, length, static_cast<unsigned char>(payloadType), timestamp, ssrc, marker);
-    int sent = Udp::Write(m_packet.GetStart(), static_cast<unsigned short>(m_packet.GetLength()),
-                          timeout);
+int Rtp::Write(unsigned char* payload, unsigned short length, signed char payloadType,
+               int timestamp, int ssrc, int marker, unsigned int timeout) {
+    CreateRtpPacket(payload, length, static_cast<unsigned char>(payloadType), timestamp, ssrc,
+                    marker);
+    int sent =
+        Udp::Write(m_packet.GetStart(), static_cast<unsigned short>(m_packet.GetLength()), timeout);
     return sent < kRtpHeaderSize ? -1 : sent - kRtpHeaderSize;
 }
 
@@ -40,8 +41,8 @@ int Rtp::Read(unsigned char* payload, unsigned short length, signed char* payloa
     unsigned needed = static_cast<unsigned>(length) + kRtpHeaderSize;
     if (m_packet.GetCapacity() < needed) m_packet.ExtendBuffer(needed);
     m_packet.Rewind(0);
-    int n = Udp::Read(m_packet.GetData(), static_cast<unsigned short>(m_packet.GetCapacity() & 0xFFFF),
-                      timeout);
+    int n = Udp::Read(m_packet.GetData(),
+                      static_cast<unsigned short>(m_packet.GetCapacity() & 0xFFFF), timeout);
     if (n < kRtpHeaderSize) return -1;
     const unsigned char* h = m_packet.GetData();
     if (h[0] != 0x80) return -1;
@@ -49,7 +50,8 @@ int Rtp::Read(unsigned char* payload, unsigned short length, signed char* payloa
     // Bounded by the caller's buffer, however large the packet buffer has grown.
     int count = n - kRtpHeaderSize;
     if (count > length) count = length;
-    if (payload != nullptr && count > 0) memcpy(payload, h + kRtpHeaderSize, static_cast<size_t>(count));
+    if (payload != nullptr && count > 0)
+        memcpy(payload, h + kRtpHeaderSize, static_cast<size_t>(count));
     if (payloadType != nullptr) *payloadType = static_cast<signed char>(h[1]);
     if (sequence != nullptr) *sequence = static_cast<unsigned short>((h[2] << 8) | h[3]);
     if (timestamp != nullptr) *timestamp = static_cast<int>(GetBig32(h + 4));

@@ -108,8 +108,8 @@ ClientFanout::ClientFanout(int sockfd, bool stop_at_first_failure, const char* e
 void ClientFanout::Send(const unsigned char* packet, unsigned length) {
     if (targets_ == nullptr) return;
     for (const sockaddr_in& to : *targets_) {
-        ssize_t sent = sendto(sockfd_, packet, length, 0, reinterpret_cast<const sockaddr*>(&to),
-                              sizeof to);
+        ssize_t sent =
+            sendto(sockfd_, packet, length, 0, reinterpret_cast<const sockaddr*>(&to), sizeof to);
         if (sent < 0) {
             OrvexPrint("%s", error_text_);
             if (stop_at_first_failure_) return;

@@ -5,12 +5,12 @@
 
 #include <memory>
 
+#include "media/LazyInstance.h"
 #include "rtp/Base64.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
 #include "rtp/h264_sps.h"
 #include "service/GlobalConfig.h"
-#include "media/LazyInstance.h"
 #include "service/OrvexLog.h"
 
 namespace {
@@ -114,8 +114,8 @@ void H264RtpTransportSession::procH264Thread() {
         }
         AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);
         config->set_timestamp(PositionMs(ts, rate), true);
-        PacketiseH264Item(item->data, static_cast<unsigned>(item->length), ts, payload_type, &sequence,
-                          fanout);
+        PacketiseH264Item(item->data, static_cast<unsigned>(item->length), ts, payload_type,
+                          &sequence, fanout);
         state.AfterSend(&sequence);
         recompute = true;
     }

@@ -10,7 +10,8 @@ unsigned PositionMs(uint32_t timestamp, unsigned rate) {
     return static_cast<unsigned>(timestamp / static_cast<double>(rate) * 1000.0);
 }
 
-void AdvanceTimestamp(uint32_t* timestamp, unsigned rate, uint32_t item_ms, uint32_t* last_item_ms) {
+void AdvanceTimestamp(uint32_t* timestamp, unsigned rate, uint32_t item_ms,
+                      uint32_t* last_item_ms) {
     if (item_ms >= *last_item_ms) {
         *timestamp += static_cast<uint32_t>(rate * ((item_ms - *last_item_ms) / 1000.0));
     }

@@ -31,10 +31,10 @@ public:
     int resume_state() const { return resume_; }
 
 private:
-    uint32_t n_ = 0;      // items sent, wraps past 4294967293
-    unsigned p_ = 0;      // position counter
+    uint32_t n_ = 0;  // items sent, wraps past 4294967293
+    unsigned p_ = 0;  // position counter
     bool latched_ = false;
-    int resume_ = 1;      // 1 sending, 2 paused, 3 waiting for a position-0 item
+    int resume_ = 1;  // 1 sending, 2 paused, 3 waiting for a position-0 item
     bool first_ = true;
 };
 

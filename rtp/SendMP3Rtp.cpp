@@ -6,10 +6,10 @@
 
 #include <memory>
 
+#include "media/LazyInstance.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
 #include "service/GlobalConfig.h"
-#include "media/LazyInstance.h"
 #include "service/OrvexLog.h"
 
 namespace {

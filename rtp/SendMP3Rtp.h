@@ -20,7 +20,8 @@ private:
     // Unlike the video session, the destination copy is not marked for a rebuild at start.
     void Run() override { procMP3Thread(); }
     void procMP3Thread();
-    void sendMP3RtpPacket(const Buffer_Item& item, int sockfd, uint32_t timestamp, uint16_t sequence);
+    void sendMP3RtpPacket(const Buffer_Item& item, int sockfd, uint32_t timestamp,
+                          uint16_t sequence);
 
     unsigned m_payload_type = kAacPayloadType;  // the send thread's own, taken when it starts
 };

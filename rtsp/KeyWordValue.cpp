@@ -16,7 +16,8 @@ int kmp(const char* text, const char* pattern) {
         next[i] = k;
     }
     // Deliberate unconditional trace of the failure table.
-    for (size_t i = 0; i < m; ++i) OrvexRaw("next[%d]=%d\n", static_cast<int>(i), static_cast<int>(next[i]));
+    for (size_t i = 0; i < m; ++i)
+        OrvexRaw("next[%d]=%d\n", static_cast<int>(i), static_cast<int>(next[i]));
     if (n == 0) return m == 0 ? 0 : -1;
     if (m == 0) return 0;
     for (size_t i = 0, k = 0; i < n; ++i) {
@@ -36,9 +37,8 @@ std::string getKeyWordValue(std::string key, std::string url) {
         result = "failed";
     } else {
         // Values are cut at 10 characters without notice.
-        for (size_t i = static_cast<size_t>(pos) + key.size(); i < url.size() && url[i] != '&' &&
-                                                               result.size() < 10;
-             ++i) {
+        for (size_t i = static_cast<size_t>(pos) + key.size();
+             i < url.size() && url[i] != '&' && result.size() < 10; ++i) {
             result.push_back(url[i]);
         }
     }

@@ -7,7 +7,7 @@
 namespace {
 // A line longer than this is cut: a peer must not make us hold unbounded memory.
 constexpr size_t kLineMax = 64 * 1024;
-}
+}  // namespace
 
 Rtsp::Rtsp() = default;
 

@@ -36,12 +36,14 @@ RtspResponse::RtspResponse(int fd, sockaddr_in first, sockaddr_in second) {
 bool RtspResponse::SendResponse(const char* status) {
     // Each line is formatted into 256 bytes: a longer one is cut to 255 characters.
     char line[256];
-    snprintf(line, sizeof line, "%s", status != nullptr && status[0] != '\0' ? status : "RTSP/1.0 200 OK");
+    snprintf(line, sizeof line, "%s",
+             status != nullptr && status[0] != '\0' ? status : "RTSP/1.0 200 OK");
     Write(line);
     snprintf(line, sizeof line, "CSeq: %u", m_cseq);
     Write(line);
     if (m_session_id >= 1) {
-        snprintf(line, sizeof line, "Session: %u;timeout=%d", static_cast<unsigned>(m_session_id), 10);
+        snprintf(line, sizeof line, "Session: %u;timeout=%d", static_cast<unsigned>(m_session_id),
+                 10);
         Write(line);
     }
     for (const std::string& f : m_fields) {

@@ -63,8 +63,12 @@ bool RtspResponse::GetRequestType(int* type) {
     if (m_request_lines.empty()) return false;
     // Searched anywhere in the request line, in this order: the first hit decides.
     static const std::pair<const char*, int> kMethods[] = {
-        {"OPTIONS", kRtspOptions}, {"DESCRIBE", kRtspDescribe}, {"SETUP", kRtspSetup},
-        {"TEARDOWN", kRtspTeardown}, {"PLAY", kRtspPlay},       {"PAUSE", kRtspPause},
+        {"OPTIONS", kRtspOptions},
+        {"DESCRIBE", kRtspDescribe},
+        {"SETUP", kRtspSetup},
+        {"TEARDOWN", kRtspTeardown},
+        {"PLAY", kRtspPlay},
+        {"PAUSE", kRtspPause},
         {"GET_PARAMETER", kRtspGetParameter},
     };
     const std::string& line = m_request_lines[0];

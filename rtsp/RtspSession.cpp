@@ -172,7 +172,8 @@ bool RtspSession::TransportSetup(MediaSession* session, unsigned* server_port, i
     if (track != std::string::npos) {
         // trackID=1 is the first stream.
         int index = atoi(stream.c_str() + track + 8) - 1;
-        MediaStream* s = index >= 0 ? session->GetMediaStream(static_cast<unsigned>(index)) : nullptr;
+        MediaStream* s =
+            index >= 0 ? session->GetMediaStream(static_cast<unsigned>(index)) : nullptr;
         if (s == nullptr) {
             m_response->ResponseError("RTSP/1.0 404 Stream Not Found");
             return false;
@@ -189,7 +190,8 @@ bool RtspSession::TransportSetup(MediaSession* session, unsigned* server_port, i
     }
     // No stream named: every stream in order, stopping at the first failure.
     for (int i = 0; i < session->GetMediaStreamCount(); ++i) {
-        if (!StreamSetup(session->GetMediaStream(static_cast<unsigned>(i)), server_port, client_port)) {
+        if (!StreamSetup(session->GetMediaStream(static_cast<unsigned>(i)), server_port,
+                         client_port)) {
             return false;
         }
     }

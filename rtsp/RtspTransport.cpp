@@ -45,7 +45,9 @@ int AddWithRetries(cycle_buffer& ring, unsigned char* data, unsigned len, unsign
 
 }  // namespace
 
-void RtspTransport::SetSelectWaitMs(int ms) { g_select_wait_ms.store(ms, std::memory_order_relaxed); }
+void RtspTransport::SetSelectWaitMs(int ms) {
+    g_select_wait_ms.store(ms, std::memory_order_relaxed);
+}
 
 void CloseVideoAndAudioDecodeAndSend() {
     g_capture_running.store(0, std::memory_order_relaxed);
@@ -86,8 +88,8 @@ bool RtspTransport::Open(const char* ip, unsigned port, unsigned extra) {
     }
     int on = 1;
     if (setsockopt(m_listen_fd, SOL_SOCKET, SO_REUSEADDR, &on, sizeof on) != 0) {
-        OrvexLogPriority(platform::kLogError, "orvex:::RtspSession", "set reuse rtsp address wrong %s",
-                         strerror(errno));
+        OrvexLogPriority(platform::kLogError, "orvex:::RtspSession",
+                         "set reuse rtsp address wrong %s", strerror(errno));
         close(m_listen_fd);
         m_listen_fd = -1;
         return false;
@@ -115,8 +117,8 @@ bool RtspTransport::Open(const char* ip, unsigned port, unsigned extra) {
     } else {
         m_thread_started = true;
     }
-    OrvexPrint("\nRtspTransport:    Begin listen connect. ip address:%s  port:%d\n", m_address.c_str(),
-               static_cast<int>(port));
+    OrvexPrint("\nRtspTransport:    Begin listen connect. ip address:%s  port:%d\n",
+               m_address.c_str(), static_cast<int>(port));
     m_opened = 1;
     return true;
 }
@@ -280,7 +282,8 @@ int RtspTransport::ProcessReadRtspSession(fd_set& ready) {
             }
             if (errno == EINTR) continue;
             CloseVideoAndAudioDecodeAndSend();
-            if (ProcessDelRtspSessionOther(fd) != 0) m_client_count.fetch_sub(1, std::memory_order_relaxed);
+            if (ProcessDelRtspSessionOther(fd) != 0)
+                m_client_count.fetch_sub(1, std::memory_order_relaxed);
             delete it->second;
             m_sessions.erase(it);
             break;

@@ -44,7 +44,8 @@ void Global_Config::read_audio_payload_type() {
     char* end = nullptr;
     long pt = strtol(value, &end, 10);
     if (end == value || *end != '\0' || pt < 96 || pt > 127) {
-        OrvexLog(kTag, "kv.orvex.audiopt=\"%s\" is not a payload type from 96 to 127; audio RTP keeps 98",
+        OrvexLog(kTag,
+                 "kv.orvex.audiopt=\"%s\" is not a payload type from 96 to 127; audio RTP keeps 98",
                  value);
         return;
     }

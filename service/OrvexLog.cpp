@@ -31,7 +31,8 @@ void WriteStdout(const char* prefix, const char* text, const char* suffix) {
     char framed[kMessageMax + 4];
     int n = snprintf(framed, sizeof framed, "%s%s%s", prefix, text, suffix);
     if (n < 0) return;
-    size_t len = static_cast<size_t>(n) < sizeof framed ? static_cast<size_t>(n) : sizeof framed - 1;
+    size_t len =
+        static_cast<size_t>(n) < sizeof framed ? static_cast<size_t>(n) : sizeof framed - 1;
     fwrite(framed, 1, len, stdout);
     fflush(stdout);
 }

@@ -13,14 +13,16 @@ constexpr const char* kTag = "orvex:::orvexservice";
 constexpr uint32_t kFrameCode = 101;
 
 // Only "/data/app" has a limit (200 MiB); the same open-failure text serves both folders.
-DumpFile g_h264_dump(kTag, "/data/app/orvextesth264.h264", "/mnt/usb/sda1/orvextesth264.h264",
-                     0xC800000,
-                     {"open /data/app/orvextesth264.h264 failed", "open /data/app/orvextesth264.h264 failed",
-                      "Remove /data/app/orvextesth264.h264. ", "Remove /data/app/orvextesth264.h264 failed. ",
-                      "/n open /data/app/orvextesth264.h264 failed /n"},
-                     &capture_state().log_switch);
+DumpFile g_h264_dump(
+    kTag, "/data/app/orvextesth264.h264", "/mnt/usb/sda1/orvextesth264.h264", 0xC800000,
+    {"open /data/app/orvextesth264.h264 failed", "open /data/app/orvextesth264.h264 failed",
+     "Remove /data/app/orvextesth264.h264. ", "Remove /data/app/orvextesth264.h264 failed. ",
+     "/n open /data/app/orvextesth264.h264 failed /n"},
+    &capture_state().log_switch);
 
-bool StartCodeAt(const unsigned char* p) { return p[0] == 0 && p[1] == 0 && p[2] == 0 && p[3] == 1; }
+bool StartCodeAt(const unsigned char* p) {
+    return p[0] == 0 && p[1] == 0 && p[2] == 0 && p[3] == 1;
+}
 
 }  // namespace
 
@@ -46,7 +48,8 @@ int OrvexService::onTransact(uint32_t code, platform::ParcelReader& data, uint32
     // A length that does not match the data reads as no frame: nothing is stored.
     if (frame == nullptr) return platform::kBinderOk;
     unsigned char* bytes = const_cast<unsigned char*>(frame);
-    if (get_write_file_video() != 0) Test_write_h264_frame(reinterpret_cast<char*>(bytes), static_cast<unsigned>(length));
+    if (get_write_file_video() != 0)
+        Test_write_h264_frame(reinterpret_cast<char*>(bytes), static_cast<unsigned>(length));
     unsigned type = length > 4 ? bytes[4] & 0x1F : 0;
     if (type == 7 || type == 8) {
         sendppsandspsframe(bytes, length);

@@ -113,8 +113,9 @@ int main(int argc, char** argv) {
     timeval now{};
     gettimeofday(&now, nullptr);
     long usec = static_cast<long>(now.tv_usec) - g_signal_usec.load(std::memory_order_relaxed);
-    long elapsed = (static_cast<long>(now.tv_sec) - g_signal_sec.load(std::memory_order_relaxed)) * 1000 +
-                   usec / 1000;  // the division truncates toward zero on the signed difference
+    long elapsed =
+        (static_cast<long>(now.tv_sec) - g_signal_sec.load(std::memory_order_relaxed)) * 1000 +
+        usec / 1000;  // the division truncates toward zero on the signed difference
     OrvexPrintLog(kTag, "******elapse time is %d ms", static_cast<int>(elapsed));
     OrvexPuts("\n orvex all services exit ! ");
     OrvexLog(kTag, "\n orvex all services exit ! \n");

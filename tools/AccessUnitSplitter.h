@@ -17,7 +17,6 @@ namespace tools {
 // passes them again with what it reads next. With `at_end` true everything is consumed.
 // Thread contract: a pure function, any thread.
 std::vector<std::vector<uint8_t>> SplitAccessUnits(const uint8_t* data, size_t size,
-                                                   bool at_end = true,
-                                                   size_t* consumed = nullptr);
+                                                   bool at_end = true, size_t* consumed = nullptr);
 
 }  // namespace tools

@@ -28,9 +28,10 @@ constexpr size_t kMaxPending = platform::host::HostBinder::kMaxTransactionSize;
 using Clock = std::chrono::steady_clock;
 
 void Usage(FILE* out) {
-    fprintf(out, "usage: orvex-feed [--fps N] [--loop] [FILE|-]\n"
-                 "Sends an H.264 Annex B stream (default: standard input) to the running "
-                 "service,\none access unit per frame period (default 30 fps).\n");
+    fprintf(out,
+            "usage: orvex-feed [--fps N] [--loop] [FILE|-]\n"
+            "Sends an H.264 Annex B stream (default: standard input) to the running "
+            "service,\none access unit per frame period (default 30 fps).\n");
 }
 
 struct Options {
@@ -71,8 +72,9 @@ class Feeder {
 public:
     Feeder(platform::BinderPort& binder, double fps)
         : binder_(binder),
-          period_(std::chrono::duration_cast<Clock::duration>(
-              std::chrono::duration<double>(1 / fps))) {}
+          period_(
+              std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(1 / fps))) {
+    }
 
     // False once the service is gone.
     bool Send(const std::vector<uint8_t>& unit) {
@@ -96,8 +98,8 @@ public:
             return false;
         }
         if (status != platform::kBinderOk && refused_++ == 0) {
-            fprintf(stderr, "orvex-feed: %s answered %d to an access unit of %zu bytes\n",
-                    kService, status, unit.size());
+            fprintf(stderr, "orvex-feed: %s answered %d to an access unit of %zu bytes\n", kService,
+                    status, unit.size());
         }
         ++sent_;
         return true;

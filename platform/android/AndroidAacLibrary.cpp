@@ -5,13 +5,9 @@
 namespace platform {
 namespace android_port {
 
-const char* AndroidAacLibrary::name() {
-    return "libstagefright.so";
-}
+const char* AndroidAacLibrary::name() { return "libstagefright.so"; }
 
-void* AndroidAacLibrary::open() {
-    return dlopen(name(), RTLD_NOW);
-}
+void* AndroidAacLibrary::open() { return dlopen(name(), RTLD_NOW); }
 
 void* AndroidAacLibrary::symbol(void* library, const char* symbol) {
     return library != nullptr ? dlsym(library, symbol) : nullptr;

@@ -29,8 +29,8 @@ public:
             static_cast<audio_source_t>(input_source), sample_rate,
             static_cast<audio_format_t>(format), static_cast<audio_channel_mask_t>(channel_mask),
             frame_count, nullptr, nullptr, 0, false, AUDIO_SESSION_ALLOCATE,
-            android::AudioRecord::TRANSFER_DEFAULT, AUDIO_INPUT_FLAG_NONE,
-            static_cast<uid_t>(-1), -1, nullptr);
+            android::AudioRecord::TRANSFER_DEFAULT, AUDIO_INPUT_FLAG_NONE, static_cast<uid_t>(-1),
+            -1, nullptr);
         return status != android::NO_ERROR ? status : record_->initCheck();
     }
     int start() override { return record_->start(); }
@@ -49,8 +49,8 @@ std::shared_ptr<AudioRecord> AndroidAudioRecordPort::create(const std::string& p
     return std::make_shared<AndroidAudioRecord>(std::move(record));
 }
 
-int AndroidAudioRecordPort::getMinFrameCount(size_t* frame_count, unsigned sample_rate,
-                                             int format, unsigned channel_mask) {
+int AndroidAudioRecordPort::getMinFrameCount(size_t* frame_count, unsigned sample_rate, int format,
+                                             unsigned channel_mask) {
     return android::AudioRecord::getMinFrameCount(frame_count, sample_rate,
                                                   static_cast<audio_format_t>(format),
                                                   static_cast<audio_channel_mask_t>(channel_mask));

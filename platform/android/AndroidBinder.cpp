@@ -20,12 +20,11 @@ namespace {
 // service parses exactly what the sender wrote (int32 little-endian, in-place data padded to 4).
 class ServiceBridge : public android::BBinder {
 public:
-    explicit ServiceBridge(std::shared_ptr<BinderService> service)
-        : service_(std::move(service)) {}
+    explicit ServiceBridge(std::shared_ptr<BinderService> service) : service_(std::move(service)) {}
 
 protected:
-    android::status_t onTransact(uint32_t code, const android::Parcel& data,
-                                 android::Parcel* reply, uint32_t flags) override {
+    android::status_t onTransact(uint32_t code, const android::Parcel& data, android::Parcel* reply,
+                                 uint32_t flags) override {
         ParcelReader reader(data.data(), data.dataSize());
         const int status = service_->onTransact(code, reader, flags);
         if (status == kBinderUnknownTransaction) {
@@ -61,9 +60,7 @@ int AndroidBinder::addService(const char* name, std::shared_ptr<BinderService> s
     return android::defaultServiceManager()->addService(android::String16(name), binder, false);
 }
 
-void AndroidBinder::startThreadPool() {
-    android::ProcessState::self()->startThreadPool();
-}
+void AndroidBinder::startThreadPool() { android::ProcessState::self()->startThreadPool(); }
 
 int AndroidBinder::transact(const char* service, uint32_t code, const ParcelWriter& data) {
     android::sp<android::IBinder> binder =

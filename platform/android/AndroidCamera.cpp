@@ -10,9 +10,7 @@ namespace android_port {
 
 AndroidCamera::AndroidCamera(android::sp<android::Camera> camera) : camera_(std::move(camera)) {}
 
-AndroidCamera::~AndroidCamera() {
-    camera_->disconnect();
-}
+AndroidCamera::~AndroidCamera() { camera_->disconnect(); }
 
 std::string AndroidCamera::getParameters() {
     const android::String8 flattened = camera_->getParameters();
@@ -23,13 +21,9 @@ int AndroidCamera::setParameters(const std::string& flattened) {
     return camera_->setParameters(android::String8(flattened.c_str()));
 }
 
-int AndroidCamera::unlock() {
-    return camera_->unlock();
-}
+int AndroidCamera::unlock() { return camera_->unlock(); }
 
-int AndroidCamera::lock() {
-    return camera_->lock();
-}
+int AndroidCamera::lock() { return camera_->lock(); }
 
 std::shared_ptr<Camera> AndroidCameraPort::connect(int camera_id, const std::string& package,
                                                    int uid, int pid) {

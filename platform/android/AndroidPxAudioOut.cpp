@@ -14,9 +14,7 @@ int AndroidPxAudioOut::Init(unsigned short first_field) {
     return PX_AOUT_Init(&param);
 }
 
-int AndroidPxAudioOut::GetHandle(int path, int* handle) {
-    return PX_AOUT_GetHandle(path, handle);
-}
+int AndroidPxAudioOut::GetHandle(int path, int* handle) { return PX_AOUT_GetHandle(path, handle); }
 
 int AndroidPxAudioOut::Open(int path, int param, int* handle) {
     return PX_AOUT_Open(path, param, handle);
@@ -26,13 +24,9 @@ int AndroidPxAudioOut::SetAttr(int handle, int attr, int* value) {
     return PX_AOUT_SetAttr(handle, attr, value);
 }
 
-int AndroidPxAudioOut::Close(int handle) {
-    return PX_AOUT_Close(handle);
-}
+int AndroidPxAudioOut::Close(int handle) { return PX_AOUT_Close(handle); }
 
-int AndroidPxAudioOut::DeInit() {
-    return PX_AOUT_DeInit();
-}
+int AndroidPxAudioOut::DeInit() { return PX_AOUT_DeInit(); }
 
 }  // namespace android_port
 }  // namespace platform

@@ -54,7 +54,9 @@ public:
     int setVideoEncoder(int e) override { return Call("setVideoEncoder", Args({e})); }
     int setVideoSize(int w, int h) override { return Call("setVideoSize", Args({w, h})); }
     int setVideoFrameRate(int fps) override { return Call("setVideoFrameRate", Args({fps})); }
-    int setParameters(const std::string& p) override { return Call("setParameters", "(" + p + ")"); }
+    int setParameters(const std::string& p) override {
+        return Call("setParameters", "(" + p + ")");
+    }
     int prepare() override { return Call("prepare", ""); }
     int start() override { return Call("start", ""); }
     int stop() override { return Call("stop", ""); }
@@ -152,7 +154,9 @@ int FakePxAudioOut::Call(const std::string& text, const std::string& name) {
     return results_.Get(name);
 }
 
-int FakePxAudioOut::Init(unsigned short first) { return Call("PX_AOUT_Init" + Args({first}), "PX_AOUT_Init"); }
+int FakePxAudioOut::Init(unsigned short first) {
+    return Call("PX_AOUT_Init" + Args({first}), "PX_AOUT_Init");
+}
 int FakePxAudioOut::GetHandle(int path, int* handle) {
     int r = Call("PX_AOUT_GetHandle" + Args({path}), "PX_AOUT_GetHandle");
     if (handle != nullptr) *handle = r == 0 ? results_.Get("PX_AOUT_handle") : -1;
@@ -167,7 +171,9 @@ int FakePxAudioOut::SetAttr(int handle, int attr, int* value) {
     return Call("PX_AOUT_SetAttr" + Args({handle, attr, value != nullptr ? *value : -999}),
                 "PX_AOUT_SetAttr");
 }
-int FakePxAudioOut::Close(int handle) { return Call("PX_AOUT_Close" + Args({handle}), "PX_AOUT_Close"); }
+int FakePxAudioOut::Close(int handle) {
+    return Call("PX_AOUT_Close" + Args({handle}), "PX_AOUT_Close");
+}
 int FakePxAudioOut::DeInit() { return Call("PX_AOUT_DeInit", "PX_AOUT_DeInit"); }
 
 std::shared_ptr<AudioRecord> FakeAudioRecordPort::create(const std::string& package) {

@@ -30,8 +30,10 @@ private:
 // Camera, recorder, TV manager and PX audio output that record every call with its arguments.
 class FakeCameraPort final : public CameraPort {
 public:
-    FakeCameraPort(CallJournal& journal, FakeResults& results) : journal_(journal), results_(results) {}
-    std::shared_ptr<Camera> connect(int camera_id, const std::string& package, int uid, int pid) override;
+    FakeCameraPort(CallJournal& journal, FakeResults& results)
+        : journal_(journal), results_(results) {}
+    std::shared_ptr<Camera> connect(int camera_id, const std::string& package, int uid,
+                                    int pid) override;
     // What getParameters gives before any setParameters.
     void set_initial_parameters(const std::string& p) { initial_ = p; }
 
@@ -43,7 +45,8 @@ private:
 
 class FakeMediaRecorderPort final : public MediaRecorderPort {
 public:
-    FakeMediaRecorderPort(CallJournal& journal, FakeResults& results) : journal_(journal), results_(results) {}
+    FakeMediaRecorderPort(CallJournal& journal, FakeResults& results)
+        : journal_(journal), results_(results) {}
     std::shared_ptr<MediaRecorder> create(const std::string& package) override;
 
 private:
@@ -53,7 +56,8 @@ private:
 
 class FakeTvManager final : public TvManagerPort {
 public:
-    FakeTvManager(CallJournal& journal, FakeResults& results) : journal_(journal), results_(results) {}
+    FakeTvManager(CallJournal& journal, FakeResults& results)
+        : journal_(journal), results_(results) {}
     std::shared_ptr<TvManagerClient> connect() override;
 
 private:
@@ -63,7 +67,8 @@ private:
 
 class FakePxAudioOut final : public PxAudioOutPort {
 public:
-    FakePxAudioOut(CallJournal& journal, FakeResults& results) : journal_(journal), results_(results) {}
+    FakePxAudioOut(CallJournal& journal, FakeResults& results)
+        : journal_(journal), results_(results) {}
     int Init(unsigned short first_field) override;
     int GetHandle(int path, int* handle) override;
     int Open(int path, int param, int* handle) override;
@@ -81,7 +86,8 @@ private:
 // opens nothing unless a test names a real library.
 class FakeAudioRecordPort final : public AudioRecordPort {
 public:
-    FakeAudioRecordPort(CallJournal& journal, FakeResults& results) : journal_(journal), results_(results) {}
+    FakeAudioRecordPort(CallJournal& journal, FakeResults& results)
+        : journal_(journal), results_(results) {}
     std::shared_ptr<AudioRecord> create(const std::string& package) override;
     int getMinFrameCount(size_t* frame_count, unsigned sample_rate, int format,
                          unsigned channel_mask) override;

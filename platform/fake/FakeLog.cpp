@@ -5,7 +5,8 @@ namespace fake {
 
 void FakeLog::Write(int buffer, int priority, const char* tag, const char* text) {
     std::lock_guard<std::mutex> hold(mutex_);
-    entries_.push_back(Entry{buffer, priority, tag != nullptr ? tag : "", text != nullptr ? text : ""});
+    entries_.push_back(
+        Entry{buffer, priority, tag != nullptr ? tag : "", text != nullptr ? text : ""});
 }
 
 std::vector<FakeLog::Entry> FakeLog::Entries() {

@@ -50,8 +50,8 @@ public:
             auto live = std::make_unique<GstSource>();
             std::string error;
             if (!live->start(AudioPipeline(source), &error)) {
-                std::string line = "AudioRecord: audio source " + source.text +
-                                   " cannot start: " + error;
+                std::string line =
+                    "AudioRecord: audio source " + source.text + " cannot start: " + error;
                 Log().Write(kLogIdSystem, kLogError, kTag, line.c_str());
                 return -1;
             }
@@ -77,8 +77,8 @@ public:
         if (mode_ == Mode::kLive) {
             std::string why;
             if (live_->ended(&why)) {
-                std::string line = "AudioRecord: audio source " + source_text_ + " stopped: " +
-                                   why + "; silence until the next start";
+                std::string line = "AudioRecord: audio source " + source_text_ +
+                                   " stopped: " + why + "; silence until the next start";
                 Log().Write(kLogIdSystem, kLogError, kTag, line.c_str());
                 live_.reset();
                 mode_ = Mode::kSilence;

@@ -42,8 +42,7 @@ void PutLe32(uint8_t* at, uint32_t v) {
 }
 
 uint32_t GetLe32(const uint8_t* at) {
-    return uint32_t{at[0]} | uint32_t{at[1]} << 8 | uint32_t{at[2]} << 16 |
-           uint32_t{at[3]} << 24;
+    return uint32_t{at[0]} | uint32_t{at[1]} << 8 | uint32_t{at[2]} << 16 | uint32_t{at[3]} << 24;
 }
 
 bool MakeAddress(const std::string& path, sockaddr_un* addr) {

@@ -52,7 +52,7 @@ std::map<std::string, std::string> HostProperties::Parse(const std::string& text
 }
 
 void HostProperties::ReloadIfChanged() {
-    struct stat st{};
+    struct stat st {};
     if (stat(path_.c_str(), &st) != 0) {
         values_.clear();
         loaded_ = false;

@@ -26,7 +26,8 @@ protected:
         capture_state().flavour.Forget();
     }
     int Set(unsigned dump_video = 0, unsigned dump_audio = 0, unsigned follow = 0) {
-        return set_video_resolution_support_more(1280, 720, 5, 4, 23, dump_video, dump_audio, follow, 25);
+        return set_video_resolution_support_more(1280, 720, 5, 4, 23, dump_video, dump_audio,
+                                                 follow, 25);
     }
     platform::fake::FakePlatform fake;
 };
@@ -38,11 +39,11 @@ TEST_F(ResolutionRulesTest, TableOfAcceptedSizes) {
         int code;
     };
     const Case cases[] = {
-        {640, 480, "android", 3},  {720, 576, "android", 0},   {320, 240, "android", 1},
-        {480, 320, "android", 5},  {1280, 720, "android", 12}, {720, 480, "android", 2},
-        {720, 400, "android", 9},  {320, 176, "android", 11},  {640, 368, "android", 10},
-        {1920, 1080, "android", 13}, {1920, 1080, "tarvo", -1}, {1920, 1080, "tarvo2x", -1},
-        {1920, 1080, "tarv", 13},  {640, 360, "android", -1},  {480, 640, "android", -1},
+        {640, 480, "android", 3},    {720, 576, "android", 0},   {320, 240, "android", 1},
+        {480, 320, "android", 5},    {1280, 720, "android", 12}, {720, 480, "android", 2},
+        {720, 400, "android", 9},    {320, 176, "android", 11},  {640, 368, "android", 10},
+        {1920, 1080, "android", 13}, {1920, 1080, "tarvo", -1},  {1920, 1080, "tarvo2x", -1},
+        {1920, 1080, "tarv", 13},    {640, 360, "android", -1},  {480, 640, "android", -1},
         {1280, 720, "tarvo", 12},
     };
     for (const Case& c : cases) {
@@ -125,8 +126,9 @@ TEST_F(ResolutionRulesTest, PipListenerOnlyOnTheSaFlavour) {
         bool registered = c.calls.size() == 2;
         EXPECT_EQ(g_pip_stop_flag.load(), registered ? 0u : 1u) << c.flavour;
         auto logs = fake.log.Texts("orvex:::livecamera");
-        bool failed_logged = std::find(logs.begin(), logs.end(),
-                                       "[PipListener]mPipManager_client->setListener failed") != logs.end();
+        bool failed_logged =
+            std::find(logs.begin(), logs.end(),
+                      "[PipListener]mPipManager_client->setListener failed") != logs.end();
         EXPECT_EQ(failed_logged, c.result != 0) << c.flavour;
         closePipManager();
     }

@@ -40,7 +40,7 @@ struct ScriptedAacRecord {
     VO_S32 set_param_id;
     AACENC_PARAM params;
     int set_input_calls;
-    uint32_t input_length_other;  // a SetInputData length other than the block size, or 0
+    uint32_t input_length_other;   // a SetInputData length other than the block size, or 0
     uint8_t input_first_byte[16];  // first byte of each of the first 16 input blocks
     int get_output_calls;
     uint32_t offered_length_other;  // an offered output size other than the block size, or 0

@@ -37,10 +37,12 @@ void FeedSine(int blocks) {
     for (int b = 0; b < blocks; ++b) {
         for (size_t i = 0; i < pcm.size() / 2; ++i) {
             double t = (b * 960 + static_cast<double>(i)) / 48000.0;
-            pcm[2 * i] = pcm[2 * i + 1] = static_cast<int16_t>(8000 * std::sin(2 * M_PI * 1000 * t));
+            pcm[2 * i] = pcm[2 * i + 1] =
+                static_cast<int16_t>(8000 * std::sin(2 * M_PI * 1000 * t));
         }
-        ASSERT_EQ(audio_pcm_ring().write(reinterpret_cast<unsigned char*>(pcm.data()), kPcmBlockBytes),
-                  kPcmBlockBytes);
+        ASSERT_EQ(
+            audio_pcm_ring().write(reinterpret_cast<unsigned char*>(pcm.data()), kPcmBlockBytes),
+            kPcmBlockBytes);
     }
 }
 
@@ -72,9 +74,9 @@ TEST_F(AudioTest, HostEncoderTurnsBlocksIntoAdtsFramesForTheServer) {
         const unsigned char* f = item->data;
         ASSERT_GE(item->length, 7);
         EXPECT_EQ(f[0], 0xFF);
-        EXPECT_EQ(f[1] & 0xF6, 0xF0);           // sync, layer 0
-        EXPECT_EQ((f[2] >> 6) & 3, 1);          // AAC LC
-        EXPECT_EQ((f[2] >> 2) & 0xF, 3);        // 48000 Hz
+        EXPECT_EQ(f[1] & 0xF6, 0xF0);                   // sync, layer 0
+        EXPECT_EQ((f[2] >> 6) & 3, 1);                  // AAC LC
+        EXPECT_EQ((f[2] >> 2) & 0xF, 3);                // 48000 Hz
         EXPECT_EQ(((f[2] & 1) << 2) | (f[3] >> 6), 2);  // stereo
         EXPECT_EQ(((f[3] & 3) << 11) | (f[4] << 3) | (f[5] >> 5), item->length);
         ++frames;
@@ -101,7 +103,8 @@ TEST_F(AudioTest, PcmThreadSetUpFailures) {
         std::atomic<int> run{1};
         ::testing::internal::CaptureStdout();
         EXPECT_EQ(audio_output_pcm(&run), 1) << c.inject;
-        EXPECT_NE(::testing::internal::GetCapturedStdout().find(c.printed), std::string::npos) << c.inject;
+        EXPECT_NE(::testing::internal::GetCapturedStdout().find(c.printed), std::string::npos)
+            << c.inject;
     }
     // Sub-window sound on an unknown flavour: nothing is recorded, the sub state stays.
     fake.results.Clear();
@@ -110,7 +113,8 @@ TEST_F(AudioTest, PcmThreadSetUpFailures) {
     std::atomic<int> run{1};
     ::testing::internal::CaptureStdout();
     EXPECT_EQ(audio_output_pcm(&run), 1);
-    EXPECT_NE(::testing::internal::GetCapturedStdout().find("get property kelvo.build.kelvotv failed[0].\n"),
+    EXPECT_NE(::testing::internal::GetCapturedStdout().find(
+                  "get property kelvo.build.kelvotv failed[0].\n"),
               std::string::npos);
     for (const std::string& call : fake.journal.Calls()) EXPECT_NE(call, "AudioRecord::start");
     EXPECT_TRUE(Global_Config::instance()->isSub());
@@ -192,7 +196,8 @@ TEST(DumpFileTest, InternalDumpStartsOverPastItsLimitExternalNever) {
     std::string internal = dir + "_in", external = dir + "_ex";
     std::atomic<bool> say{true};
     DumpFile dump("orvex:::orvexaudiomain", internal, external, 100,
-                  {"open in failed", "open ex failed", "removed", "remove failed", "reopen failed"}, &say);
+                  {"open in failed", "open ex failed", "removed", "remove failed", "reopen failed"},
+                  &say);
     std::vector<unsigned char> block(60, 7);
     for (int i = 0; i < 3; ++i) dump.Write(block.data(), block.size(), false);  // 60, 120, restart
     dump.Close();

@@ -32,12 +32,21 @@ TEST_F(PipTest, EventsRaiseStopAndFastQuitClearsFollowMain) {
         std::vector<std::string> logs;
     };
     const Case cases[] = {
-        {"unsupported", {1}, 1, 1,
+        {"unsupported",
+         {1},
+         1,
+         1,
          {"PipListener::dataCallback ----->EV_TRAVELING_CALLBACK_UNSUPPORT"}},
         {"other type ignored", {2}, 0, 1, {}},
-        {"fast quit", {3}, 1, 0,
+        {"fast quit",
+         {3},
+         1,
+         0,
          {"PipListener::dataCallback ----->EV_TRAVELING_CALLBACK_TVOS_FAST_QUIT"}},
-        {"fast quit after unsupported", {1, 3}, 1, 0,
+        {"fast quit after unsupported",
+         {1, 3},
+         1,
+         0,
          {"PipListener::dataCallback ----->EV_TRAVELING_CALLBACK_UNSUPPORT",
           "PipListener::dataCallback ----->EV_TRAVELING_CALLBACK_TVOS_FAST_QUIT"}},
     };
@@ -85,10 +94,9 @@ TEST_F(PipTest, ListenerRegisteredThroughTheClientReceivesPlatformEvents) {
     EXPECT_EQ(g_pip_stop_flag.load(), 1u);
 }
 
-
 TEST_F(PipTest, FlavourPropertyIsExactAndUnknownIsLookedUpAgain) {
     const std::pair<const char*, PlatformFlavour> cases[] = {
-        {"sa", kFlavourSa}, {"px", kFlavourPx}, {"dqx", kFlavourDqx},
+        {"sa", kFlavourSa},      {"px", kFlavourPx},    {"dqx", kFlavourDqx},
         {"SA", kFlavourUnknown}, {"", kFlavourUnknown}, {"sa ", kFlavourUnknown}};
     for (const auto& c : cases) {
         fake.properties.Set("kelvo.build.kelvotv", c.first);

@@ -16,10 +16,18 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     bs_init(&s, data + 1, static_cast<unsigned>(size - 1));
     for (size_t i = 0; i < 4 * size + 64; ++i) {
         switch ((data[0] >> (2 * (i % 4))) & 3) {
-            case 0: bs_read_ue(&s); break;
-            case 1: bs_read_se(&s); break;
-            case 2: bs_read(&s, static_cast<int>(i % 33)); break;
-            default: bs_read1(&s); break;
+            case 0:
+                bs_read_ue(&s);
+                break;
+            case 1:
+                bs_read_se(&s);
+                break;
+            case 2:
+                bs_read(&s, static_cast<int>(i % 33));
+                break;
+            default:
+                bs_read1(&s);
+                break;
         }
         if (s.p < s.p_start || s.p > s.p_end) __builtin_trap();
     }

@@ -42,8 +42,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     g_url_check_switch = (data[0] & 4) != 0;
     std::string url(reinterpret_cast<const char*>(data + 1), size - 1);
     std::string request = "DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 2\r\n" +
-                          "Accept: application/sdp\r\n\r\n" +
-                          "SETUP " + url + " RTSP/1.0\r\nCSeq: 3\r\n" +
+                          "Accept: application/sdp\r\n\r\n" + "SETUP " + url +
+                          " RTSP/1.0\r\nCSeq: 3\r\n" +
                           "Transport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n";
     int fds[2];
     if (socketpair(AF_UNIX, SOCK_STREAM, 0, fds) != 0) return 0;

@@ -26,12 +26,24 @@ void Extract(RtspResponse& r) {
     r.GetRequestTransportintleaved(&a, &b);
     r.SearchRequests(&s, "Session");
     switch (type) {
-        case kRtspOptions: r.ResponseOptions(); break;
-        case kRtspDescribe: r.ResponseDescribe(s.c_str(), static_cast<unsigned>(s.size())); break;
-        case kRtspSetup: r.ResponseSetup(nullptr, 8000, nullptr, a, 1); break;
-        case kRtspPlay: r.ResponsePlay(s.c_str()); break;
-        case kRtspTeardown: r.ResponseTeardown(); break;
-        default: r.ResponseError(s.c_str()); break;
+        case kRtspOptions:
+            r.ResponseOptions();
+            break;
+        case kRtspDescribe:
+            r.ResponseDescribe(s.c_str(), static_cast<unsigned>(s.size()));
+            break;
+        case kRtspSetup:
+            r.ResponseSetup(nullptr, 8000, nullptr, a, 1);
+            break;
+        case kRtspPlay:
+            r.ResponsePlay(s.c_str());
+            break;
+        case kRtspTeardown:
+            r.ResponseTeardown();
+            break;
+        default:
+            r.ResponseError(s.c_str());
+            break;
     }
 }
 

@@ -14,7 +14,6 @@ std::string Content(const Buffer& b) {
 }
 const unsigned char* U(const char* s) { return reinterpret_cast<const unsigned char*>(s); }
 
-
 TEST(BufferTest, AppendGrowsToExactlyWhatIsNeededAndKeepsContent) {
     Buffer b;
     ASSERT_TRUE(b.AppendData(U("abc"), 3));

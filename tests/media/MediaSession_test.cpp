@@ -80,8 +80,9 @@ TEST_F(MediaModelTest, TransportNeedsInitAndSetupBeforeStart) {
 std::string H264Section(const std::string& sps, bool control) {
     return "m=video 0 RTP/AVP 96\r\n"
            "a=rtpmap:96 H264/90000\r\n"
-           "a=fmtp:96 profile-level-id=42401E; sprop-parameter-sets=" + sps +
-           ",aMpDiA==; packetization-mode=1;\r\n" + (control ? "a=control:trackID=1\r\n" : "");
+           "a=fmtp:96 profile-level-id=42401E; sprop-parameter-sets=" +
+           sps + ",aMpDiA==; packetization-mode=1;\r\n" +
+           (control ? "a=control:trackID=1\r\n" : "");
 }
 
 TEST_F(MediaModelTest, SdpGoldenTextPerCaptureWidth) {
@@ -123,11 +124,12 @@ TEST_F(MediaModelTest, AacConfigAndFrequencyIndexThresholds) {
     EXPECT_EQ(MediaStreamMP4A::ConfigString(48000, 1), "1188");
     EXPECT_EQ(MediaStreamMP4A::ConfigString(8000, 2), "1590");
     const std::pair<int, int> cases[] = {
-        {96000, 0}, {95000, 0}, {94999, 1}, {87200, 1}, {87199, 2}, {63000, 2}, {62999, 3},
-        {47000, 3}, {46999, 4}, {43100, 4}, {43099, 5}, {31000, 5}, {30999, 6}, {23000, 6},
-        {22999, 7}, {21050, 7}, {21049, 8}, {15000, 8}, {14999, 9}, {11000, 9}, {10999, 10},
+        {96000, 0},  {95000, 0},  {94999, 1}, {87200, 1}, {87199, 2},  {63000, 2}, {62999, 3},
+        {47000, 3},  {46999, 4},  {43100, 4}, {43099, 5}, {31000, 5},  {30999, 6}, {23000, 6},
+        {22999, 7},  {21050, 7},  {21049, 8}, {15000, 8}, {14999, 9},  {11000, 9}, {10999, 10},
         {10025, 10}, {10024, 11}, {7000, 11}, {6999, 12}, {-1000, 12}, {-1001, 15}};
-    for (const auto& c : cases) EXPECT_EQ(MediaStreamMP4A::FrequencyIndex(c.first), c.second) << c.first;
+    for (const auto& c : cases)
+        EXPECT_EQ(MediaStreamMP4A::FrequencyIndex(c.first), c.second) << c.first;
 }
 
 // The track's own packetisers, into a loopback receiver.
@@ -203,23 +205,33 @@ protected:
 // Packets of 20 bytes: NAL units up to 8 bytes go whole, larger ones in FU-A pieces of 6.
 TEST_F(TrackPacketiserTest, H264BytesOnTheWire) {
     const Case cases[] = {
-        {"one unit, forbidden bit kept, marker on the last unit", "00 00 01 e5 01 02 03",
-         {"80 e0 0000 01020304 00000000 e5 01 02 03"}, 4},
+        {"one unit, forbidden bit kept, marker on the last unit",
+         "00 00 01 e5 01 02 03",
+         {"80 e0 0000 01020304 00000000 e5 01 02 03"},
+         4},
         {"SPS and PPS skipped; 4-byte codes end the unit before the extra zero",
          "00 00 00 01 67 aa bb 00 00 00 01 68 cc dd 00 00 00 01 41 01 02",
-         {"80 e0 0000 01020304 00000000 41 01 02"}, 3},
-        {"two units: marker on the second only", "00 00 01 41 0a 0b 00 00 01 41 0c 0d",
-         {"80 60 0000 01020304 00000000 41 0a 0b", "80 e0 0001 01020304 00000000 41 0c 0d"}, 6},
+         {"80 e0 0000 01020304 00000000 41 01 02"},
+         3},
+        {"two units: marker on the second only",
+         "00 00 01 41 0a 0b 00 00 01 41 0c 0d",
+         {"80 60 0000 01020304 00000000 41 0a 0b", "80 e0 0001 01020304 00000000 41 0c 0d"},
+         6},
         {"a unit under 5 bytes with its code is skipped; leading bytes ignored",
-         "aa bb 00 00 01 41 00 00 01 41 0c", {"80 e0 0000 01020304 00000000 41 0c"}, 2},
-        {"the largest single unit", "00 00 01 41 01 02 03 04 05 06 07",
-         {"80 e0 0000 01020304 00000000 41 01 02 03 04 05 06 07"}, 8},
+         "aa bb 00 00 01 41 00 00 01 41 0c",
+         {"80 e0 0000 01020304 00000000 41 0c"},
+         2},
+        {"the largest single unit",
+         "00 00 01 41 01 02 03 04 05 06 07",
+         {"80 e0 0000 01020304 00000000 41 01 02 03 04 05 06 07"},
+         8},
         {"one byte over: two fragments, the F bit kept in the indicator",
          "00 00 01 e5 01 02 03 04 05 06 07 08",
          {"80 60 0000 01020304 00000000 fc 85 01 02 03 04 05 06",
           "80 e0 0001 01020304 00000000 fc 45 07 08"},
          12},
-        {"three fragments, the last short", "00 00 01 65 01 02 03 04 05 06 07 08 09 0a 0b 0c 0d",
+        {"three fragments, the last short",
+         "00 00 01 65 01 02 03 04 05 06 07 08 09 0a 0b 0c 0d",
          {"80 60 0000 01020304 00000000 7c 85 01 02 03 04 05 06",
           "80 60 0001 01020304 00000000 7c 05 07 08 09 0a 0b 0c",
           "80 e0 0002 01020304 00000000 7c 45 0d"},
@@ -262,12 +274,18 @@ TEST_F(TrackPacketiserTest, AacBytesOnTheWire) {
          {"80 61 0000 01020304 00000000 0010 0030 01 02 03 04",
           "80 e1 0001 01020304 00000000 0010 0030 05 06"},
          14},
-        {"CRC: two more header bytes skipped", "ff f0 4c 80 01 bf fc c1 c2 01 02 03 04",
-         {"80 e1 0000 01020304 00000000 0010 0020 01 02 03 04"}, 8},
-        {"the ADTS length beyond the data is cut to it", "ff f1 4c 80 02 1f fc 01 02 03",
-         {"80 e1 0000 01020304 00000000 0010 0018 01 02 03"}, 7},
-        {"bytes after the ADTS length are not sent", "ff f1 4c 80 01 1f fc 01 02 03",
-         {"80 e1 0000 01020304 00000000 0010 0008 01"}, 5},
+        {"CRC: two more header bytes skipped",
+         "ff f0 4c 80 01 bf fc c1 c2 01 02 03 04",
+         {"80 e1 0000 01020304 00000000 0010 0020 01 02 03 04"},
+         8},
+        {"the ADTS length beyond the data is cut to it",
+         "ff f1 4c 80 02 1f fc 01 02 03",
+         {"80 e1 0000 01020304 00000000 0010 0018 01 02 03"},
+         7},
+        {"bytes after the ADTS length are not sent",
+         "ff f1 4c 80 01 1f fc 01 02 03",
+         {"80 e1 0000 01020304 00000000 0010 0008 01"},
+         5},
         {"header only", "ff f1 4c 80 00 ff fc", {}, 0},
         {"shorter than a header", "ff f1 4c 80 00 ff", {}, 0},
     };

@@ -36,8 +36,9 @@ TEST_F(CycleBufferTest, RawWriteFitsExactlyAndRefusesOneByteMore) {
     auto data = Bytes(16, 1);
     EXPECT_EQ(ring.write(data.data(), 16), 0);
     EXPECT_EQ(ring.used_space(), 0u);
-    EXPECT_EQ(fake.log.Texts(kTag), (std::vector<std::string>{
-        "\n cycle_buffer::write:free_space_size < len free_space_size:15,len:16,\n"}));
+    EXPECT_EQ(fake.log.Texts(kTag),
+              (std::vector<std::string>{
+                  "\n cycle_buffer::write:free_space_size < len free_space_size:15,len:16,\n"}));
     EXPECT_EQ(ring.write(data.data(), 15), 15);
     EXPECT_EQ(ring.free_space(), 0u);
     EXPECT_EQ(ring.used_space(), 15u);
@@ -147,7 +148,6 @@ TEST_F(CycleBufferTest, TimestampZeroIsStampedWithMonotonicMilliseconds) {
     EXPECT_LE(item->timestamp - before, after - before);  // within [before, after], wrap-safe
 }
 
-
 // A producer and a consumer thread move 100 MB of random-sized items; every byte, length and
 // time stamp is checked, in order.
 TEST_F(CycleBufferTest, ProducerAndConsumerMove100MegabytesIntact) {
@@ -156,7 +156,8 @@ TEST_F(CycleBufferTest, ProducerAndConsumerMove100MegabytesIntact) {
     cycle_buffer ring(500000);
     // Item i carries the pattern from offset i % 251, so the consumer can check it cheaply.
     std::vector<unsigned char> pattern(kMaxItem + 256);
-    for (size_t i = 0; i < pattern.size(); ++i) pattern[i] = static_cast<unsigned char>(i * 131 + (i >> 8));
+    for (size_t i = 0; i < pattern.size(); ++i)
+        pattern[i] = static_cast<unsigned char>(i * 131 + (i >> 8));
 
     std::vector<int> sizes;
     std::mt19937 rng(12345);

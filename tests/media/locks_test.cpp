@@ -37,5 +37,4 @@ TYPED_TEST(LockTest, DestructorWaitsForHolder) {
     holder.join();
 }
 
-
 }  // namespace

@@ -51,9 +51,7 @@ private:
     std::vector<Received> got_;
 };
 
-Bytes Le32(uint32_t v) {
-    return {uint8_t(v), uint8_t(v >> 8), uint8_t(v >> 16), uint8_t(v >> 24)};
-}
+Bytes Le32(uint32_t v) { return {uint8_t(v), uint8_t(v >> 8), uint8_t(v >> 16), uint8_t(v >> 24)}; }
 
 Bytes Cat(std::initializer_list<Bytes> parts) {
     Bytes out;
@@ -156,13 +154,19 @@ TEST_F(HostBinderTest, BadPeersGetAnErrorAndTheServiceGoesOn) {
         std::vector<int32_t> statuses;
         std::vector<Received> recorded;
     } cases[] = {
-        {"two in one write", Cat({Le32(101), Le32(0x11), Le32(4), abcd, Le32(0), Le32(0), Le32(0)}),
-         true, {0, 0}, {{101, 0x11, abcd}, {0, 0, {}}}},
+        {"two in one write",
+         Cat({Le32(101), Le32(0x11), Le32(4), abcd, Le32(0), Le32(0), Le32(0)}),
+         true,
+         {0, 0},
+         {{101, 0x11, abcd}, {0, 0, {}}}},
         {"lying size", Cat({Le32(101), Le32(0), Le32(100), abcd}), true, {}, {}},
         {"truncated header", Cat({Le32(101), {0, 0, 0}}), true, {}, {}},
         {"size over the limit", Cat({Le32(101), Le32(0), Le32((16u << 20) + 1)}), false, {-22}, {}},
-        {"garbage", Bytes(std::begin("GET / HTTP/1.0\r\n\r\n"), std::end("GET / HTTP/1.0\r\n\r\n")),
-         false, {-22}, {}},
+        {"garbage",
+         Bytes(std::begin("GET / HTTP/1.0\r\n\r\n"), std::end("GET / HTTP/1.0\r\n\r\n")),
+         false,
+         {-22},
+         {}},
         {"unknown code", Cat({Le32(2), Le32(0), Le32(0)}), true, {-74}, {{2, 0, {}}}},
     };
     ParcelWriter probe;
@@ -227,8 +231,6 @@ TEST_F(HostBinderTest, NobodyListeningIsANegativeStatus) {
     }
 }
 
-
-
 // The units one call gives, and the same input fed in chunks as orvex-feed reads it.
 std::vector<Bytes> Split(const Bytes& in, size_t chunk) {
     std::vector<Bytes> units;
@@ -259,17 +261,23 @@ TEST(AccessUnitSplitterTest, SplitsAtPictureBoundaries) {
         Bytes in;
         std::vector<Bytes> units;
     } cases[] = {
-        {"sps pps idr p p", Cat({sc4, sps, sc4, pps, sc4, idr, sc4, p1, sc4, p2}),
+        {"sps pps idr p p",
+         Cat({sc4, sps, sc4, pps, sc4, idr, sc4, p1, sc4, p2}),
          {Cat({sc4, sps, sc4, pps, sc4, idr}), Cat({sc4, p1}), Cat({sc4, p2})}},
-        {"3-byte start codes", Cat({sc3, sps, sc3, pps, sc4, idr, sc3, p1}),
+        {"3-byte start codes",
+         Cat({sc3, sps, sc3, pps, sc4, idr, sc3, p1}),
          {Cat({sc4, sps, sc4, pps, sc4, idr}), Cat({sc4, p1})}},
-        {"aud splits", Cat({sc4, aud, sc4, p1, sc4, aud, sc3, sei, sc4, p2}),
+        {"aud splits",
+         Cat({sc4, aud, sc4, p1, sc4, aud, sc3, sei, sc4, p2}),
          {Cat({sc4, aud, sc4, p1}), Cat({sc4, aud, sc4, sei, sc4, p2})}},
-        {"two slices, one picture", Cat({sc4, idr, sc4, idr_part2, sc4, p1}),
+        {"two slices, one picture",
+         Cat({sc4, idr, sc4, idr_part2, sc4, p1}),
          {Cat({sc4, idr, sc4, idr_part2}), Cat({sc4, p1})}},
-        {"sei after a slice", Cat({sc4, p1, sc4, sei, sc4, p2}),
+        {"sei after a slice",
+         Cat({sc4, p1, sc4, sei, sc4, p2}),
          {Cat({sc4, p1}), Cat({sc4, sei, sc4, p2})}},
-        {"garbage and trailing zeros", Cat({{0xff, 0x01}, sc3, p1, {0, 0, 0}, sc4, p2, {0, 0}}),
+        {"garbage and trailing zeros",
+         Cat({{0xff, 0x01}, sc3, p1, {0, 0, 0}, sc4, p2, {0, 0}}),
          {Cat({sc4, p1}), Cat({sc4, p2})}},
         {"empty nal units", Cat({sc4, sc3, p1, sc4}), {Cat({sc4, p1})}},
         {"no start code", {0x65, 0x88, 0, 0}, {}},

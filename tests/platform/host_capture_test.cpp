@@ -154,9 +154,8 @@ TEST_F(HostCaptureTest, UnknownValuesAreReportedAndTheDefaultIsUsed) {
     EXPECT_EQ(platform::host::ChooseVideoSource(true).kind, SourceChoice::kX11);
     EXPECT_EQ(platform::host::ChooseAudioSource().kind, SourceChoice::kTone);
     EXPECT_EQ(log_.Texts(kTag),
-              (std::vector<std::string>{
-                  "orvex.host.video: unknown value \"webcam\", using pattern",
-                  "orvex.host.audio: unknown value \"mic\", using tone"}));
+              (std::vector<std::string>{"orvex.host.video: unknown value \"webcam\", using pattern",
+                                        "orvex.host.audio: unknown value \"mic\", using tone"}));
 }
 
 // Luma of the picture at (x, y).
@@ -173,14 +172,14 @@ TEST_F(HostCaptureTest, FramesHaveTheAskedSizeRateAndBordersKeepingTheAspect) {
     };
     const Case cases[] = {
         // 4:3 into 16:9: bars left and right.
-        {"videotestsrc pattern=white ! video/x-raw,width=320,height=240,framerate=25/1", 640,
-         360, 30, true, false},
+        {"videotestsrc pattern=white ! video/x-raw,width=320,height=240,framerate=25/1", 640, 360,
+         30, true, false},
         // 16:9 into 4:3: bars above and below.
-        {"videotestsrc pattern=white ! video/x-raw,width=640,height=360,framerate=60/1", 320,
-         240, 15, false, true},
+        {"videotestsrc pattern=white ! video/x-raw,width=640,height=360,framerate=60/1", 320, 240,
+         15, false, true},
         // Same aspect, larger: no bars.
-        {"videotestsrc pattern=white ! video/x-raw,width=160,height=90,framerate=30/1", 1280,
-         720, 30, false, false},
+        {"videotestsrc pattern=white ! video/x-raw,width=160,height=90,framerate=30/1", 1280, 720,
+         30, false, false},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.source);
@@ -188,15 +187,15 @@ TEST_F(HostCaptureTest, FramesHaveTheAskedSizeRateAndBordersKeepingTheAspect) {
         ASSERT_TRUE(platform::host::ParseVideoSource(std::string("gst:") + c.source, &source));
         GstSource live;
         std::string error;
-        ASSERT_TRUE(live.start(platform::host::VideoPipeline(source, c.width, c.height, c.fps),
-                               &error))
+        ASSERT_TRUE(
+            live.start(platform::host::VideoPipeline(source, c.width, c.height, c.fps), &error))
             << error;
         std::vector<uint8_t> picture(static_cast<size_t>(c.width) * c.height * 3 / 2, 0);
         // Frames are stamped on the asked rate's grid.
         const uint64_t period = 1000000000u / c.fps;
         for (int n = 0; n < 3; ++n) {
-            ASSERT_TRUE(WaitFor([&] { return live.latestFrame(picture.data(), c.width,
-                                                               c.height); }));
+            ASSERT_TRUE(
+                WaitFor([&] { return live.latestFrame(picture.data(), c.width, c.height); }));
             uint64_t pts = live.lastFrameTimeNs();
             uint64_t off = pts % period;
             EXPECT_TRUE(off < 1000 || period - off < 1000) << pts << " ns";
@@ -251,8 +250,9 @@ TEST_F(HostCaptureTest, SourcesThatCannotStartFailPrepareWithOneLine) {
         {"gst:nosuchelement ! videoconvert",
          "MediaRecorder: video source gst:nosuchelement ! videoconvert cannot start: "
          "no element \"nosuchelement\""},
-        {"gst:videotestsrc ! ! fakesink", "MediaRecorder: video source gst:videotestsrc ! ! "
-                                          "fakesink cannot start: "},
+        {"gst:videotestsrc ! ! fakesink",
+         "MediaRecorder: video source gst:videotestsrc ! ! "
+         "fakesink cannot start: "},
         {"x11::4711", "MediaRecorder: video source x11::4711 cannot start: "},
         {"v4l2:/dev/orvex-no-such-camera",
          "MediaRecorder: video source v4l2:/dev/orvex-no-such-camera cannot start: "},
@@ -334,10 +334,10 @@ TEST_F(HostCaptureTest, SoundSourceEndingMidStreamIsReportedOnceAndSilenceFollow
     }
     record->stop();
     EXPECT_EQ(silent_blocks, 5u);
-    EXPECT_EQ(Lines("stopped"), (std::vector<std::string>{
-                                    "AudioRecord: audio source gst:audiotestsrc num-buffers=3 "
-                                    "volume=0.5 stopped: end of stream; silence until the next "
-                                    "start"}));
+    EXPECT_EQ(Lines("stopped"),
+              (std::vector<std::string>{"AudioRecord: audio source gst:audiotestsrc num-buffers=3 "
+                                        "volume=0.5 stopped: end of stream; silence until the next "
+                                        "start"}));
 }
 
 TEST_F(HostCaptureTest, TheSubWindowTakesItsOwnSource) {

@@ -110,13 +110,12 @@ TEST(HostLogTest, FileSinkWritesLogcatLinesOnePerTextLine) {
         ASSERT_TRUE(std::regex_match(l, m, line)) << l;
         got.push_back(m[1].str() + " " + m[2].str() + ": " + m[3].str());
     }
-    EXPECT_EQ(got, (std::vector<std::string>{
-                       "D orvex:::cycle_buffer:  first line", "D orvex:::cycle_buffer: second",
-                       "E orvex:::RtspSession: set reuse rtsp address wrong x",
-                       "D globalconfig: "}));
+    EXPECT_EQ(got,
+              (std::vector<std::string>{
+                  "D orvex:::cycle_buffer:  first line", "D orvex:::cycle_buffer: second",
+                  "E orvex:::RtspSession: set reuse rtsp address wrong x", "D globalconfig: "}));
     unlink(path.c_str());
 }
-
 
 // The default ports read the property file named by the environment and log where it says.
 TEST(HostPlatformTest, DefaultPortsFollowThePropertyFile) {

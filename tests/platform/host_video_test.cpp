@@ -15,8 +15,8 @@
 #include "platform/Ports.h"
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
-#include "rtp/h264_sps.h"
 #include "platform/host/video/TestPattern.h"
+#include "rtp/h264_sps.h"
 
 namespace {
 
@@ -107,8 +107,8 @@ protected:
     // took, each checked to be a well-formed parcel to "orvex.rtp".
     std::vector<Bytes> Record(int ms) {
         auto camera = HostCameraPort().connect(0, "", -1, -1);
-        recorder_ = std::dynamic_pointer_cast<HostMediaRecorder>(
-            HostMediaRecorderPort().create("orvex"));
+        recorder_ =
+            std::dynamic_pointer_cast<HostMediaRecorder>(HostMediaRecorderPort().create("orvex"));
         EXPECT_TRUE(camera && recorder_);
         if (!camera || !recorder_) return {};
         EXPECT_EQ(Configure(*recorder_, static_cast<HostCamera&>(*camera), 320, 240, 30), 0);
@@ -167,7 +167,6 @@ TEST_F(HostVideoRecorderTest, RefusesWrongOrderAndWrongSettings) {
     EXPECT_NE(r.start(), 0);
 }
 
-
 TEST_F(HostVideoRecorderTest, DeliversEveryFrameAsOneAnnexBBuffer) {
     std::vector<Bytes> frames = Record(500);
     ASSERT_GE(frames.size(), 5u) << "about 15 expected";
@@ -190,8 +189,8 @@ TEST_F(HostVideoRecorderTest, EncoderSpsParsesToThePictureSize) {
     ASSERT_FALSE(frames.empty());
     const Bytes& key = frames[0];
     size_t next = 4;
-    while (next + 4 <= key.size() && !(key[next] == 0 && key[next + 1] == 0 && key[next + 2] == 0 &&
-                                       key[next + 3] == 1)) {
+    while (next + 4 <= key.size() &&
+           !(key[next] == 0 && key[next + 1] == 0 && key[next + 2] == 0 && key[next + 3] == 1)) {
         ++next;
     }
     ASSERT_EQ(key[4] & 0x1F, 7);
@@ -245,9 +244,10 @@ TEST_F(HostVideoRecorderTest, FfprobeReadsTheStreamAsBaselineH264) {
         std::ofstream out(path, std::ios::binary | std::ios::trunc);
         for (const Bytes& f : frames) out.write(reinterpret_cast<const char*>(f.data()), f.size());
     }
-    std::string cmd = "ffprobe -v error -count_frames -show_entries "
-                      "stream=codec_name,width,height,profile,nb_read_frames -of default=nw=1 '" +
-                      path + "' 2>&1";
+    std::string cmd =
+        "ffprobe -v error -count_frames -show_entries "
+        "stream=codec_name,width,height,profile,nb_read_frames -of default=nw=1 '" +
+        path + "' 2>&1";
     std::string report;
     if (FILE* p = popen(cmd.c_str(), "r")) {
         char buf[256];
@@ -270,9 +270,8 @@ TEST(HostVideoPatternTest, FlashSquareFollowsTheHostClock) {
     struct Case {
         uint64_t ms;
         bool white;
-    } cases[] = {{0, true},       {99, true},       {100, false},    {999, false},
-                 {1000, true},    {1050, true},     {123456, false}, {7000099, true},
-                 {7000100, false}};
+    } cases[] = {{0, true},    {99, true},      {100, false},    {999, false},    {1000, true},
+                 {1050, true}, {123456, false}, {7000099, true}, {7000100, false}};
     for (auto [w, h] : {std::pair{320, 240}, std::pair{1280, 720}, std::pair{34, 18}}) {
         TestPattern pattern(w, h);
         Bytes frame(pattern.frameSize());
@@ -295,6 +294,5 @@ TEST(HostVideoPatternTest, FlashSquareFollowsTheHostClock) {
         }
     }
 }
-
 
 }  // namespace

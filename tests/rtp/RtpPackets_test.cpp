@@ -26,9 +26,9 @@ TEST(H264PacketiserTest, SizesFlagsAndPayloadOfSingleAndFragmentedUnits) {
         std::vector<unsigned> sizes;  // packet sizes
     };
     const Case cases[] = {
-        {2, {14}},                    // header + one byte
-        {1400, {1412}},               // the largest single NAL unit packet
-        {1401, {1414, 14}},           // last fragment: indicator and header, no payload
+        {2, {14}},           // header + one byte
+        {1400, {1412}},      // the largest single NAL unit packet
+        {1401, {1414, 14}},  // last fragment: indicator and header, no payload
         {2800, {1414, 1413}},
         {2801, {1414, 1414, 14}},
         {4000, {1414, 1414, 1213}},
@@ -78,14 +78,17 @@ TEST(AacPacketTest, OneAuHeaderAfterTheRtpHeader) {
     for (int i = 0; i < 7; ++i) frame[i] = 0xF0 + i;  // the ADTS header is not sent
     unsigned char packet[kRtpPacketMax];
     ASSERT_EQ(BuildAacPacket(frame.data(), 200, 48000, 65533, packet), 209u);
-    EXPECT_EQ(Bytes(packet, packet + 16),
-              (Bytes{0x80, 0xE2, 0xFF, 0xFD, 0, 0, 0xBB, 0x80, 0, 0, 0, 10, 0x00, 0x10, 0x06, 0x08}));
+    EXPECT_EQ(Bytes(packet, packet + 16), (Bytes{0x80, 0xE2, 0xFF, 0xFD, 0, 0, 0xBB, 0x80, 0, 0, 0,
+                                                 10, 0x00, 0x10, 0x06, 0x08}));
     EXPECT_EQ(packet[16], 0x5A);
     EXPECT_EQ(packet[208], 0x5A);
 
     Bytes largest(7 + 1484, 1), too_large(7 + 1485, 1);
-    EXPECT_EQ(BuildAacPacket(largest.data(), static_cast<unsigned>(largest.size()), 0, 0, packet), 1500u);
-    EXPECT_EQ(BuildAacPacket(too_large.data(), static_cast<unsigned>(too_large.size()), 0, 0, packet), 0u);
+    EXPECT_EQ(BuildAacPacket(largest.data(), static_cast<unsigned>(largest.size()), 0, 0, packet),
+              1500u);
+    EXPECT_EQ(
+        BuildAacPacket(too_large.data(), static_cast<unsigned>(too_large.size()), 0, 0, packet),
+        0u);
     EXPECT_EQ(BuildAacPacket(frame.data(), 6, 0, 0, packet), 0u);
     EXPECT_EQ(BuildAacPacket(frame.data(), 7, 0, 0, packet), 16u);  // empty access unit
 }

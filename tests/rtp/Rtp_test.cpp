@@ -29,8 +29,8 @@ TEST(RtpTest, HeaderBytesForMarkerAndPayloadType) {
         unsigned char pt;
         unsigned char byte1;
     };
-    const Case cases[] = {{1, 96, 0xE0}, {0, 96, 0x60}, {0, 98, 0x62},
-                          {5, 0, 0x80}, {0, 200, 0xC8}, {1, 200, 0xC8}};
+    const Case cases[] = {{1, 96, 0xE0}, {0, 96, 0x60},  {0, 98, 0x62},
+                          {5, 0, 0x80},  {0, 200, 0xC8}, {1, 200, 0xC8}};
     for (const Case& c : cases) {
         Rtp rtp(1500);
         unsigned char payload[3] = {1, 2, 3};
@@ -63,7 +63,11 @@ protected:
         ASSERT_TRUE(sender.Open("127.0.0.1", 0));
         ASSERT_TRUE(sender.Connect("127.0.0.1", BoundPort(receiver)));
     }
-    void SendRaw(const Bytes& b) { ASSERT_EQ(sender.Socket::Write(const_cast<unsigned char*>(b.data()), static_cast<int>(b.size()), 0), static_cast<int>(b.size())); }
+    void SendRaw(const Bytes& b) {
+        ASSERT_EQ(sender.Socket::Write(const_cast<unsigned char*>(b.data()),
+                                       static_cast<int>(b.size()), 0),
+                  static_cast<int>(b.size()));
+    }
     Rtp receiver{1500};
     Rtp sender{1500};
 };

@@ -31,8 +31,8 @@ TEST(H264SendStateTest, PositionZeroAtTheThirdItemThenEvery21st) {
 TEST(H264SendStateTest, AfterAPauseSendingRestartsAtAPositionZeroItem) {
     const std::pair<std::vector<int>, std::string> cases[] = {
         {{}, "SSSSS"},
-        {{1}, "--SSS"},                          // item 3 is the first position 0
-        {{2, 3}, "S----------------------S"},    // item 3 was paused; next zero is 24
+        {{1}, "--SSS"},                        // item 3 is the first position 0
+        {{2, 3}, "S----------------------S"},  // item 3 was paused; next zero is 24
         {{24}, "SSSSSSSSSSSSSSSSSSSSSSS---------------------S"},
     };
     for (const auto& c : cases) {
@@ -48,7 +48,7 @@ TEST(H264SendStateTest, VideoWaitsWhen251MsAheadAfterTwoItems) {
     s.AfterSend(&seq);
     EXPECT_FALSE(s.MustWaitForAudio(1250, 1000));
     EXPECT_TRUE(s.MustWaitForAudio(1251, 1000));
-    EXPECT_FALSE(s.MustWaitForAudio(1000, 4000));      // behind: never waits
+    EXPECT_FALSE(s.MustWaitForAudio(1000, 4000));       // behind: never waits
     EXPECT_TRUE(s.MustWaitForAudio(200, 4294967000u));  // across the 32-bit wrap
     EXPECT_TRUE(s.TakeFirstItem());
     EXPECT_FALSE(s.TakeFirstItem());
@@ -76,11 +76,10 @@ TEST(SendStateTest, TimestampsFollowItemTimes) {
         uint32_t ts;
     };
     const Step steps[] = {
-        {1000, 90000},  // from 0: the whole gap
-        {1000, 90000},  // the same millisecond: the same timestamp
-        {1033, 92970},
-        {1020, 92970},  // time went back: unchanged...
-        {1040, 94770},  // ...and counted from the earlier time
+        {1000, 90000},                 // from 0: the whole gap
+        {1000, 90000},                 // the same millisecond: the same timestamp
+        {1033, 92970}, {1020, 92970},  // time went back: unchanged...
+        {1040, 94770},                 // ...and counted from the earlier time
     };
     uint32_t ts = 0, last = 0;
     for (const Step& s : steps) {

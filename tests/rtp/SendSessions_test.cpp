@@ -138,7 +138,7 @@ TEST_F(SendSessionTest, VideoHoldsWhile251MsAheadOfAudio) {
     EXPECT_EQ(Ts(r.Receive()), 180000u);
     EXPECT_TRUE(r.Receive(150).empty());  // 2000 ms ahead of audio at 0: the item waits
     EXPECT_GT(video_ring.used_space(), 0u);
-    config->set_timestamp(1750, false);   // 250 ms behind: close enough
+    config->set_timestamp(1750, false);  // 250 ms behind: close enough
     EXPECT_EQ(Ts(r.Receive()), 270000u);
 }
 
@@ -167,8 +167,8 @@ TEST_F(SendSessionTest, AudioDropsFramesWhilePausedOrNotReady) {
     config->set_pause_stat(false);
     Feed(audio_ring, AdtsFrame(60), 200);
     Bytes p = r.Receive();
-    ASSERT_EQ(p.size(), 69u);   // the paused frame never went out
-    EXPECT_EQ(Ts(p), 9600u);    // 200 ms at 48 kHz: the dropped frame did not count
+    ASSERT_EQ(p.size(), 69u);  // the paused frame never went out
+    EXPECT_EQ(Ts(p), 9600u);   // 200 ms at 48 kHz: the dropped frame did not count
     EXPECT_EQ(config->get_timestamp(false), 200u);
     EXPECT_EQ(Seq(p), 0);
 }

@@ -57,18 +57,18 @@ Bytes MakeSps(uint32_t profile, uint32_t sps_id, bool vui, uint32_t time_scale, 
     w.Put(30, 8);
     w.Ue(sps_id);
     if (profile >= 100) {
-        w.Ue(1);     // chroma_format_idc
-        w.Ue(0);     // bit depths
+        w.Ue(1);  // chroma_format_idc
+        w.Ue(0);  // bit depths
         w.Ue(0);
         w.Put(0, 1);
         w.Put(0, 1);  // no scaling matrix
     }
-    w.Ue(0);   // log2_max_frame_num_minus4
-    w.Ue(2);   // pic_order_cnt_type
-    w.Ue(1);   // max_num_ref_frames
+    w.Ue(0);  // log2_max_frame_num_minus4
+    w.Ue(2);  // pic_order_cnt_type
+    w.Ue(1);  // max_num_ref_frames
     w.Put(0, 1);
-    w.Ue(39);  // 640
-    w.Ue(29);  // 480
+    w.Ue(39);     // 640
+    w.Ue(29);     // 480
     w.Put(1, 1);  // frame_mbs_only
     w.Put(1, 1);
     w.Put(0, 1);  // no cropping
@@ -108,7 +108,8 @@ TEST(SpsParserTest, ParameterSetsAnnouncedInTheSdpDecode) {
         Bytes nal = FromBase64(c.sps);
         ASSERT_EQ(nal[0] & 0x1F, 7);
         h264_sps_t sps;
-        uint32_t ts = h264_parse_sps(nal.data() + 1, static_cast<unsigned>(nal.size() - 1), 1, &sps);
+        uint32_t ts =
+            h264_parse_sps(nal.data() + 1, static_cast<unsigned>(nal.size() - 1), 1, &sps);
         EXPECT_EQ(sps.profile_idc, 66u) << c.sps;
         EXPECT_EQ(sps.level_idc, 30u);
         EXPECT_EQ(sps.pic_width_in_mbs_minus1 + 1, c.width_mbs) << c.sps;
@@ -143,7 +144,8 @@ TEST(SpsParserTest, ComplaintsAndTimeScaleRules) {
     const Case cases[] = {
         {"sps_id 31 parses", MakeSps(66, 31, true, 50, 0), 1, 50, ""},
         {"sps_id 32 is invalid", MakeSps(66, 32, true, 50, 0), 7, 7, "\ninvalid SPS (sps_id=32)\n"},
-        {"17 reorder frames", MakeSps(66, 0, true, 50, 17), 1, 50, "\nillegal num_reorder_frames 17\n\n"},
+        {"17 reorder frames", MakeSps(66, 0, true, 50, 17), 1, 50,
+         "\nillegal num_reorder_frames 17\n\n"},
         {"no VUI keeps the previous", MakeSps(66, 0, false, 0, 0), 9, 9, ""},
         {"time_scale 0", MakeSps(66, 0, true, 0, 0), 1, 0, ""},
         {"profile 101 reads chroma fields", MakeSps(101, 0, true, 48, 2), 1, 48, ""},
@@ -152,7 +154,8 @@ TEST(SpsParserTest, ComplaintsAndTimeScaleRules) {
     for (const Case& c : cases) {
         h264_sps_t sps;
         ::testing::internal::CaptureStdout();
-        uint32_t got = h264_parse_sps(c.sps.data(), static_cast<unsigned>(c.sps.size()), c.previous, &sps);
+        uint32_t got =
+            h264_parse_sps(c.sps.data(), static_cast<unsigned>(c.sps.size()), c.previous, &sps);
         EXPECT_EQ(::testing::internal::GetCapturedStdout(), c.printed) << c.name;
         EXPECT_EQ(got, c.result) << c.name;
     }
@@ -192,11 +195,11 @@ TEST(SpsParserTest, TruncatedInputReadsZerosAndStaysInBounds) {
     w.Put(0, 16);
     w.Ue(0);
     w.Ue(0);
-    w.Ue(1);                 // pic_order_cnt_type 1
+    w.Ue(1);  // pic_order_cnt_type 1
     w.Put(0, 1);
     w.Ue(0);
     w.Ue(0);
-    w.Ue(4000000000u);       // offset cycle
+    w.Ue(4000000000u);  // offset cycle
     h264_sps_t sps;
     ::testing::internal::CaptureStdout();
     h264_parse_sps(w.bytes.data(), static_cast<unsigned>(w.bytes.size()), 1, &sps);
@@ -205,9 +208,13 @@ TEST(SpsParserTest, TruncatedInputReadsZerosAndStaysInBounds) {
 }
 
 TEST(Base64Test, Rfc4648Vectors) {
-    const std::pair<std::string, std::string> cases[] = {
-        {"", ""}, {"f", "Zg=="}, {"fo", "Zm8="}, {"foo", "Zm9v"},
-        {"foob", "Zm9vYg=="}, {"fooba", "Zm9vYmE="}, {"foobar", "Zm9vYmFy"}};
+    const std::pair<std::string, std::string> cases[] = {{"", ""},
+                                                         {"f", "Zg=="},
+                                                         {"fo", "Zm8="},
+                                                         {"foo", "Zm9v"},
+                                                         {"foob", "Zm9vYg=="},
+                                                         {"fooba", "Zm9vYmE="},
+                                                         {"foobar", "Zm9vYmFy"}};
     for (const auto& c : cases) {
         std::string out = "junk";
         Base64Encode(reinterpret_cast<const unsigned char*>(c.first.data()),

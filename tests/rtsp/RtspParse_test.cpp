@@ -19,11 +19,16 @@ std::unique_ptr<RtspWire> Parsed(const std::string& request_line, const std::str
 
 TEST(RtspParseTest, MethodIsTheFirstWordFoundInFixedOrder) {
     const std::pair<const char*, int> cases[] = {
-        {"OPTIONS rtsp://h/s RTSP/1.0", 1},          {"DESCRIBE rtsp://h/s RTSP/1.0", 2},
-        {"SETUP rtsp://h/s/trackID=1 RTSP/1.0", 8},  {"TEARDOWN rtsp://h/s RTSP/1.0", 64},
-        {"PLAY rtsp://h/s RTSP/1.0", 128},           {"PAUSE rtsp://h/s RTSP/1.0", 256},
-        {"GET_PARAMETER rtsp://h/s RTSP/1.0", 16},   {"PLAY rtsp://h/SETUP RTSP/1.0", 8},
-        {"TEARDOWN rtsp://h/OPTIONS RTSP/1.0", 1},   {"SET_PARAMETER rtsp://h/s RTSP/1.0", 0},
+        {"OPTIONS rtsp://h/s RTSP/1.0", 1},
+        {"DESCRIBE rtsp://h/s RTSP/1.0", 2},
+        {"SETUP rtsp://h/s/trackID=1 RTSP/1.0", 8},
+        {"TEARDOWN rtsp://h/s RTSP/1.0", 64},
+        {"PLAY rtsp://h/s RTSP/1.0", 128},
+        {"PAUSE rtsp://h/s RTSP/1.0", 256},
+        {"GET_PARAMETER rtsp://h/s RTSP/1.0", 16},
+        {"PLAY rtsp://h/SETUP RTSP/1.0", 8},
+        {"TEARDOWN rtsp://h/OPTIONS RTSP/1.0", 1},
+        {"SET_PARAMETER rtsp://h/s RTSP/1.0", 0},
         {"play rtsp://h/s RTSP/1.0", 0},
     };
     for (const auto& c : cases) {
@@ -47,8 +52,8 @@ TEST(RtspParseTest, HeaderLookupIgnoresCaseAndTakesTheFirstLineContainingTheKey)
     const Case cases[] = {
         {"CSeq", "inside"},  // the first line that contains the key wins
         {"user-agent", "client with cseq inside"},
-        {"X:", "   "},       // only blanks left: kept
-        {"RTSP/", "1.0"},    // the request line matches too
+        {"X:", "   "},     // only blanks left: kept
+        {"RTSP/", "1.0"},  // the request line matches too
         {"Missing", "as before"},
     };
     for (const Case& c : cases) {
@@ -71,7 +76,8 @@ TEST(RtspParseTest, UrlPartsTable) {
          "10.0.0.5", "skyvo?width=720", true, "", false},
         {"SETUP rtsp://h:554/skyvo/trackID=1 RTSP/1.0", "rtsp://h:554/skyvo/trackID=1", "h:554", "",
          false, "trackID=1", true},
-        {"SETUP rtsp://h/trackID=0 RTSP/1.0", "rtsp://h/trackID=0", "h", "", false, "trackID=0", true},
+        {"SETUP rtsp://h/trackID=0 RTSP/1.0", "rtsp://h/trackID=0", "h", "", false, "trackID=0",
+         true},
         {"SETUP rtsp://h/skyvo.5?w=1/trackID=2 RTSP/1.0", "rtsp://h/skyvo.5?w=1/trackID=2", "h", "",
          false, "trackID=2", true},
         {"SETUP rtsp://h/skyvo/ RTSP/1.0", "rtsp://h/skyvo/", "h", "skyvo", true, "", true},
@@ -153,16 +159,18 @@ TEST(RtspParseTest, TransportPortsAndChannels) {
 
 TEST(KeyWordValueTest, QueryValuesAreCutAt10CharactersAndMissingKeysFail) {
     platform::fake::FakePlatform fake;
-    const std::string url = "skyvo?width=1920&height=1080&win=allwithoutosd&x=123456789012&e=&cameraid";
+    const std::string url =
+        "skyvo?width=1920&height=1080&win=allwithoutosd&x=123456789012&e=&cameraid";
     struct Case {
         const char* key;
         const char* value;
     };
-    const Case cases[] = {
-        {"width=", "1920"},        {"height=", "1080"},   {"win=", "allwithout"},
-        {"x=", "1234567890"},      {"e=", ""},            {"cameraid=", "failed"},
-        {"skyvo?", "failed"},  // at the very start: position 0 counts as absent
-    };
+    const Case cases[] =
+        {
+            {"width=", "1920"},   {"height=", "1080"}, {"win=", "allwithout"},
+            {"x=", "1234567890"}, {"e=", ""},          {"cameraid=", "failed"},
+            {"skyvo?", "failed"},  // at the very start: position 0 counts as absent
+        };
     ::testing::internal::CaptureStdout();
     for (const Case& c : cases) EXPECT_EQ(getKeyWordValue(c.key, url), c.value) << c.key;
     std::string out = ::testing::internal::GetCapturedStdout();
@@ -174,7 +182,8 @@ TEST(KeyWordValueTest, QueryValuesAreCutAt10CharactersAndMissingKeysFail) {
 TEST(KeyWordValueTest, KmpFindsTheFirstOccurrenceAndTracesItsTable) {
     ::testing::internal::CaptureStdout();
     EXPECT_EQ(kmp("abababca", "abab"), 0);
-    EXPECT_EQ(::testing::internal::GetCapturedStdout(), "next[0]=0\nnext[1]=0\nnext[2]=1\nnext[3]=2\n");
+    EXPECT_EQ(::testing::internal::GetCapturedStdout(),
+              "next[0]=0\nnext[1]=0\nnext[2]=1\nnext[3]=2\n");
     ::testing::internal::CaptureStdout();
     EXPECT_EQ(kmp("xxaabaabaaay", "aabaaa"), 5);
     EXPECT_EQ(kmp("aaaa", "b"), -1);

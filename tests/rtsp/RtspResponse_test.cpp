@@ -67,21 +67,26 @@ const Conversation kConversations[] = {
        "RTSP/1.0 200 OK\r\nCSeq: 1\r\n"
        "Public: OPTIONS, DESCRIBE, SETUP, TEARDOWN, PLAY, PAUSE,GET_PARAMETER\r\n\r\n"}}},
     {"ffmpeg describe",
-     {{"DESCRIBE " + kUrl + " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n"
-       "User-Agent: Lavf59.27.100\r\n\r\n",
+     {{"DESCRIBE " + kUrl +
+           " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n"
+           "User-Agent: Lavf59.27.100\r\n\r\n",
        "RTSP/1.0 200 OK\r\nCSeq: 2\r\nServer: RTSP Service\r\nContent-Base: " + kUrl +
            "\r\nContent-Type: application/sdp\r\nContent-Length: 14\r\n\r\n" + kSdp}}},
     {"ffmpeg setup, setup, play: the session line from the first setup on",
-     {{"SETUP " + kUrl + "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
-       "client_port=15190-15191\r\nCSeq: 3\r\nUser-Agent: Lavf59.27.100\r\n\r\n",
+     {{"SETUP " + kUrl +
+           "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
+           "client_port=15190-15191\r\nCSeq: 3\r\nUser-Agent: Lavf59.27.100\r\n\r\n",
        "RTSP/1.0 200 OK\r\nCSeq: 3\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
        "server_port=8000-8001;client_port=15190-15191;ssrc=1\r\n\r\n"},
-      {"SETUP " + kUrl + "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
-       "client_port=15192-15193\r\nCSeq: 4\r\nUser-Agent: Lavf59.27.100\r\nSession: 1881\r\n\r\n",
+      {"SETUP " + kUrl +
+           "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
+           "client_port=15192-15193\r\nCSeq: 4\r\nUser-Agent: Lavf59.27.100\r\nSession: "
+           "1881\r\n\r\n",
        "RTSP/1.0 200 OK\r\nCSeq: 4\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
        "server_port=8000-8001;client_port=15192-15193;ssrc=1\r\n\r\n"},
-      {"PLAY " + kUrl + " RTSP/1.0\r\nRange: npt=0.000-\r\nCSeq: 5\r\n"
-       "User-Agent: Lavf59.27.100\r\nSession: 1881\r\n\r\n",
+      {"PLAY " + kUrl +
+           " RTSP/1.0\r\nRange: npt=0.000-\r\nCSeq: 5\r\n"
+           "User-Agent: Lavf59.27.100\r\nSession: 1881\r\n\r\n",
        "RTSP/1.0 200 OK\r\nCSeq: 5\r\nSession: 1881;timeout=10\r\nRTP-Info: url=" + kUrl +
            "/trackID=1\r\n\r\n"},
       {"PAUSE " + kUrl + " RTSP/1.0\r\nCSeq: 6\r\nSession: 1881\r\n\r\n",
@@ -105,7 +110,8 @@ const Conversation kConversations[] = {
       {"PAUSE rtsp://h/s RTSP/1.0\r\nCSeq:8\r\n\r\n", "RTSP/1.0 200 OK\r\nCSeq: 8\r\n\r\n"},
       {"PAUSE rtsp://h/s RTSP/1.0\r\nCSeq:    9\r\n\r\n", "RTSP/1.0 200 OK\r\nCSeq: 9\r\n\r\n"}}},
     {"a play whose URL holds SETUP is a setup",
-     {{"PLAY rtsp://h/SETUP RTSP/1.0\r\nCSeq: 2\r\nTransport: RTP/AVP;client_port=6000-6001\r\n\r\n",
+     {{"PLAY rtsp://h/SETUP RTSP/1.0\r\nCSeq: 2\r\nTransport: "
+       "RTP/AVP;client_port=6000-6001\r\n\r\n",
        "RTSP/1.0 200 OK\r\nCSeq: 2\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
        "server_port=8000-8001;client_port=6000-6001;ssrc=1\r\n\r\n"}}},
 };
@@ -134,8 +140,9 @@ TEST(RtspResponseTest, EmptyDescriptionStillSendsLengthAndBlankLine) {
 }
 
 TEST(RtspResponseTest, SessionIdentifiersWrapFrom91883To1881AndStayPerConnection) {
-    const std::string setup = "SETUP rtsp://h/s/trackID=1 RTSP/1.0\r\nCSeq: 1\r\n"
-                              "Transport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n";
+    const std::string setup =
+        "SETUP rtsp://h/s/trackID=1 RTSP/1.0\r\nCSeq: 1\r\n"
+        "Transport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n";
     RtspResponse::SetSessionCounter(91882);
     std::vector<int> ids;
     for (int i = 0; i < 3; ++i) {

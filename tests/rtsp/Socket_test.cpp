@@ -6,8 +6,8 @@
 #include <thread>
 
 #include "rtsp/Rtsp.h"
-#include "tests/rtsp/SocketPair.h"
 #include "rtsp/Tcp.h"
+#include "tests/rtsp/SocketPair.h"
 
 namespace {
 
@@ -92,7 +92,6 @@ TEST_F(SocketTest, RtspReadSplitsLinesAndDropsTheByteAfterCr) {
     }
 }
 
-
 TEST_F(SocketTest, ParseMrlTable) {
     struct Case {
         std::string mrl;
@@ -101,13 +100,14 @@ TEST_F(SocketTest, ParseMrlTable) {
         int port;
     };
     const Case cases[] = {
-        {"rtsp://192.168.1.20:8554/skyvo?width=1280", true, "192.168.1.20", "skyvo?width=1280", 8554},
+        {"rtsp://192.168.1.20:8554/skyvo?width=1280", true, "192.168.1.20", "skyvo?width=1280",
+         8554},
         {"rtsp://10.0.0.1/skyvo", true, "10.0.0.1", "skyvo", 554},
         {"rtsp://10.0.0.1", true, "10.0.0.1", "", 554},
-        {"rtsp://h:8554", true, "h:8554", "", 554},           // no '/' after the ':'
-        {"rtsp://h/a:99/b", true, "h", "a/b", 99},              // ':' in the path delimits a port
-        {"rtsp://h:abc/x", true, "h", "x", 0},                   // atoi of a non-number
-        {"x rtsp://h/p", true, "h", "p", 554},                  // found anywhere
+        {"rtsp://h:8554", true, "h:8554", "", 554},  // no '/' after the ':'
+        {"rtsp://h/a:99/b", true, "h", "a/b", 99},   // ':' in the path delimits a port
+        {"rtsp://h:abc/x", true, "h", "x", 0},       // atoi of a non-number
+        {"x rtsp://h/p", true, "h", "p", 554},       // found anywhere
         {"RTSP://h/p", false, "", "", 0},
         {"http://h/p", false, "", "", 0},
         {"rtsp:/", false, "", "", 0},

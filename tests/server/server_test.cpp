@@ -48,9 +48,18 @@ int VideoOpen() {
     Record(ready ? "video open" : "video open before rings and senders were ready");
     return 0;
 }
-int AudioOpen() { Record("audio open"); return 0; }
-int VideoClose() { Record("video close"); return 0; }
-int AudioClose() { Record("audio close"); return 0; }
+int AudioOpen() {
+    Record("audio open");
+    return 0;
+}
+int VideoClose() {
+    Record("video close");
+    return 0;
+}
+int AudioClose() {
+    Record("audio close");
+    return 0;
+}
 
 template <typename Pred>
 bool WaitFor(Pred done, int ms = 3000) {
@@ -110,15 +119,20 @@ protected:
     int Clients() { return skyvo_rtsp_service()->listener()->client_count(); }
     // DESCRIBE, SETUP of both tracks and PLAY, as ffmpeg sends them.
     void Play(RtspClient& c, int video_port, int audio_port, std::string* describe = nullptr) {
-        std::string answer =
-            c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n\r\n");
+        std::string answer = c.Exchange("DESCRIBE " + url +
+                                        " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n\r\n");
         if (describe != nullptr) *describe = answer;
         ASSERT_NE(answer.find("200 OK"), std::string::npos);
-        c.Exchange("SETUP " + url + "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;client_port=" +
-                   std::to_string(video_port) + "-" + std::to_string(video_port + 1) + "\r\nCSeq: 3\r\n\r\n");
-        c.Exchange("SETUP " + url + "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;client_port=" +
-                   std::to_string(audio_port) + "-" + std::to_string(audio_port + 1) + "\r\nCSeq: 4\r\n\r\n");
-        ASSERT_NE(c.Exchange("PLAY " + url + " RTSP/1.0\r\nRange: npt=0.000-\r\nCSeq: 5\r\n\r\n").find("200 OK"),
+        c.Exchange("SETUP " + url +
+                   "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;client_port=" +
+                   std::to_string(video_port) + "-" + std::to_string(video_port + 1) +
+                   "\r\nCSeq: 3\r\n\r\n");
+        c.Exchange("SETUP " + url +
+                   "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;client_port=" +
+                   std::to_string(audio_port) + "-" + std::to_string(audio_port + 1) +
+                   "\r\nCSeq: 4\r\n\r\n");
+        ASSERT_NE(c.Exchange("PLAY " + url + " RTSP/1.0\r\nRange: npt=0.000-\r\nCSeq: 5\r\n\r\n")
+                      .find("200 OK"),
                   std::string::npos);
     }
 
@@ -133,9 +147,10 @@ TEST_F(ServerTest, FullExchangeIsByteExactAndRtpFollowsTheFrames) {
     UdpReceiver video, audio;
     RtspClient c("127.0.0.1", port);
     ASSERT_TRUE(c.connected());
-    EXPECT_EQ(c.Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\nUser-Agent: Lavf59.27.100\r\n\r\n"),
-              "RTSP/1.0 200 OK\r\nCSeq: 1\r\n"
-              "Public: OPTIONS, DESCRIBE, SETUP, TEARDOWN, PLAY, PAUSE,GET_PARAMETER\r\n\r\n");
+    EXPECT_EQ(
+        c.Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\nUser-Agent: Lavf59.27.100\r\n\r\n"),
+        "RTSP/1.0 200 OK\r\nCSeq: 1\r\n"
+        "Public: OPTIONS, DESCRIBE, SETUP, TEARDOWN, PLAY, PAUSE,GET_PARAMETER\r\n\r\n");
     const std::string sdp =
         "v=0\r\ns=skyvo\r\nc=IN IP4 127.0.0.1\r\nt=0 0\r\na=control:*\r\n"
         "m=video 0 RTP/AVP 96\r\na=rtpmap:96 H264/90000\r\n"
@@ -144,25 +159,36 @@ TEST_F(ServerTest, FullExchangeIsByteExactAndRtpFollowsTheFrames) {
         "m=audio 0 RTP/AVP 97\r\na=rtpmap:97 MPEG4-GENERIC/48000/2\r\n"
         "a=fmtp:97 streamtype=5; profile-level-id=1; mode=AAC-hbr; config=1190; SizeLength=13; "
         "IndexLength=3; IndexDeltaLength=3;\r\na=control:trackID=2\r\n";
-    EXPECT_EQ(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n"
+    EXPECT_EQ(c.Exchange("DESCRIBE " + url +
+                         " RTSP/1.0\r\nAccept: application/sdp\r\nCSeq: 2\r\n"
                          "User-Agent: Lavf59.27.100\r\n\r\n"),
               "RTSP/1.0 200 OK\r\nCSeq: 2\r\nServer: RTSP Service\r\nContent-Base: " + url +
-                  "\r\nContent-Type: application/sdp\r\nContent-Length: " + std::to_string(sdp.size()) +
-                  "\r\n\r\n" + sdp);
+                  "\r\nContent-Type: application/sdp\r\nContent-Length: " +
+                  std::to_string(sdp.size()) + "\r\n\r\n" + sdp);
     const std::string v = std::to_string(video.port()), a = std::to_string(audio.port());
     const std::string v1 = std::to_string(video.port() + 1), a1 = std::to_string(audio.port() + 1);
-    EXPECT_EQ(c.Exchange("SETUP " + url + "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
-                         "client_port=" + v + "-" + v1 + "\r\nCSeq: 3\r\n\r\n"),
-              "RTSP/1.0 200 OK\r\nCSeq: 3\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
-              "server_port=8000-8001;client_port=" + v + "-" + v1 + ";ssrc=1\r\n\r\n");
-    EXPECT_EQ(c.Exchange("SETUP " + url + "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
-                         "client_port=" + a + "-" + a1 + "\r\nCSeq: 4\r\nSession: 1881\r\n\r\n"),
-              "RTSP/1.0 200 OK\r\nCSeq: 4\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
-              "server_port=8002-8003;client_port=" + a + "-" + a1 + ";ssrc=1\r\n\r\n");
+    EXPECT_EQ(
+        c.Exchange("SETUP " + url +
+                   "/trackID=1 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
+                   "client_port=" +
+                   v + "-" + v1 + "\r\nCSeq: 3\r\n\r\n"),
+        "RTSP/1.0 200 OK\r\nCSeq: 3\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
+        "server_port=8000-8001;client_port=" +
+            v + "-" + v1 + ";ssrc=1\r\n\r\n");
+    EXPECT_EQ(
+        c.Exchange("SETUP " + url +
+                   "/trackID=2 RTSP/1.0\r\nTransport: RTP/AVP/UDP;unicast;"
+                   "client_port=" +
+                   a + "-" + a1 + "\r\nCSeq: 4\r\nSession: 1881\r\n\r\n"),
+        "RTSP/1.0 200 OK\r\nCSeq: 4\r\nSession: 1881;timeout=10\r\nTransport: RTP/AVP;unicast;"
+        "server_port=8002-8003;client_port=" +
+            a + "-" + a1 + ";ssrc=1\r\n\r\n");
     EXPECT_TRUE(RecordedCalls().empty());
     // Answer lines are cut at 255 characters: with URLs this long the second url= is cut.
-    const std::string rtp_info = ("RTP-Info: url=" + url + "/trackID=1,url=" + url + "/trackID=2").substr(0, 255);
-    EXPECT_EQ(c.Exchange("PLAY " + url + " RTSP/1.0\r\nRange: npt=0.000-\r\nCSeq: 5\r\nSession: 1881\r\n\r\n"),
+    const std::string rtp_info =
+        ("RTP-Info: url=" + url + "/trackID=1,url=" + url + "/trackID=2").substr(0, 255);
+    EXPECT_EQ(c.Exchange("PLAY " + url +
+                         " RTSP/1.0\r\nRange: npt=0.000-\r\nCSeq: 5\r\nSession: 1881\r\n\r\n"),
               "RTSP/1.0 200 OK\r\nCSeq: 5\r\nSession: 1881;timeout=10\r\n" + rtp_info + "\r\n\r\n");
     ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));  // just after the answer
     EXPECT_EQ(RecordedCalls(), (Calls{"video open", "audio open"}));
@@ -205,7 +231,8 @@ TEST_F(ServerTest, AudioPayloadTypeSwitchChangesOnlyTheAudioPackets) {
         RtspClient c("127.0.0.1", port);
         std::string describe;
         Play(c, video.port(), audio.port(), &describe);
-        ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));  // rings reset, capture on
+        ASSERT_TRUE(
+            WaitFor([] { return RecordedCalls().size() == 2; }));  // rings reset, capture on
         if (pt == 98) unset_describe = describe;
         EXPECT_EQ(describe, unset_describe) << pt;
         unsigned char adts[30] = {0xFF, 0xF1};
@@ -234,22 +261,25 @@ TEST_F(ServerTest, PlayWithTwoClientsConnectedDoesNotStartCapture) {
     ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
     EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close"}));
     auto cfg_logs = fake.log.Texts("orvex:::orvexPIPCfg");
-    EXPECT_EQ(std::count(cfg_logs.begin(), cfg_logs.end(), "orvexPIPCfg::SetTVParameterDefault"), 2);
+    EXPECT_EQ(std::count(cfg_logs.begin(), cfg_logs.end(), "orvexPIPCfg::SetTVParameterDefault"),
+              2);
     EXPECT_TRUE(WaitFor([&] { return Clients() == 1; }));
 }
 
 TEST_F(ServerTest, SixthClientIsResetAtOnce) {
     std::vector<std::unique_ptr<RtspClient>> clients;
     for (int i = 2; i <= 6; ++i) {
-        clients.push_back(std::make_unique<RtspClient>(("127.0.0." + std::to_string(i)).c_str(), port));
+        clients.push_back(
+            std::make_unique<RtspClient>(("127.0.0." + std::to_string(i)).c_str(), port));
         ASSERT_TRUE(WaitFor([&] { return Clients() == i - 1; }));
     }
     RtspClient sixth("127.0.0.7", port);
     EXPECT_TRUE(sixth.ClosedWithoutAnswer());
     EXPECT_EQ(Clients(), 5);
     // The five are still served.
-    EXPECT_NE(clients[0]->Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n").find("200 OK"),
-              std::string::npos);
+    EXPECT_NE(
+        clients[0]->Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n").find("200 OK"),
+        std::string::npos);
 }
 
 TEST_F(ServerTest, ReconnectFromTheSameAddressReplacesTheOldSession) {
@@ -272,7 +302,8 @@ TEST_F(ServerTest, BadOrSilentClientsAreClosedWithoutAnswer) {
         "&dumpvideo=0&dumpaudio=0&specialcase=none RTSP/1.0\r\nCSeq: 2\r\n\r\n";
     const std::string cases[] = {
         without_framerate,
-        "DESCRIBE rtsp://127.0.0.1/skyvo" + kQuery + " RTSP/1.0\r\nCSeq: 2\r\n\r\n",  // no '.' and time
+        "DESCRIBE rtsp://127.0.0.1/skyvo" + kQuery +
+            " RTSP/1.0\r\nCSeq: 2\r\n\r\n",  // no '.' and time
         "RECORD " + url + " RTSP/1.0\r\nCSeq: 2\r\n\r\n",
     };
     for (const std::string& request : cases) {
@@ -296,12 +327,15 @@ TEST_F(ServerTest, ErrorAnswersKeepTheConnection) {
     const Case cases[] = {
         {"PLAY rtsp://127.0.0.1/other.0 RTSP/1.0\r\nCSeq: 1\r\n\r\n",
          "RTSP/1.0 404 Session Not Found\r\nCSeq: 1\r\n\r\n"},
-        {"PAUSE rtsp://127.0.0.1 RTSP/1.0\r\nCSeq: 2\r\n\r\n", "RTSP/1.0 400 Bad Request\r\nCSeq: 2\r\n\r\n"},
+        {"PAUSE rtsp://127.0.0.1 RTSP/1.0\r\nCSeq: 2\r\n\r\n",
+         "RTSP/1.0 400 Bad Request\r\nCSeq: 2\r\n\r\n"},
         // No name in a SETUP URL and none stored by a DESCRIBE yet.
-        {track + "1 RTSP/1.0\r\nCSeq: 3\r\nTransport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n",
+        {track +
+             "1 RTSP/1.0\r\nCSeq: 3\r\nTransport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n",
          "RTSP/1.0 404 Session Not Found\r\nCSeq: 3\r\n\r\n"},
         {"DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 4\r\n\r\n", ""},
-        {track + "3 RTSP/1.0\r\nCSeq: 5\r\nTransport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n",
+        {track +
+             "3 RTSP/1.0\r\nCSeq: 5\r\nTransport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n",
          "RTSP/1.0 404 Stream Not Found\r\nCSeq: 5\r\n\r\n"},
         {track + "1 RTSP/1.0\r\nCSeq: 6\r\nTransport: RTP/AVP/TCP;interleaved=0-1\r\n\r\n",
          "RTSP/1.0 400 Bad Request\r\nCSeq: 6\r\n\r\n"},
@@ -341,8 +375,9 @@ TEST_F(ServerTest, PipStopClosesCaptureAndReopensThreeRoundsLaterOnlyWhenFollowi
     PipListener listener;
     listener.eventCallback(1);
     ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 4; }));
-    EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close", "video open before rings and senders were ready",
-                                      "audio open"}));
+    EXPECT_EQ(RecordedCalls(),
+              (Calls{"video close", "audio close", "video open before rings and senders were ready",
+                     "audio open"}));
     {
         std::lock_guard<std::mutex> hold(g_mutex);
         g_calls.clear();

@@ -17,24 +17,41 @@ protected:
     platform::fake::FakePlatform fake;
 };
 
-
 // Input is ready once both clock rates were configured, whichever came first.
 TEST_F(GlobalConfigTest, ReadinessInEitherOrder) {
     for (bool audio_first : {true, false}) {
         Global_Config::CloseInstance();
         Global_Config* c = Global_Config::instance();
-        if (audio_first) c->mp3_config_ok(); else c->h264_config_frequency_ok();
+        if (audio_first)
+            c->mp3_config_ok();
+        else
+            c->h264_config_frequency_ok();
         EXPECT_FALSE(c->InIISOK()) << audio_first;
-        if (audio_first) c->h264_config_frequency_ok(); else c->mp3_config_ok();
+        if (audio_first)
+            c->h264_config_frequency_ok();
+        else
+            c->mp3_config_ok();
         EXPECT_TRUE(c->InIISOK()) << audio_first;
     }
 }
 
 std::vector<std::string> g_calls;
-int VideoOpen() { g_calls.push_back("video open"); return 0; }
-int AudioOpen() { g_calls.push_back("audio open"); return 0; }
-int VideoClose() { g_calls.push_back("video close"); return 0; }
-int AudioClose() { g_calls.push_back("audio close"); return 0; }
+int VideoOpen() {
+    g_calls.push_back("video open");
+    return 0;
+}
+int AudioOpen() {
+    g_calls.push_back("audio open");
+    return 0;
+}
+int VideoClose() {
+    g_calls.push_back("video close");
+    return 0;
+}
+int AudioClose() {
+    g_calls.push_back("audio close");
+    return 0;
+}
 
 TEST_F(GlobalConfigTest, CallbacksRunVideoFirstAndAreLostWithTheInstance) {
     g_calls.clear();
@@ -46,8 +63,8 @@ TEST_F(GlobalConfigTest, CallbacksRunVideoFirstAndAreLostWithTheInstance) {
     c->m_video_rtp_frequency = 90000;
     c->video_audio_open_cap();
     c->video_audio_close_cap();
-    EXPECT_EQ(g_calls, (std::vector<std::string>{"video open", "audio open", "video close",
-                                                 "audio close"}));
+    EXPECT_EQ(g_calls,
+              (std::vector<std::string>{"video open", "audio open", "video close", "audio close"}));
 
     Global_Config::CloseInstance();
     g_calls.clear();
@@ -104,7 +121,8 @@ TEST_F(GlobalConfigTest, ConcurrentFirstUseCreatesOneObject) {
     Global_Config::CloseInstance();
     std::vector<Global_Config*> seen(4);
     std::vector<std::thread> threads;
-    for (int i = 0; i < 4; ++i) threads.emplace_back([&, i] { seen[i] = Global_Config::instance(); });
+    for (int i = 0; i < 4; ++i)
+        threads.emplace_back([&, i] { seen[i] = Global_Config::instance(); });
     for (auto& t : threads) t.join();
     for (Global_Config* p : seen) EXPECT_EQ(p, seen[0]);
 }

@@ -12,7 +12,6 @@ protected:
     platform::fake::FakePlatform fake;
 };
 
-
 TEST_F(OrvexLogTest, LogGoesToSystemBufferAtDebugPriority) {
     OrvexLog("orvex:::unit", "value %d,", 7);
     auto entries = fake.log.Entries();
@@ -49,6 +48,5 @@ TEST_F(OrvexLogTest, StdoutMirrorFollowsTheSwitch) {
         }
     }
 }
-
 
 }  // namespace

@@ -34,8 +34,8 @@ bool InitOnce(std::string* error) {
 // they do not pile up while streaming.
 bool PopEnd(GstElement* pipeline, std::string* why) {
     GstBus* bus = gst_element_get_bus(pipeline);
-    GstMessage* msg = gst_bus_pop_filtered(
-        bus, static_cast<GstMessageType>(GST_MESSAGE_ERROR | GST_MESSAGE_EOS));
+    GstMessage* msg =
+        gst_bus_pop_filtered(bus, static_cast<GstMessageType>(GST_MESSAGE_ERROR | GST_MESSAGE_EOS));
     gst_object_unref(bus);
     if (msg == nullptr) return false;
     if (GST_MESSAGE_TYPE(msg) == GST_MESSAGE_EOS) {
@@ -107,9 +107,7 @@ void GstSource::stop() {
     pipeline_ = nullptr;
 }
 
-bool GstSource::ended(std::string* why) {
-    return pipeline_ != nullptr && PopEnd(pipeline_, why);
-}
+bool GstSource::ended(std::string* why) { return pipeline_ != nullptr && PopEnd(pipeline_, why); }
 
 GstSample* GstSource::pull(uint64_t timeout_ns) {
     return gst_app_sink_try_pull_sample(GST_APP_SINK(sink_), timeout_ns);

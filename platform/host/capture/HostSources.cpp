@@ -41,8 +41,8 @@ SourceChoice Choose(const char* key, const char* default_value,
     std::string value = WholeProperty(key, default_value);
     SourceChoice choice;
     if (parse(value, &choice)) return choice;
-    std::string line = std::string(key) + ": unknown value \"" + value + "\", using " +
-                       default_value;
+    std::string line =
+        std::string(key) + ": unknown value \"" + value + "\", using " + default_value;
     Log().Write(kLogIdSystem, kLogError, "orvex:::host", line.c_str());
     parse(default_value, &choice);
     return choice;
@@ -137,8 +137,8 @@ std::string AudioPipeline(const SourceChoice& source) {
     switch (source.kind) {
         case SourceChoice::kPulse:
             // The monitor of the default sink is what the machine plays.
-            head = "pulsesrc device=" +
-                   Quoted(source.arg.empty() ? "@DEFAULT_MONITOR@" : source.arg);
+            head =
+                "pulsesrc device=" + Quoted(source.arg.empty() ? "@DEFAULT_MONITOR@" : source.arg);
             break;
         case SourceChoice::kAlsa:
             head = "alsasrc";

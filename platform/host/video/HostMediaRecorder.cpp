@@ -73,10 +73,7 @@ bool SubWindow(const std::string& flattened) {
 HostMediaRecorder::HostMediaRecorder() = default;
 HostMediaRecorder::~HostMediaRecorder() { stop(); }
 
-
-int HostMediaRecorder::settable() const {
-    return state_ == State::kIdle ? 0 : kInvalidOperation;
-}
+int HostMediaRecorder::settable() const { return state_ == State::kIdle ? 0 : kInvalidOperation; }
 
 int HostMediaRecorder::setCamera(Camera& camera) {
     if (int rc = settable()) return rc;
@@ -173,12 +170,11 @@ int HostMediaRecorder::prepare() {
 int HostMediaRecorder::openSource() {
     source_ = ChooseVideoSource(sub_);
     label_ = sub_ && source_.kind == SourceChoice::kPattern ? TestPattern::Label::kSub
-                                                              : TestPattern::Label::kNone;
+                                                            : TestPattern::Label::kNone;
     live_.reset();
     if (!source_.live()) return 0;
     // The pattern's size: the same even size the encoder is given.
-    std::string description =
-        VideoPipeline(source_, pattern_->width(), pattern_->height(), fps_);
+    std::string description = VideoPipeline(source_, pattern_->width(), pattern_->height(), fps_);
     auto live = std::make_unique<GstSource>();
     std::string error;
     if (!live->start(description, &error)) {
@@ -199,8 +195,10 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
             live_->latestFrame(picture_.data(), pattern_->width(), pattern_->height());
             return;
         }
-        Note("MediaRecorder: video source %s stopped: %s; showing \"no signal\" until the next "
-             "start", source_.text.c_str(), why.c_str());
+        Note(
+            "MediaRecorder: video source %s stopped: %s; showing \"no signal\" until the next "
+            "start",
+            source_.text.c_str(), why.c_str());
         live_->stop();
         label_ = TestPattern::Label::kNoSignal;
     }
@@ -297,8 +295,7 @@ int HostMediaRecorder::stop() {
         wake_.notify_all();
         thread_.join();
         Note("MediaRecorder::stop: %" PRIu64 " frames delivered, %" PRIu64
-             " transactions failed, %" PRIu64 " frames dropped, %" PRIu64
-             " skipped by the encoder",
+             " transactions failed, %" PRIu64 " frames dropped, %" PRIu64 " skipped by the encoder",
              framesDelivered(), failedTransacts(), framesDropped(), framesSkipped());
     }
     closeEncoder();
@@ -336,8 +333,8 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_
     source.iStride[1] = source.iStride[2] = source.iPicWidth / 2;
     source.pData[0] = picture_.data();
     source.pData[1] = source.pData[0] + static_cast<size_t>(source.iPicWidth) * source.iPicHeight;
-    source.pData[2] = source.pData[1] + static_cast<size_t>(source.iPicWidth / 2) *
-                                            (source.iPicHeight / 2);
+    source.pData[2] =
+        source.pData[1] + static_cast<size_t>(source.iPicWidth / 2) * (source.iPicHeight / 2);
     source.uiTimeStamp = static_cast<long long>(ms);
 
     SFrameBSInfo info;

@@ -44,9 +44,7 @@ TestPattern::TestPattern(int width, int height)
     counter_y_ = pad;
 }
 
-size_t TestPattern::frameSize() const {
-    return static_cast<size_t>(width_) * height_ * 3 / 2;
-}
+size_t TestPattern::frameSize() const { return static_cast<size_t>(width_) * height_ * 3 / 2; }
 
 void TestPattern::draw(uint32_t frame, uint64_t ms, uint8_t* i420, Label label) const {
     drawBars(frame, i420);
@@ -123,10 +121,10 @@ void TestPattern::drawSegments(const uint8_t* glyphs, int count, int x0, int y,
     for (int i = 0; i < count; ++i) {
         uint8_t on = glyphs[i];
         int x = x0 + i * (w + pad);
-        const int rects[7][4] = {{x, y, w, t},           {x + w - t, y, t, mid + t},
-                                 {x + w - t, y + mid, t, h - mid}, {x, y + h - t, w, t},
-                                 {x, y + mid, t, h - mid},          {x, y, t, mid + t},
-                                 {x, y + mid, w, t}};
+        const int rects[7][4] = {
+            {x, y, w, t},         {x + w - t, y, t, mid + t}, {x + w - t, y + mid, t, h - mid},
+            {x, y + h - t, w, t}, {x, y + mid, t, h - mid},   {x, y, t, mid + t},
+            {x, y + mid, w, t}};
         for (int s = 0; s < 7; ++s) {
             if (on & (1 << s)) {
                 fillRect(i420, rects[s][0], rects[s][1], rects[s][2], rects[s][3], kWhiteY,

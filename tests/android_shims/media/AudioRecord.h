@@ -23,20 +23,18 @@ public:
         TRANSFER_SYNC,
     };
 
-    static status_t getMinFrameCount(size_t* frameCount, uint32_t sampleRate,
-                                     audio_format_t format, audio_channel_mask_t channelMask);
+    static status_t getMinFrameCount(size_t* frameCount, uint32_t sampleRate, audio_format_t format,
+                                     audio_channel_mask_t channelMask);
 
     explicit AudioRecord(const String16& opPackageName);
 
     status_t set(audio_source_t inputSource, uint32_t sampleRate, audio_format_t format,
-                 audio_channel_mask_t channelMask, size_t frameCount = 0,
-                 callback_t cbf = NULL, void* user = NULL, uint32_t notificationFrames = 0,
-                 bool threadCanCallJava = false,
+                 audio_channel_mask_t channelMask, size_t frameCount = 0, callback_t cbf = NULL,
+                 void* user = NULL, uint32_t notificationFrames = 0, bool threadCanCallJava = false,
                  audio_session_t sessionId = AUDIO_SESSION_ALLOCATE,
                  transfer_type transferType = TRANSFER_DEFAULT,
-                 audio_input_flags_t flags = AUDIO_INPUT_FLAG_NONE,
-                 uid_t uid = AUDIO_UID_INVALID, pid_t pid = -1,
-                 const audio_attributes_t* pAttributes = NULL,
+                 audio_input_flags_t flags = AUDIO_INPUT_FLAG_NONE, uid_t uid = AUDIO_UID_INVALID,
+                 pid_t pid = -1, const audio_attributes_t* pAttributes = NULL,
                  audio_port_handle_t selectedDeviceId = AUDIO_PORT_HANDLE_NONE);
 
     status_t initCheck() const;

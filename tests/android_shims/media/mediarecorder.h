@@ -14,8 +14,7 @@ class MediaRecorder : public virtual RefBase {
 public:
     explicit MediaRecorder(const String16& opPackageName);
     status_t initCheck();
-    status_t setCamera(const sp<hardware::ICamera>& camera,
-                       const sp<ICameraRecordingProxy>& proxy);
+    status_t setCamera(const sp<hardware::ICamera>& camera, const sp<ICameraRecordingProxy>& proxy);
     status_t setVideoSource(int vs);
     status_t setOutputFormat(int of);
     status_t setVideoEncoder(int ve);
