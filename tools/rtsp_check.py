@@ -3,6 +3,8 @@
 
     rtsp_check.py packets URL [SECONDS]   receive RTP, check packet formats, print rates
     rtsp_check.py measure URL [SECONDS]   decode with ffmpeg, print frame rate and A/V offset
+    rtsp_check.py latency URL [SECONDS]   decode with a low-delay ffmpeg, print the delay from
+                                          the host pattern's capture stamp to the decoded frame
 
 The service announces audio as payload type 97. Its packets carry 97 too when the property
 kv.orvex.audiopt says so (the host default), and then 'measure' plays the URL with stock ffmpeg.
@@ -194,10 +196,72 @@ def measure(url, seconds):
     return 0 if video_t and audio_t and errors == 0 else 1
 
 
+def read_stamp(luma, width, height):
+    """The capture time (low 32 bits of the host's monotonic milliseconds) the host test pattern
+    draws along its bottom: 36 cells, white, black, 32 bits (white is 1), black, white."""
+    cell = (width // 40) & ~7
+    if cell < 8 or height < 8 * cell:
+        return None
+    x0, y0, half = cell, (height - 2 * cell) & ~7, cell // 2
+    stamp = 0
+    for i in range(36):
+        x = x0 + i * cell + cell // 4
+        total = 0
+        for y in range(y0 + cell // 4, y0 + cell // 4 + half):
+            total += sum(luma[y * width + x:y * width + x + half])
+        white = total // (half * half) > 125
+        if i in (0, 35):
+            if not white:
+                return None
+        elif i in (1, 34):
+            if white:
+                return None
+        else:
+            stamp = stamp << 1 | white
+    return stamp
+
+
+def latency(url, seconds):
+    """Capture to display on one machine: the pattern's stamp and this process both read
+    CLOCK_MONOTONIC, and a frame counts as displayed when its last byte leaves the decoder."""
+    width = int((re.search(r"[?&]width=(\d+)", url) or [0, 1280])[1])
+    height = int((re.search(r"[?&]height=(\d+)", url) or [0, 720])[1])
+    cmd = ["ffmpeg", "-hide_banner", "-loglevel", "error", "-fflags", "nobuffer",
+           "-flags", "low_delay", "-probesize", "32", "-analyzeduration", "0",
+           "-rtsp_transport", "udp", "-t", str(seconds), "-i", url, "-map", "0:v",
+           "-vsync", "passthrough", "-pix_fmt", "gray", "-f", "rawvideo", "-"]
+    size = width * height
+    delays, frames = [], 0
+    with subprocess.Popen(cmd, stdout=subprocess.PIPE, stderr=subprocess.DEVNULL) as ff:
+        while True:
+            frame = ff.stdout.read(size)
+            if len(frame) < size:
+                break
+            now = int(time.clock_gettime(time.CLOCK_MONOTONIC) * 1000) & 0xFFFFFFFF
+            frames += 1
+            stamp = read_stamp(frame, width, height)
+            if stamp is not None:
+                delay = (now - stamp) & 0xFFFFFFFF
+                if delay < 1 << 31:
+                    delays.append(delay)
+    if not delays:
+        print("frames=%d stamped=0 (no capture stamps: not the host test pattern, or not %dx%d)"
+              % (frames, width, height))
+        return 1
+    delays.sort()
+
+    def pct(p):
+        return delays[min(len(delays) - 1, int(p * len(delays)))]
+    print("frames=%d stamped=%d latency_ms p50=%d p95=%d max=%d" %
+          (frames, len(delays), pct(0.50), pct(0.95), delays[-1]))
+    return 0
+
+
 def main():
     mode, url = sys.argv[1], sys.argv[2]
     seconds = float(sys.argv[3]) if len(sys.argv) > 3 else 10.0
-    sys.exit(packets(url, seconds) if mode == "packets" else measure(url, seconds))
+    modes = {"packets": packets, "measure": measure, "latency": latency}
+    sys.exit(modes[mode](url, seconds))
 
 
 if __name__ == "__main__":
