@@ -5,6 +5,8 @@
     rtsp_check.py measure URL [SECONDS]   decode with ffmpeg, print frame rate and A/V offset
     rtsp_check.py latency URL [SECONDS]   decode with a low-delay ffmpeg, print the delay from
                                           the host pattern's capture stamp to the decoded frame
+    rtsp_check.py split URL [SECONDS]     the same delay cut in two: capture to the frame's last
+                                          packet here, and that packet to the decoded frame
 
 The service announces audio as payload type 97. Its packets carry 97 too when the property
 kv.orvex.audiopt says so (the host default), and then 'measure' plays the URL with stock ffmpeg.
@@ -257,10 +259,79 @@ def latency(url, seconds):
     return 0
 
 
+def split(url, seconds):
+    """Receives the RTP itself and hands ffmpeg the access units, noting when each one's last
+    packet (the marker) arrived: what the service and the network take is apart from what the
+    decoder takes."""
+    width = int((re.search(r"[?&]width=(\d+)", url) or [0, 1280])[1])
+    height = int((re.search(r"[?&]height=(\d+)", url) or [0, 720])[1])
+
+    def now():
+        return int(time.clock_gettime(time.CLOCK_MONOTONIC) * 1000) & 0xFFFFFFFF
+    video, audio = udp_pair(), udp_pair()
+    session = Session(url)
+    session.play([video.getsockname()[1], audio.getsockname()[1]])
+    ff = subprocess.Popen(["ffmpeg", "-v", "quiet", "-fflags", "nobuffer", "-flags", "low_delay",
+                           "-probesize", "32", "-analyzeduration", "0", "-f", "h264", "-i", "-",
+                           "-pix_fmt", "gray", "-f", "rawvideo", "-"],
+                          stdin=subprocess.PIPE, stdout=subprocess.PIPE)
+    arrivals = []
+
+    def receive():
+        end = time.time() + seconds
+        video.settimeout(0.5)
+        try:
+            while time.time() < end:
+                try:
+                    p = video.recv(2048)
+                except socket.timeout:
+                    continue
+                nal = p[12:]
+                if not nal:
+                    continue
+                if nal[0] & 0x1F == 28 and len(nal) > 2:  # FU-A
+                    if nal[1] & 0x80:
+                        ff.stdin.write(b"\0\0\0\1" + bytes([(nal[0] & 0xE0) | (nal[1] & 0x1F)]))
+                    ff.stdin.write(nal[2:])
+                else:
+                    ff.stdin.write(b"\0\0\0\1" + nal)
+                if p[1] & 0x80:
+                    ff.stdin.flush()
+                    arrivals.append(now())
+        finally:
+            ff.stdin.close()
+    threading.Thread(target=receive, daemon=True).start()
+    threading.Thread(target=session.keep_alive, args=(seconds,), daemon=True).start()
+    whole, decode = [], []
+    while True:
+        frame = ff.stdout.read(width * height)
+        if len(frame) < width * height:
+            break
+        t = now()
+        stamp = read_stamp(frame, width, height)
+        last = [a for a in arrivals[-4:] if (t - a) & 0xFFFFFFFF < 1 << 31]
+        if stamp is None or not last:
+            continue
+        whole.append((t - stamp) & 0xFFFFFFFF)
+        decode.append((t - last[-1]) & 0xFFFFFFFF)
+    ff.wait()
+    if not whole:
+        print("stamped=0 (no capture stamps: not the host test pattern, or not %dx%d)"
+              % (width, height))
+        return 1
+    whole.sort()
+    decode.sort()
+    print("stamped=%d capture_to_decoded_ms p50=%d capture_to_last_packet_ms p50=%d "
+          "last_packet_to_decoded_ms p50=%d" %
+          (len(whole), whole[len(whole) // 2],
+           whole[len(whole) // 2] - decode[len(decode) // 2], decode[len(decode) // 2]))
+    return 0
+
+
 def main():
     mode, url = sys.argv[1], sys.argv[2]
     seconds = float(sys.argv[3]) if len(sys.argv) > 3 else 10.0
-    modes = {"packets": packets, "measure": measure, "latency": latency}
+    modes = {"packets": packets, "measure": measure, "latency": latency, "split": split}
     sys.exit(modes[mode](url, seconds))
 
 
