@@ -299,8 +299,8 @@ TEST(HostVideoPatternTest, FlashSquareFollowsTheHostClock) {
 TEST(HostVideoPatternTest, StampReadsBackTheCaptureTime) {
     // Low 32 bits of the clock; all-ones and alternating bits stress the guards.
     const uint64_t times[] = {0, 1, 0x80000000u, 0xFFFFFFFFu, 0x1AAAAAAAAull, 0x55555555u, 5300417};
-    for (auto [w, h] : {std::pair{320, 176}, std::pair{640, 480}, std::pair{1280, 720},
-                        std::pair{1920, 1080}}) {
+    for (auto [w, h] :
+         {std::pair{320, 176}, std::pair{640, 480}, std::pair{1280, 720}, std::pair{1920, 1080}}) {
         TestPattern pattern(w, h);
         ASSERT_GE(pattern.stampCell(), 8) << w << "x" << h;
         Bytes frame(pattern.frameSize());
