@@ -3,6 +3,8 @@
 #   install-deps.sh          what building, running and testing on this machine needs
 #   install-deps.sh e2e      that, plus the clients of the end-to-end check (ffmpeg, GStreamer)
 #   install-deps.sh capture-e2e  that, plus a virtual screen and a sound server to capture
+#   install-deps.sh bench    that, plus the e2e clients and the peer server bench/peer_cost.sh
+#                            serves beside orvex (gst-rtsp-server through Python), and perf
 #   install-deps.sh ci       all of it, plus the sanitizer, fuzzing and 32-bit ARM tool chains
 set -euo pipefail
 
@@ -16,7 +18,10 @@ fi
 if [[ "${1:-}" == ci || "${1:-}" == capture-e2e ]]; then
   packages+=(xvfb gstreamer1.0-x pulseaudio pulseaudio-utils)
 fi
-if [[ "${1:-}" == ci || "${1:-}" == e2e || "${1:-}" == capture-e2e ]]; then
+if [[ "${1:-}" == bench ]]; then
+  packages+=(gir1.2-gst-rtsp-server-1.0 python3-gi linux-perf iproute2 util-linux)
+fi
+if [[ "${1:-}" == ci || "${1:-}" == e2e || "${1:-}" == capture-e2e || "${1:-}" == bench ]]; then
   packages+=(ffmpeg gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
              gstreamer1.0-plugins-bad gstreamer1.0-libav python3)
 fi

@@ -3,6 +3,10 @@
 
     rtsp_check.py packets URL [SECONDS]   receive RTP, check packet formats, print rates
     rtsp_check.py measure URL [SECONDS]   decode with ffmpeg, print frame rate and A/V offset
+    rtsp_check.py latency URL [SECONDS]   decode with a low-delay ffmpeg, print the delay from
+                                          the host pattern's capture stamp to the decoded frame
+    rtsp_check.py split URL [SECONDS]     the same delay cut in two: capture to the frame's last
+                                          packet here, and that packet to the decoded frame
 
 The service announces audio as payload type 97. Its packets carry 97 too when the property
 kv.orvex.audiopt says so (the host default), and then 'measure' plays the URL with stock ffmpeg.
@@ -194,10 +198,146 @@ def measure(url, seconds):
     return 0 if video_t and audio_t and errors == 0 else 1
 
 
+def read_stamp(luma, width, height):
+    """The capture time (low 32 bits of the host's monotonic milliseconds) the host test pattern
+    draws along its bottom: 36 cells, white, black, 32 bits (white is 1), black, white."""
+    cell = (width // 40) & ~7
+    if cell < 8 or height < 8 * cell:
+        return None
+    x0, y0, half = cell, (height - 2 * cell) & ~7, cell // 2
+    stamp = 0
+    for i in range(36):
+        x = x0 + i * cell + cell // 4
+        total = 0
+        for y in range(y0 + cell // 4, y0 + cell // 4 + half):
+            total += sum(luma[y * width + x:y * width + x + half])
+        white = total // (half * half) > 125
+        if i in (0, 35):
+            if not white:
+                return None
+        elif i in (1, 34):
+            if white:
+                return None
+        else:
+            stamp = stamp << 1 | white
+    return stamp
+
+
+def latency(url, seconds):
+    """Capture to display on one machine: the pattern's stamp and this process both read
+    CLOCK_MONOTONIC, and a frame counts as displayed when its last byte leaves the decoder."""
+    width = int((re.search(r"[?&]width=(\d+)", url) or [0, 1280])[1])
+    height = int((re.search(r"[?&]height=(\d+)", url) or [0, 720])[1])
+    cmd = ["ffmpeg", "-hide_banner", "-loglevel", "error", "-fflags", "nobuffer",
+           "-flags", "low_delay", "-probesize", "32", "-analyzeduration", "0",
+           "-rtsp_transport", "udp", "-t", str(seconds), "-i", url, "-map", "0:v",
+           "-vsync", "passthrough", "-pix_fmt", "gray", "-f", "rawvideo", "-"]
+    size = width * height
+    delays, frames = [], 0
+    with subprocess.Popen(cmd, stdout=subprocess.PIPE, stderr=subprocess.DEVNULL) as ff:
+        while True:
+            frame = ff.stdout.read(size)
+            if len(frame) < size:
+                break
+            now = int(time.clock_gettime(time.CLOCK_MONOTONIC) * 1000) & 0xFFFFFFFF
+            frames += 1
+            stamp = read_stamp(frame, width, height)
+            if stamp is not None:
+                delay = (now - stamp) & 0xFFFFFFFF
+                if delay < 1 << 31:
+                    delays.append(delay)
+    if not delays:
+        print("frames=%d stamped=0 (no capture stamps: not the host test pattern, or not %dx%d)"
+              % (frames, width, height))
+        return 1
+    delays.sort()
+
+    def pct(p):
+        return delays[min(len(delays) - 1, int(p * len(delays)))]
+    print("frames=%d stamped=%d latency_ms p50=%d p95=%d max=%d" %
+          (frames, len(delays), pct(0.50), pct(0.95), delays[-1]))
+    return 0
+
+
+def split(url, seconds):
+    """Receives the RTP itself and hands ffmpeg the access units, noting when each one's last
+    packet (the marker) arrived: what the service and the network take is apart from what the
+    decoder takes."""
+    width = int((re.search(r"[?&]width=(\d+)", url) or [0, 1280])[1])
+    height = int((re.search(r"[?&]height=(\d+)", url) or [0, 720])[1])
+
+    def now():
+        return int(time.clock_gettime(time.CLOCK_MONOTONIC) * 1000) & 0xFFFFFFFF
+    video, audio = udp_pair(), udp_pair()
+    session = Session(url)
+    session.play([video.getsockname()[1], audio.getsockname()[1]])
+    ff = subprocess.Popen(["ffmpeg", "-v", "quiet", "-fflags", "nobuffer", "-flags", "low_delay",
+                           "-probesize", "32", "-analyzeduration", "0", "-f", "h264", "-i", "-",
+                           "-pix_fmt", "gray", "-f", "rawvideo", "-"],
+                          stdin=subprocess.PIPE, stdout=subprocess.PIPE)
+    arrivals = []
+
+    def receive():
+        end = time.time() + seconds
+        video.settimeout(0.5)
+        try:
+            while time.time() < end:
+                try:
+                    p = video.recv(2048)
+                except socket.timeout:
+                    continue
+                nal = p[12:]
+                if not nal:
+                    continue
+                if nal[0] & 0x1F == 28 and len(nal) > 2:  # FU-A
+                    if nal[1] & 0x80:
+                        ff.stdin.write(b"\0\0\0\1" + bytes([(nal[0] & 0xE0) | (nal[1] & 0x1F)]))
+                    ff.stdin.write(nal[2:])
+                else:
+                    ff.stdin.write(b"\0\0\0\1" + nal)
+                if p[1] & 0x80:
+                    ff.stdin.flush()
+                    arrivals.append(now())
+        finally:
+            ff.stdin.close()
+    threading.Thread(target=receive, daemon=True).start()
+    threading.Thread(target=session.keep_alive, args=(seconds,), daemon=True).start()
+    whole, wire, decode = [], [], []
+    while True:
+        frame = ff.stdout.read(width * height)
+        if len(frame) < width * height:
+            break
+        t = now()
+        stamp = read_stamp(frame, width, height)
+        if stamp is None:
+            continue
+        # The frame's own arrival is the first one at or after its capture; this holds while
+        # the service sends each frame within a frame period of its capture.
+        mine = [a for a in arrivals[-8:] if (a - stamp) & 0xFFFFFFFF < 1 << 31]
+        if not mine:
+            continue
+        whole.append((t - stamp) & 0xFFFFFFFF)
+        wire.append((mine[0] - stamp) & 0xFFFFFFFF)
+        decode.append((t - mine[0]) & 0xFFFFFFFF)
+    ff.wait()
+    if not whole:
+        print("stamped=0 (no capture stamps: not the host test pattern, or not %dx%d)"
+              % (width, height))
+        return 1
+    for part in (whole, wire, decode):
+        part.sort()
+    print("stamped=%d p50/max ms: capture_to_decoded=%d/%d capture_to_last_packet=%d/%d "
+          "last_packet_to_decoded=%d/%d" %
+          (len(whole), whole[len(whole) // 2], whole[-1], wire[len(wire) // 2], wire[-1],
+           decode[len(decode) // 2], decode[-1]))
+    return 0
+
+
 def main():
     mode, url = sys.argv[1], sys.argv[2]
     seconds = float(sys.argv[3]) if len(sys.argv) > 3 else 10.0
-    sys.exit(packets(url, seconds) if mode == "packets" else measure(url, seconds))
+    modes = {"packets": packets, "measure": measure, "latency": latency, "split": split}
+    sys.exit(modes[mode](url, seconds))
 
 
 if __name__ == "__main__":

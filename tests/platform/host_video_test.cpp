@@ -5,6 +5,7 @@
 #include <atomic>
 #include <chrono>
 #include <cstdio>
+#include <cstring>
 #include <fstream>
 #include <memory>
 #include <mutex>
@@ -293,6 +294,44 @@ TEST(HostVideoPatternTest, FlashSquareFollowsTheHostClock) {
             EXPECT_EQ(wrong, 0) << w << "x" << h << " at " << c.ms << " ms";
         }
     }
+}
+
+TEST(HostVideoPatternTest, StampReadsBackTheCaptureTime) {
+    // Low 32 bits of the clock; all-ones and alternating bits stress the guards.
+    const uint64_t times[] = {0, 1, 0x80000000u, 0xFFFFFFFFu, 0x1AAAAAAAAull, 0x55555555u, 5300417};
+    for (auto [w, h] :
+         {std::pair{320, 176}, std::pair{640, 480}, std::pair{1280, 720}, std::pair{1920, 1080}}) {
+        TestPattern pattern(w, h);
+        ASSERT_GE(pattern.stampCell(), 8) << w << "x" << h;
+        Bytes frame(pattern.frameSize());
+        for (uint64_t ms : times) {
+            for (int noisy = 0; noisy < 2; ++noisy) {
+                pattern.draw(12345, ms, frame.data(), TestPattern::Label::kNoSignal);
+                // Coarse noise of +-48 stands in for what an encoder does to flat areas.
+                uint32_t seed = static_cast<uint32_t>(ms) ^ 0x9E3779B9u;
+                for (int i = 0; noisy && i < w * h; ++i) {
+                    seed = seed * 1664525u + 1013904223u;
+                    int v = frame[i] + static_cast<int>(seed >> 24) % 97 - 48;
+                    frame[i] = static_cast<uint8_t>(std::clamp(v, 0, 255));
+                }
+                uint32_t got = 0;
+                ASSERT_TRUE(pattern.readStamp(frame.data(), &got)) << w << "x" << h << " " << ms;
+                EXPECT_EQ(got, static_cast<uint32_t>(ms)) << w << "x" << h << " noisy=" << noisy;
+            }
+        }
+        // A cell of the guard turned over: no stamp rather than a wrong one.
+        pattern.draw(1, 77, frame.data());
+        for (int y = 0; y < pattern.stampCell(); ++y) {
+            memset(&frame[(pattern.stampY() + y) * w + pattern.stampX()], TestPattern::kBlackY,
+                   pattern.stampCell());
+        }
+        uint32_t got = 0;
+        EXPECT_FALSE(pattern.readStamp(frame.data(), &got)) << w << "x" << h;
+    }
+    uint32_t got = 0;
+    Bytes tiny(TestPattern(34, 18).frameSize());
+    TestPattern(34, 18).draw(1, 77, tiny.data());
+    EXPECT_FALSE(TestPattern(34, 18).readStamp(tiny.data(), &got));
 }
 
 }  // namespace

@@ -42,6 +42,11 @@ TestPattern::TestPattern(int width, int height)
     int plate_w = kDigits * digit_w_ + (kDigits + 1) * pad;
     counter_x_ = Even(width_ - plate_w - pad);
     counter_y_ = pad;
+    // Cells of whole 8x8 blocks survive the encoder's quantisation best.
+    stamp_cell_ = (width_ / 40) & ~7;
+    if (stamp_cell_ < 8 || height_ < 8 * stamp_cell_) stamp_cell_ = 0;
+    stamp_x_ = stamp_cell_;
+    stamp_y_ = (height_ - 2 * stamp_cell_) & ~7;
 }
 
 size_t TestPattern::frameSize() const { return static_cast<size_t>(width_) * height_ * 3 / 2; }
@@ -50,6 +55,7 @@ void TestPattern::draw(uint32_t frame, uint64_t ms, uint8_t* i420, Label label) 
     drawBars(frame, i420);
     drawCounter(frame, i420);
     drawLabel(label, i420);
+    drawStamp(ms, i420);
     // Last, so that nothing on narrow pictures can cover the square the sync measurement reads.
     int outer = flash_size_ + 2 * flash_border_;
     fillRect(i420, 0, 0, outer, outer, kBlackY, kNeutralUV, kNeutralUV);
@@ -151,6 +157,52 @@ void TestPattern::drawLabel(Label label, uint8_t* i420) const {
     int x = Even((width_ - plate_w) / 2), y = Even((height_ - plate_h) / 2);
     fillRect(i420, x, y, plate_w, plate_h, kBlackY, kNeutralUV, kNeutralUV);
     drawSegments(glyphs, count, x + pad, y + pad, i420);
+}
+
+void TestPattern::drawStamp(uint64_t ms, uint8_t* i420) const {
+    const int c = stamp_cell_;
+    if (c == 0) return;
+    // A black plate half a cell wide around the row keeps the bars from bleeding into it.
+    fillRect(i420, stamp_x_ - c / 2, stamp_y_ - c / 2, (kStampCells + 1) * c, 2 * c, kBlackY,
+             kNeutralUV, kNeutralUV);
+    const uint32_t stamp = static_cast<uint32_t>(ms);
+    for (int i = 0; i < kStampCells; ++i) {
+        bool white;
+        if (i == 0 || i == kStampCells - 1) {
+            white = true;
+        } else if (i == 1 || i == kStampCells - 2) {
+            white = false;
+        } else {
+            white = (stamp >> (kStampBits - 1 - (i - 2))) & 1u;
+        }
+        if (white) {
+            fillRect(i420, stamp_x_ + i * c, stamp_y_, c, c, kWhiteY, kNeutralUV, kNeutralUV);
+        }
+    }
+}
+
+bool TestPattern::readStamp(const uint8_t* luma, uint32_t* ms) const {
+    const int c = stamp_cell_;
+    if (c == 0) return false;
+    uint32_t stamp = 0;
+    for (int i = 0; i < kStampCells; ++i) {
+        // The middle half of the cell: its edges blur under compression.
+        unsigned sum = 0;
+        int x0 = stamp_x_ + i * c + c / 4, y0 = stamp_y_ + c / 4;
+        for (int y = y0; y < y0 + c / 2; ++y) {
+            for (int x = x0; x < x0 + c / 2; ++x) sum += luma[static_cast<size_t>(y) * width_ + x];
+        }
+        bool white = sum / static_cast<unsigned>((c / 2) * (c / 2)) > (kWhiteY + kBlackY) / 2;
+        if (i == 0 || i == kStampCells - 1) {
+            if (!white) return false;
+        } else if (i == 1 || i == kStampCells - 2) {
+            if (white) return false;
+        } else {
+            stamp = (stamp << 1) | (white ? 1u : 0u);
+        }
+    }
+    *ms = stamp;
+    return true;
 }
 
 }  // namespace host
