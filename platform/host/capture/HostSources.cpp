@@ -50,52 +50,55 @@ SourceChoice Choose(const char* key, const char* default_value,
 
 }  // namespace
 
-bool ParseVideoSource(const std::string& value, SourceChoice* out) {
-    SourceChoice c;
-    c.text = value;
-    std::string arg;
-    if (value == "pattern") {
-        c.kind = SourceChoice::kPattern;
-    } else if (value == "none") {
-        c.kind = SourceChoice::kNone;
-    } else if (Is(value, "x11", &arg)) {
-        c.kind = SourceChoice::kX11;
-        c.arg = arg;
-    } else if (Is(value, "v4l2", &arg)) {
-        c.kind = SourceChoice::kV4l2;
-        c.arg = arg.empty() ? "/dev/video0" : arg;
-    } else if (Is(value, "gst", &arg) && !arg.empty()) {
-        c.kind = SourceChoice::kGst;
-        c.arg = arg;
-    } else {
-        return false;
+namespace {
+
+// One accepted form of a source value: "name" alone, or "name:arg" when it takes an argument.
+struct SourceForm {
+    const char* name;
+    SourceChoice::Kind kind;
+    bool takes_arg;
+    bool needs_arg;
+    const char* default_arg;  // for "name" or "name:" alone
+};
+
+template <size_t N>
+bool ParseSource(const std::string& value, const SourceForm (&forms)[N], SourceChoice* out) {
+    for (const SourceForm& form : forms) {
+        std::string arg;
+        bool match = form.takes_arg ? Is(value, form.name, &arg) : value == form.name;
+        if (!match || (form.needs_arg && arg.empty())) continue;
+        out->kind = form.kind;
+        out->arg = arg.empty() ? form.default_arg : arg;
+        out->text = value;
+        return true;
     }
-    *out = c;
-    return true;
+    return false;
+}
+
+constexpr SourceForm kVideoForms[] = {
+    {"pattern", SourceChoice::kPattern, false, false, ""},
+    {"none", SourceChoice::kNone, false, false, ""},
+    {"x11", SourceChoice::kX11, true, false, ""},  // no display: $DISPLAY
+    {"v4l2", SourceChoice::kV4l2, true, false, "/dev/video0"},
+    {"gst", SourceChoice::kGst, true, true, ""},
+};
+
+constexpr SourceForm kAudioForms[] = {
+    {"tone", SourceChoice::kTone, false, false, ""},
+    {"none", SourceChoice::kNone, false, false, ""},
+    {"pulse", SourceChoice::kPulse, true, false, ""},  // no source: the default sink's monitor
+    {"alsa", SourceChoice::kAlsa, true, false, ""},
+    {"gst", SourceChoice::kGst, true, true, ""},
+};
+
+}  // namespace
+
+bool ParseVideoSource(const std::string& value, SourceChoice* out) {
+    return ParseSource(value, kVideoForms, out);
 }
 
 bool ParseAudioSource(const std::string& value, SourceChoice* out) {
-    SourceChoice c;
-    c.text = value;
-    std::string arg;
-    if (value == "tone") {
-        c.kind = SourceChoice::kTone;
-    } else if (value == "none") {
-        c.kind = SourceChoice::kNone;
-    } else if (Is(value, "pulse", &arg)) {
-        c.kind = SourceChoice::kPulse;
-        c.arg = arg;
-    } else if (Is(value, "alsa", &arg)) {
-        c.kind = SourceChoice::kAlsa;
-        c.arg = arg;
-    } else if (Is(value, "gst", &arg) && !arg.empty()) {
-        c.kind = SourceChoice::kGst;
-        c.arg = arg;
-    } else {
-        return false;
-    }
-    *out = c;
-    return true;
+    return ParseSource(value, kAudioForms, out);
 }
 
 SourceChoice ChooseVideoSource(bool sub) {
