@@ -1,5 +1,6 @@
 #include "media/cycle_buffer.h"
 
+#include <chrono>
 #include <cstring>
 
 #include "service/Clocks.h"
@@ -95,12 +96,22 @@ bool cycle_buffer::Reserve(uint64_t len, uint32_t* at, uint32_t* ticket, uint32_
 
 // Makes a copied reservation readable once every reservation before it is.
 void cycle_buffer::Publish(uint32_t at, uint32_t len, uint32_t ticket) {
-    thread_mutex::Scoped hold(m_lock);
-    while (m_published_ticket != ticket) Wait();
-    m_write.store(Advance(at, len), std::memory_order_release);
-    ++m_published_ticket;
-    --m_in_flight;
-    if (m_waiters > 0) m_changed.notify_all();
+    bool writers_wait, reader_served = false;
+    {
+        thread_mutex::Scoped hold(m_lock);
+        while (m_published_ticket != ticket) Wait();
+        m_write.store(Advance(at, len), std::memory_order_release);
+        ++m_published_ticket;
+        --m_in_flight;
+        writers_wait = m_waiters > 0;
+        if (m_reader_wants > 0 && ReaderSatisfied(m_reader_wants)) {
+            m_reader_wants = 0;  // one ring per wait
+            reader_served = true;
+        }
+    }
+    // Outside the lock, so a woken thread does not at once block on it again.
+    if (writers_wait) m_changed.notify_all();
+    if (reader_served) RingBell(false);
 }
 
 int cycle_buffer::write(const unsigned char* data, int len) {
@@ -195,3 +206,40 @@ void cycle_buffer::reset() {
     m_reserved = 0;
     if (m_waiters > 0) m_changed.notify_all();
 }
+
+bool cycle_buffer::ReaderSatisfied(uint32_t len) {
+    if (m_readable.load(std::memory_order_relaxed) != 1) return false;
+    return UsedOf(Snapshot{m_read.load(std::memory_order_acquire),
+                           m_write.load(std::memory_order_acquire)}) >= len;
+}
+
+void cycle_buffer::RingBell(bool wake) {
+    {
+        std::lock_guard<std::mutex> hold(m_bell_lock);
+        (wake ? m_bell_wake : m_bell_data) = true;
+    }
+    m_bell.notify_one();
+}
+
+void cycle_buffer::wait_readable(uint32_t len, unsigned max_ms) {
+    auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(max_ms);
+    {
+        // A ring left by an earlier wait that timed out is not for this one.
+        std::lock_guard<std::mutex> bell(m_bell_lock);
+        m_bell_data = false;
+    }
+    {
+        thread_mutex::Scoped hold(m_lock);
+        if (ReaderSatisfied(len)) return;
+        m_reader_wants = len > 0 ? len : 1;
+    }
+    {
+        std::unique_lock<std::mutex> bell(m_bell_lock);
+        m_bell.wait_until(bell, until, [this] { return m_bell_data || m_bell_wake; });
+        m_bell_data = m_bell_wake = false;
+    }
+    thread_mutex::Scoped hold(m_lock);
+    m_reader_wants = 0;
+}
+
+void cycle_buffer::wake_reader() { RingBell(true); }

@@ -3,6 +3,7 @@
 #include <atomic>
 #include <condition_variable>
 #include <cstdint>
+#include <mutex>
 
 #include "media/thread_mutex.h"
 
@@ -42,6 +43,12 @@ public:
     bool newread(Buffer_Item& item);
     // Empties the ring; the readable and item-stream states stay as they are.
     void reset();
+    // For the consumer with nothing to take: returns once `len` bytes can be read, after a
+    // wake_reader that has not yet ended a wait, or after `max_ms`, whichever comes first. The
+    // write that brings the bytes ends the wait at once, so a consumer need not poll.
+    void wait_readable(uint32_t len, unsigned max_ms);
+    // Ends the consumer's current or next wait_readable (to stop it without a timeout).
+    void wake_reader();
 
     unsigned capacity() const { return m_capacity; }
     // What a writer can put in now (writes under way count as used).
@@ -65,6 +72,8 @@ private:
     bool Reserve(uint64_t len, uint32_t* at, uint32_t* ticket, uint32_t* free);
     void Publish(uint32_t at, uint32_t len, uint32_t ticket);
     void Wait() ORVEX_REQUIRES(m_lock);
+    bool ReaderSatisfied(uint32_t len) ORVEX_REQUIRES(m_lock);
+    void RingBell(bool wake);
 
     thread_mutex m_lock;
     unsigned char* m_start;
@@ -81,8 +90,16 @@ private:
     uint32_t m_published_ticket ORVEX_GUARDED_BY(m_lock) = 0;
     uint32_t m_in_flight ORVEX_GUARDED_BY(m_lock) = 0;
     uint32_t m_resets_waiting ORVEX_GUARDED_BY(m_lock) = 0;
-    uint32_t m_waiters ORVEX_GUARDED_BY(m_lock) = 0;
-    std::condition_variable_any m_changed;  // a publish or a reset finished
+    uint32_t m_waiters ORVEX_GUARDED_BY(m_lock) = 0;  // writers and resets in Wait
+    std::condition_variable_any m_changed;            // a publish or a reset finished
+    // What the consumer waits for in wait_readable (0: it does not wait), so that only the
+    // publish that brings that much wakes it. It sleeps on a bell of its own: a plain mutex and
+    // condition variable, rung after the ring's lock is released, cost one futex wake.
+    uint32_t m_reader_wants ORVEX_GUARDED_BY(m_lock) = 0;
+    std::mutex m_bell_lock;
+    std::condition_variable m_bell;
+    bool m_bell_data = false;  // the publish the wait asked for came (guarded by m_bell_lock)
+    bool m_bell_wake = false;  // wake_reader, kept for a wait not yet begun (m_bell_lock)
     uint32_t m_threshold = 0;
     std::atomic<int> m_readable{0};
     uint32_t m_written_before_readable ORVEX_GUARDED_BY(m_lock) = 0;

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <atomic>
+#include <chrono>
 #include <cstring>
 #include <memory>
 #include <random>
@@ -189,6 +190,70 @@ TEST_F(CycleBufferTest, ProducerAndConsumerMove100MegabytesIntact) {
     EXPECT_EQ(bad, 0u);
     EXPECT_EQ(ring.used_space(), 0u);
     EXPECT_TRUE(fake.log.Texts(kTag).empty());
+}
+
+// The consumer's wait ends on the write that completes what it asked for, not on an earlier
+// smaller one. The bound is an hour, so only a write (or a lost wake-up: a hang) ends it.
+constexpr unsigned kHour = 3600 * 1000;
+
+TEST_F(CycleBufferTest, WaitReadableEndsOnlyWhenEnoughIsThere) {
+    cycle_buffer ring(100000);
+    auto chunk = Bytes(1000, 3);
+    for (uint32_t wanted : {1u, 1000u, 3840u}) {
+        std::atomic<bool> waiting{false};
+        unsigned seen = 0;
+        std::thread consumer([&] {
+            waiting = true;
+            ring.wait_readable(wanted, kHour);
+            seen = ring.used_space();
+        });
+        while (!waiting) std::this_thread::yield();
+        for (uint32_t put = 0; put < wanted; put += 1000) {
+            std::this_thread::sleep_for(std::chrono::milliseconds(2));  // let it sleep first
+            ASSERT_EQ(ring.write(chunk.data(), 1000), 1000);
+        }
+        consumer.join();
+        EXPECT_GE(seen, wanted);
+        std::vector<unsigned char> sink(ring.used_space());
+        ring.read(sink.data(), static_cast<int>(sink.size()));
+    }
+}
+
+TEST_F(CycleBufferTest, WakeReaderEndsTheWaitUnderWayOrTheNextOne) {
+    cycle_buffer ring(1000);
+    ring.wake_reader();
+    ring.wait_readable(1, kHour);  // woken before it began
+    std::thread consumer([&] { ring.wait_readable(1, kHour); });
+    std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    ring.wake_reader();
+    consumer.join();
+    EXPECT_EQ(ring.used_space(), 0u);
+}
+
+// A send loop's shape: take what is there, else wait for a write. 20000 items from a producer
+// that sometimes pauses; a wake-up lost between the look and the wait would hang it.
+TEST_F(CycleBufferTest, WaitingConsumerMissesNoItem) {
+    cycle_buffer ring(4096);
+    constexpr unsigned kItems = 20000;
+    std::thread producer([&] {
+        std::mt19937 rng(7);
+        unsigned char payload[100] = {};
+        for (unsigned i = 1; i <= kItems; ++i) {
+            while (ring.free_space() < sizeof payload + kItemHeaderSize) std::this_thread::yield();
+            ASSERT_TRUE(ring.newwrite(payload, 1 + static_cast<int>(i % 100), i, false));
+            if (rng() % 8 == 0) std::this_thread::yield();
+        }
+    });
+    unsigned next = 1;
+    while (next <= kItems) {
+        if (!ring.newread(*item)) {
+            ring.wait_readable(kItemHeaderSize + 1, kHour);
+            continue;
+        }
+        ASSERT_EQ(item->timestamp, next);
+        ++next;
+    }
+    producer.join();
 }
 
 // Stress rounds for writers that run alongside each other and alongside reset. Items carry
