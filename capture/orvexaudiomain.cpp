@@ -16,6 +16,7 @@
 #include "server/skyvo_rtsp.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
+#include "service/ThreadName.h"
 
 namespace {
 
@@ -24,6 +25,8 @@ constexpr int kPxAttrCaptureSource = 5;
 // An encoder that keeps answering with codes it does not document is given up on per block,
 // so the loop cannot spin for ever.
 constexpr int kUnknownResultsMax = 64;
+// When the encoder waits for PCM writes, only a lost wake-up would need this bound.
+constexpr unsigned kEncoderIdleBoundMs = 100;
 
 struct Worker {
     pthread_t handle{};
@@ -56,12 +59,14 @@ DumpFile g_aac_dump(kTag, "/data/app/orvextestaudio.aac", "/mnt/usb/sda1/orvexte
                     &kAlwaysSay);
 
 void* PcmThread(void* flag) {
+    NameThisThread("orvex-pcm");
     OrvexLog(kTag, "real_start_audiorecord_thread");
     audio_output_pcm(static_cast<std::atomic<int>*>(flag));
     return nullptr;
 }
 
 void* AacThread(void* flag) {
+    NameThisThread("orvex-aac-enc");
     OrvexLog(kTag, "real_start_audioenc_thread");
     audio_aac_enc(static_cast<std::atomic<int>*>(flag));
     return nullptr;
@@ -206,10 +211,15 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
 
     static unsigned char input[kPcmBlockBytes];
     static unsigned char output[kPcmBlockBytes];
+    const bool wake_on_write = Global_Config::instance()->wake_on_write();
     bool ended = false;
     while (!ended && run_flag->load(std::memory_order_relaxed) != 0) {
         if (g_pcm_ring.read(input, kPcmBlockBytes) < 1) {
-            usleep(5000);
+            if (wake_on_write) {
+                g_pcm_ring.wait_readable(kPcmBlockBytes, kEncoderIdleBoundMs);
+            } else {
+                usleep(5000);
+            }
             continue;
         }
         VO_CODECBUFFER in{input, kPcmBlockBytes, 0};
@@ -264,6 +274,7 @@ void stop_audio_record_enc() {
     if (get_write_aac_file()) reset_write_aac_file();
     g_pcm.run = 0;
     g_aac.run = 0;
+    g_pcm_ring.wake_reader();  // an encoder waiting for PCM sees the flag at once
     Join(g_pcm, "thread_join(g_thread_audio_pcm.thread_handle)");
     Join(g_aac, "thread_join(g_thread_audio_aac.thread_handle)");
     // Only now: a thread still running could otherwise open its dump again.

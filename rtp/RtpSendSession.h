@@ -1,6 +1,7 @@
 #pragma once
 
 #include <pthread.h>
+#include <unistd.h>
 
 #include <atomic>
 #include <cstdint>
@@ -44,6 +45,9 @@ protected:
     virtual void BeforeStart() {}
     // The send loop; returns once m_running is 0.
     virtual void Run() = 0;
+    // The loop's pause when it has nothing to send: `poll_us` of sleep, or, when the loops wait
+    // for writes, until the ring holds an item (at most a long safety bound).
+    void Idle(useconds_t poll_us);
 
     std::atomic<int> m_running{1};
     cycle_buffer* m_ring = nullptr;
@@ -55,6 +59,7 @@ private:
 
     pthread_t m_thread{};
     bool m_thread_started = false;
+    std::atomic<bool> m_wake_on_write{false};
     unsigned m_server_port;
     const char* m_closed_text;
 };

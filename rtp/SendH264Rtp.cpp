@@ -12,6 +12,7 @@
 #include "rtp/h264_sps.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
+#include "service/ThreadName.h"
 
 namespace {
 
@@ -63,6 +64,7 @@ void H264RtpTransportSession::InspectParameterSets(const Buffer_Item& item) {
 }
 
 void H264RtpTransportSession::procH264Thread() {
+    NameThisThread("orvex-h264-send");
     int sock = socket(AF_INET, SOCK_DGRAM, 0);
     m_sps_seen = true;  // inspection stays dormant unless a flag is cleared
     m_pps_seen = true;
@@ -90,12 +92,12 @@ void H264RtpTransportSession::procH264Thread() {
                 OrvexPrintLog(kTag, "Video and audio timestamp compare: audio delay %d \n",
                               static_cast<int32_t>(video_ms - audio_ms));
             }
-            usleep(kIdleSleepUs);
+            usleep(kIdleSleepUs);  // audio moves on by itself: no write to wait for here
             continue;
         }
         m_dests.Refresh();
         if (m_ring == nullptr || !m_ring->newread(*item)) {
-            usleep(kIdleSleepUs);
+            Idle(kIdleSleepUs);
             continue;
         }
         if (state.TakeFirstItem()) {
@@ -104,12 +106,12 @@ void H264RtpTransportSession::procH264Thread() {
             config->set_current_signal_status(1);
         }
         if (state.Admit(config->isPause()) == H264SendState::kDrop) {
-            usleep(kIdleSleepUs);
+            Idle(kIdleSleepUs);
             continue;
         }
         InspectParameterSets(*item);
         if (m_dests.targets().empty()) {
-            usleep(kIdleSleepUs);
+            Idle(kIdleSleepUs);
             continue;
         }
         AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);

@@ -11,6 +11,7 @@
 #include "rtp/SendLoopState.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
+#include "service/ThreadName.h"
 
 namespace {
 
@@ -52,6 +53,7 @@ void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, int sockf
 }
 
 void MP3RtpTransportSession::procMP3Thread() {
+    NameThisThread("orvex-aac-send");
     Global_Config* config = Global_Config::instance();
     int sock = socket(AF_INET, SOCK_DGRAM, 0);
     sockaddr_in local{};
@@ -80,7 +82,7 @@ void MP3RtpTransportSession::procMP3Thread() {
         GetSocketInfoList();
         bool got = m_ring != nullptr && m_ring->newread(*item);
         if (!got || config->isPause() || !config->InIISOK() || m_dests.targets().empty()) {
-            usleep(kIdleSleepUs);
+            Idle(kIdleSleepUs);
             continue;
         }
         AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);

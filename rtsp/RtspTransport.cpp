@@ -18,6 +18,7 @@
 #include "server/QuitFlag.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
+#include "service/ThreadName.h"
 
 std::atomic<int> g_capture_running{0};
 std::atomic<unsigned> g_accepts_without_clients{0};
@@ -124,6 +125,7 @@ bool RtspTransport::Open(const char* ip, unsigned port, unsigned extra) {
 }
 
 void* RtspTransport::StartListenThread(void* self) {
+    NameThisThread("orvex-rtsp");
     static_cast<RtspTransport*>(self)->ListenThread();
     return nullptr;
 }

@@ -1,5 +1,7 @@
 #include "service/GlobalConfig.h"
 
+#include <cstring>
+
 #include "media/LazyInstance.h"
 #include "platform/Ports.h"
 #include "service/OrvexLog.h"
@@ -50,6 +52,17 @@ void Global_Config::read_audio_payload_type() {
         return;
     }
     m_audio_payload_type = static_cast<int32_t>(pt);
+}
+
+void Global_Config::read_wake_mode() {
+    char value[platform::kPropertyValueMax] = {};
+    platform::Properties().Get("kv.orvex.wake", value, "");
+    bool event = strcmp(value, "event") == 0;
+    if (!event && value[0] != '\0' && strcmp(value, "poll") != 0) {
+        OrvexLog(kTag, "kv.orvex.wake=\"%s\" is neither poll nor event; idle loops keep polling",
+                 value);
+    }
+    m_wake_on_write.store(event, std::memory_order_relaxed);
 }
 
 void Global_Config::mp3_config_ok() {

@@ -43,6 +43,14 @@ public:
     // Takes the audio RTP payload type from the property kv.orvex.audiopt: a number from 96
     // to 127; anything else is logged and leaves 98. Called once, when the server opens.
     void read_audio_payload_type();
+    // Takes how idle loops wait from the property kv.orvex.wake: "poll" (the default: fixed
+    // short sleeps) or "event" (a ring's consumer sleeps until a write, the run-flag loops
+    // look ten times less often). Anything else is logged and leaves polling. Called once,
+    // when the server opens; threads read it when they start.
+    void read_wake_mode();
+    bool wake_on_write() const { return m_wake_on_write.load(std::memory_order_relaxed); }
+    // The sleep of the loops that only watch a run flag (the main and binder service loops).
+    unsigned run_flag_poll_us() const { return wake_on_write() ? 100000 : 10000; }
 
     void mp3_config_ok();
     void h264_config_frequency_ok();
@@ -80,6 +88,7 @@ private:
     orvexPIPCfg m_pip_cfg;
     std::atomic<bool> m_flag_run_pause{false};
     std::atomic<bool> m_flag_sub{false};
+    std::atomic<bool> m_wake_on_write{false};
     TLock m_timestamp_lock;
     unsigned m_video_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;
     unsigned m_audio_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;

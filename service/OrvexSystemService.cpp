@@ -4,8 +4,10 @@
 #include <unistd.h>
 
 #include "platform/Ports.h"
+#include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
 #include "service/OrvexService.h"
+#include "service/ThreadName.h"
 
 namespace {
 
@@ -26,7 +28,8 @@ int start_orvex_service_main(std::atomic<bool>* run) {
     android::OrvexService::instantiate();
     OrvexPuts("\n start orvex service ");
     OrvexLog(kTag, "\n start orvex service \n");
-    while (run->load(std::memory_order_relaxed)) usleep(10000);
+    const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
+    while (run->load(std::memory_order_relaxed)) usleep(poll_us);
     OrvexPuts("\n end orvex service ");
     OrvexLog(kTag, "\n end orvex service \n");
     OrvexPrintLog(kTag, "OrvexServiceThread end");
@@ -34,6 +37,7 @@ int start_orvex_service_main(std::atomic<bool>* run) {
 }
 
 void* start_orvex_service_thread(void*) {
+    NameThisThread("orvex-service");
     OrvexPrintLog(kTag, "start_orvex_service_thread");
     start_orvex_service_main(&g_service_run);
     return nullptr;

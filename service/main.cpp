@@ -11,6 +11,7 @@
 #include "capture/orvexaudiomain.h"
 #include "platform/Ports.h"
 #include "server/skyvo_rtsp.h"
+#include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
 #include "service/OrvexSystemService.h"
 
@@ -101,9 +102,10 @@ int main(int argc, char** argv) {
         return result;
     }
     start_orvex_system_service();
+    const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
     while (__atomic_load_n(&g_quit_flag, __ATOMIC_RELAXED) != 0) {
         ReportSignal();
-        usleep(10000);
+        usleep(poll_us);
     }
     ReportSignal();
 

@@ -34,11 +34,14 @@ Bytes AdtsFrame(unsigned size) {
     return b;
 }
 
-class SendSessionTest : public ::testing::Test {
+// Every case runs with both ways of waiting for items: the packets must not differ.
+class SendSessionTest : public ::testing::TestWithParam<const char*> {
 protected:
     SendSessionTest() {
         Global_Config::CloseInstance();
         config = Global_Config::instance();
+        fake.properties.Set("kv.orvex.wake", GetParam());
+        config->read_wake_mode();
         config->m_video_rtp_frequency = 90000;
         config->m_audio_rtp_frequency = 48000;
         config->m_audio_rtp_port = 0;  // any port: tests may run side by side
@@ -71,7 +74,7 @@ protected:
     MP3RtpTransportSession* audio;
 };
 
-TEST_F(SendSessionTest, VideoPacketsReachEveryDestinationWithItemTimestamps) {
+TEST_P(SendSessionTest, VideoPacketsReachEveryDestinationWithItemTimestamps) {
     UdpReceiver a, b;
     config->set_timestamp(1000000, false);  // audio far ahead: no pacing here
     video->add_dest_socket_info(Key(1), a.port(), "127.0.0.1");
@@ -97,7 +100,7 @@ TEST_F(SendSessionTest, VideoPacketsReachEveryDestinationWithItemTimestamps) {
 }
 
 // A broadcast address without SO_BROADCAST fails every time, deterministically.
-TEST_F(SendSessionTest, VideoStopsAPacketAtTheFirstFailingDestinationAudioGoesOn) {
+TEST_P(SendSessionTest, VideoStopsAPacketAtTheFirstFailingDestinationAudioGoesOn) {
     UdpReceiver ok;
     config->set_timestamp(1000000, false);
     video->add_dest_socket_info(Key(1), 9, "255.255.255.255");
@@ -127,7 +130,7 @@ TEST_F(SendSessionTest, VideoStopsAPacketAtTheFirstFailingDestinationAudioGoesOn
     EXPECT_NE(out.find("\n\n  mp3 frame send error ! \n \n"), std::string::npos);
 }
 
-TEST_F(SendSessionTest, VideoHoldsWhile251MsAheadOfAudio) {
+TEST_P(SendSessionTest, VideoHoldsWhile251MsAheadOfAudio) {
     UdpReceiver r;
     video->add_dest_socket_info(Key(1), r.port(), "127.0.0.1");
     ASSERT_EQ(video->StartSendThread(), 0);
@@ -142,7 +145,7 @@ TEST_F(SendSessionTest, VideoHoldsWhile251MsAheadOfAudio) {
     EXPECT_EQ(Ts(r.Receive()), 270000u);
 }
 
-TEST_F(SendSessionTest, WithoutDestinationsItemsAreDiscardedAndTheGapCounts) {
+TEST_P(SendSessionTest, WithoutDestinationsItemsAreDiscardedAndTheGapCounts) {
     config->set_timestamp(1000000, false);
     ASSERT_EQ(video->StartSendThread(), 0);
     Feed(video_ring, NalItem(10, 0x41), 500);
@@ -157,7 +160,7 @@ TEST_F(SendSessionTest, WithoutDestinationsItemsAreDiscardedAndTheGapCounts) {
     EXPECT_EQ(Ts(p), 62999u);
 }
 
-TEST_F(SendSessionTest, AudioDropsFramesWhilePausedOrNotReady) {
+TEST_P(SendSessionTest, AudioDropsFramesWhilePausedOrNotReady) {
     UdpReceiver r;
     audio->add_dest_socket_info(Key(1), r.port(), "127.0.0.1");
     ASSERT_EQ(audio->StartSendThread(), 0);
@@ -173,9 +176,10 @@ TEST_F(SendSessionTest, AudioDropsFramesWhilePausedOrNotReady) {
     EXPECT_EQ(Seq(p), 0);
 }
 
-TEST_F(SendSessionTest, AudioWaitsForBothClockRates) {
+TEST_P(SendSessionTest, AudioWaitsForBothClockRates) {
     Global_Config::CloseInstance();
     config = Global_Config::instance();
+    config->read_wake_mode();
     config->m_audio_rtp_frequency = 48000;
     config->mp3_config_ok();  // the video rate is still missing
     UdpReceiver r;
@@ -185,5 +189,7 @@ TEST_F(SendSessionTest, AudioWaitsForBothClockRates) {
     WaitEmpty(audio_ring);
     EXPECT_TRUE(r.Receive(100).empty());
 }
+
+INSTANTIATE_TEST_SUITE_P(WakeModes, SendSessionTest, ::testing::Values("poll", "event"));
 
 }  // namespace

@@ -117,6 +117,36 @@ TEST_F(GlobalConfigTest, AudioPayloadTypeProperty) {
     }
 }
 
+// kv.orvex.wake: "event" makes idle loops wait for writes; anything but "poll" or unset is
+// logged once and they poll, as on the television.
+TEST_F(GlobalConfigTest, WakeModeProperty) {
+    const std::string bad = "\" is neither poll nor event; idle loops keep polling";
+    struct Case {
+        const char* value;  // null: the property is missing
+        bool event;
+        unsigned flag_poll_us;
+        std::vector<std::string> log;
+    } cases[] = {
+        {nullptr, false, 10000, {}},
+        {"", false, 10000, {}},
+        {"poll", false, 10000, {}},
+        {"event", true, 100000, {}},
+        {"Event", false, 10000, {"kv.orvex.wake=\"Event" + bad}},
+        {"event ", false, 10000, {"kv.orvex.wake=\"event " + bad}},
+        {"1", false, 10000, {"kv.orvex.wake=\"1" + bad}},
+    };
+    for (const Case& c : cases) {
+        fake.properties.Clear();
+        if (c.value != nullptr) fake.properties.Set("kv.orvex.wake", c.value);
+        fake.log.Clear();
+        Global_Config* config = Global_Config::instance();
+        config->read_wake_mode();
+        EXPECT_EQ(config->wake_on_write(), c.event) << (c.value ? c.value : "missing");
+        EXPECT_EQ(config->run_flag_poll_us(), c.flag_poll_us) << (c.value ? c.value : "missing");
+        EXPECT_EQ(fake.log.Texts("globalconfig"), c.log) << (c.value ? c.value : "missing");
+    }
+}
+
 TEST_F(GlobalConfigTest, ConcurrentFirstUseCreatesOneObject) {
     Global_Config::CloseInstance();
     std::vector<Global_Config*> seen(4);
