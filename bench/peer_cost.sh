@@ -65,6 +65,7 @@ inside_orvex() {
 kelvo.build.kelvotv=sa
 ro.board.platform=android
 kv.orvex.audiopt=97
+kv.orvex.wake=${ORVEX_WAKE:-event}
 orvex.host.log=file:$work/orvex.log
 orvex.host.video=none
 orvex.host.audio=tone

@@ -3,7 +3,8 @@
 # command starts it (the shipped host properties: audio packets carry the SDP's payload type
 # 97): ffprobe, ffmpeg and GStreamer play picture and sound, a raw RTP client checks the
 # packets, ffmpeg measures frame rate and A/V offset per capture size, SIGTERM stops it. Then
-# with kv.orvex.audiopt removed, as on the television: the audio packets carry 98 again.
+# with kv.orvex.audiopt and kv.orvex.wake removed, as on the television: the audio packets
+# carry 98 again and idle threads poll.
 #   tools/e2e.sh [BUILD_DIR]      (needs root for port 554)
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
@@ -122,8 +123,9 @@ for size in "640 480" "1280 720" "1920 1080"; do
 done
 stop
 
-# As on the television: no kv.orvex.audiopt, so the audio packets carry 98.
-grep -v '^kv.orvex.audiopt=' "$top/platform/host/orvex.prop" >"$work/tv.prop"
+# As on the television: no kv.orvex.audiopt, so the audio packets carry 98; no kv.orvex.wake.
+grep -v -e '^kv.orvex.audiopt=' -e '^kv.orvex.wake=' "$top/platform/host/orvex.prop" \
+  >"$work/tv.prop"
 start env ORVEX_PROP_FILE="$work/tv.prop" "$build/orvex"
 packets 98
 sleep 1
