@@ -27,6 +27,8 @@ namespace {
 
 constexpr size_t kHeaderSize = 12;
 constexpr size_t kReadChunk = 64 * 1024;
+// A connection keeps a buffer this big between transactions: any frame the rings can hold.
+constexpr size_t kKeptBytes = 1u << 20;
 
 __attribute__((format(printf, 1, 2))) void Debug(const char* format, ...) {
     char text[512];
@@ -305,18 +307,18 @@ void HostBinder::Serve(int fd, BinderService& service) {
             DrainQueued(fd);
             return;
         }
-        // Grown as bytes arrive, so a peer lying about the size costs only what it sent.
-        data.clear();
-        while (data.size() < size) {
-            size_t at = data.size();
+        // Grown as bytes arrive, so a peer lying about the size costs only what it sent, and
+        // kept for the next transaction, so a stream of frames allocates nothing.
+        for (size_t at = 0; at < size;) {
             size_t want = std::min<size_t>(size - at, kReadChunk);
-            data.resize(at + want);
+            if (data.size() < at + want) data.resize(at + want);
             if (ReadFull(fd, data.data() + at, want) != static_cast<ssize_t>(want)) {
                 Debug("binder: transaction %u dropped after %zu of %u bytes", code, at, size);
                 return;
             }
+            at += want;
         }
-        ParcelReader reader(data.data(), data.size());
+        ParcelReader reader(data.data(), size);
         int status;
         try {
             status = service.onTransact(code, reader, flags);
@@ -328,7 +330,7 @@ void HostBinder::Serve(int fd, BinderService& service) {
             status = kUnknownError;
         }
         if (!SendStatus(fd, status)) return;
-        if (data.capacity() > 4 * kReadChunk) std::vector<uint8_t>().swap(data);
+        if (data.capacity() > kKeptBytes) std::vector<uint8_t>().swap(data);
     }
 }
 
