@@ -1,3 +1,7 @@
 orvex_test(orvex_host_capture_tests
   SOURCES platform/host_capture_test.cpp
   LIBS orvex_platform_host)
+# Links neither OpenH264 nor GStreamer, so that it sees what the sources load.
+orvex_test(orvex_host_lazy_tests
+  SOURCES platform/host_lazy_test.cpp
+  LIBS orvex_platform_host)

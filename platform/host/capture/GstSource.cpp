@@ -1,177 +1,82 @@
 #include "platform/host/capture/GstSource.h"
 
-#include <gst/app/gstappsink.h>
-#include <gst/gst.h>
-#include <gst/video/video.h>
+#include <dlfcn.h>
+#include <unistd.h>
 
-#include <algorithm>
-#include <cstring>
+#include <cstdlib>
 #include <mutex>
 
 namespace platform {
 namespace host {
 namespace {
 
-constexpr uint64_t kFirstSampleWaitNs = 3000000000u;
-constexpr uint64_t kPollNs = 50000000u;
-
-bool InitOnce(std::string* error) {
-    static std::once_flag once;
-    static std::string failure;
-    std::call_once(once, [] {
-        GError* err = nullptr;
-        if (!gst_init_check(nullptr, nullptr, &err)) {
-            failure = err != nullptr ? err->message : "GStreamer cannot start";
-            g_clear_error(&err);
-        }
-    });
-    if (failure.empty()) return true;
-    *error = failure;
-    return false;
+std::string ModulePath() {
+    const char* chosen = getenv("ORVEX_HOST_GST_MODULE");
+    if (chosen != nullptr && chosen[0] != '\0') return chosen;
+    // An installed service keeps the module beside itself; test programs elsewhere in the
+    // build tree find it where the build put it.
+    char exe[4096];
+    ssize_t n = readlink("/proc/self/exe", exe, sizeof exe - 1);
+    if (n > 0) {
+        std::string path(exe, static_cast<size_t>(n));
+        path = path.substr(0, path.rfind('/') + 1) + ORVEX_HOST_GST_MODULE_NAME;
+        if (access(path.c_str(), F_OK) == 0) return path;
+    }
+    return ORVEX_HOST_GST_MODULE_PATH;
 }
 
-// Pops the first error or end-of-stream message, dropping the bus's other messages so that
-// they do not pile up while streaming.
-bool PopEnd(GstElement* pipeline, std::string* why) {
-    GstBus* bus = gst_element_get_bus(pipeline);
-    GstMessage* msg =
-        gst_bus_pop_filtered(bus, static_cast<GstMessageType>(GST_MESSAGE_ERROR | GST_MESSAGE_EOS));
-    gst_object_unref(bus);
-    if (msg == nullptr) return false;
-    if (GST_MESSAGE_TYPE(msg) == GST_MESSAGE_EOS) {
-        *why = "end of stream";
-    } else {
-        GError* err = nullptr;
-        gst_message_parse_error(msg, &err, nullptr);
-        *why = err != nullptr ? err->message : "error";
-        g_clear_error(&err);
+// Loads the module once; a failure is tried again at the next start. It is never unloaded:
+// GLib and GStreamer cannot be.
+LiveSourceFactory LoadModule(std::string* error) {
+    static std::mutex mutex;
+    static LiveSourceFactory factory = nullptr;
+    std::lock_guard<std::mutex> hold(mutex);
+    if (factory != nullptr) return factory;
+    std::string path = ModulePath();
+    void* module = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
+    void* entry = module != nullptr ? dlsym(module, kLiveSourceFactory) : nullptr;
+    if (entry == nullptr) {
+        const char* why = dlerror();
+        *error = std::string("cannot load ") + ORVEX_HOST_GST_MODULE_NAME + ": " +
+                 (why != nullptr ? why : path);
+        if (module != nullptr) dlclose(module);
+        return nullptr;
     }
-    gst_message_unref(msg);
-    return true;
+    factory = reinterpret_cast<LiveSourceFactory>(entry);
+    return factory;
 }
 
 }  // namespace
 
+GstSource::GstSource() = default;
 GstSource::~GstSource() { stop(); }
 
 bool GstSource::start(const std::string& description, std::string* error) {
     stop();
-    if (!InitOnce(error)) return false;
-    GError* err = nullptr;
-    GstElement* pipeline = gst_parse_launch(description.c_str(), &err);
-    if (pipeline == nullptr || err != nullptr) {
-        *error = err != nullptr ? err->message : "the pipeline does not parse";
-        g_clear_error(&err);
-        if (pipeline != nullptr) gst_object_unref(pipeline);
-        return false;
-    }
-    // A description of a single element comes back as that element, not as a bin.
-    GstElement* sink =
-        GST_IS_BIN(pipeline) ? gst_bin_get_by_name(GST_BIN(pipeline), "orvexsink") : nullptr;
-    if (sink == nullptr || !GST_IS_APP_SINK(sink)) {
-        *error = "the pipeline has no appsink";
-        if (sink != nullptr) gst_object_unref(sink);
-        gst_object_unref(pipeline);
-        return false;
-    }
-    pipeline_ = pipeline;
-    sink_ = sink;
-    bool failed = gst_element_set_state(pipeline_, GST_STATE_PLAYING) == GST_STATE_CHANGE_FAILURE;
-    std::string why;
-    for (uint64_t waited = 0; waited < kFirstSampleWaitNs; waited += kPollNs) {
-        if (PopEnd(pipeline_, &why)) {
-            failed = true;
-            break;
+    if (live_ == nullptr) {
+        LiveSourceFactory create = LoadModule(error);
+        if (create == nullptr) return false;
+        live_.reset(create());
+        if (live_ == nullptr) {
+            *error = "out of memory";
+            return false;
         }
-        if (failed) break;
-        pending_ = pull(kPollNs);
-        if (pending_ != nullptr) break;
     }
-    if (failed) {
-        *error = why.empty() ? "the pipeline does not start" : why;
-        stop();
-        return false;
-    }
-    // A live source that is slow to deliver is not an error: frames come when they come.
-    return true;
+    return live_->start(description, error);
 }
 
 void GstSource::stop() {
-    if (pending_ != nullptr) gst_sample_unref(pending_);
-    pending_ = nullptr;
-    pending_offset_ = 0;
-    if (pipeline_ != nullptr) gst_element_set_state(pipeline_, GST_STATE_NULL);
-    if (sink_ != nullptr) gst_object_unref(sink_);
-    if (pipeline_ != nullptr) gst_object_unref(pipeline_);
-    sink_ = nullptr;
-    pipeline_ = nullptr;
+    if (live_ != nullptr) live_->stop();
 }
 
-bool GstSource::ended(std::string* why) { return pipeline_ != nullptr && PopEnd(pipeline_, why); }
-
-GstSample* GstSource::pull(uint64_t timeout_ns) {
-    return gst_app_sink_try_pull_sample(GST_APP_SINK(sink_), timeout_ns);
-}
+bool GstSource::ended(std::string* why) { return live_ != nullptr && live_->ended(why); }
 
 bool GstSource::latestFrame(uint8_t* i420, int width, int height) {
-    if (pipeline_ == nullptr) return false;
-    GstSample* sample = pending_;
-    pending_ = nullptr;
-    while (GstSample* newer = pull(0)) {
-        if (sample != nullptr) gst_sample_unref(sample);
-        sample = newer;
-    }
-    if (sample == nullptr) return false;
-    bool copied = false;
-    GstVideoInfo info;
-    GstBuffer* buffer = gst_sample_get_buffer(sample);
-    if (buffer != nullptr && gst_video_info_from_caps(&info, gst_sample_get_caps(sample)) &&
-        GST_VIDEO_INFO_FORMAT(&info) == GST_VIDEO_FORMAT_I420 &&
-        GST_VIDEO_INFO_WIDTH(&info) == width && GST_VIDEO_INFO_HEIGHT(&info) == height) {
-        GstVideoFrame frame;
-        if (gst_video_frame_map(&frame, &info, buffer, GST_MAP_READ)) {
-            uint8_t* out = i420;
-            for (int p = 0; p < 3; ++p) {
-                int w = p == 0 ? width : width / 2, h = p == 0 ? height : height / 2;
-                const auto* in = static_cast<const uint8_t*>(GST_VIDEO_FRAME_PLANE_DATA(&frame, p));
-                int stride = GST_VIDEO_FRAME_PLANE_STRIDE(&frame, p);
-                for (int row = 0; row < h; ++row, out += w) {
-                    memcpy(out, in + static_cast<size_t>(row) * stride, w);
-                }
-            }
-            gst_video_frame_unmap(&frame);
-            if (GST_BUFFER_PTS_IS_VALID(buffer)) last_pts_ns_ = GST_BUFFER_PTS(buffer);
-            copied = true;
-        }
-    }
-    gst_sample_unref(sample);
-    return copied;
+    return live_ != nullptr && live_->latestFrame(i420, width, height);
 }
 
 size_t GstSource::readBytes(uint8_t* out, size_t size, int timeout_ms) {
-    if (pipeline_ == nullptr || size == 0) return 0;
-    if (pending_ == nullptr) {
-        pending_ = pull(static_cast<uint64_t>(timeout_ms) * 1000000u);
-        pending_offset_ = 0;
-        if (pending_ == nullptr) return 0;
-    }
-    size_t copied = 0;
-    GstBuffer* buffer = gst_sample_get_buffer(pending_);
-    GstMapInfo map;
-    if (buffer != nullptr && gst_buffer_map(buffer, &map, GST_MAP_READ)) {
-        if (pending_offset_ < map.size) {
-            copied = std::min(size, map.size - pending_offset_);
-            memcpy(out, map.data + pending_offset_, copied);
-            pending_offset_ += copied;
-        }
-        bool done = pending_offset_ >= map.size;
-        gst_buffer_unmap(buffer, &map);
-        if (!done) return copied;
-    }
-    gst_sample_unref(pending_);
-    pending_ = nullptr;
-    pending_offset_ = 0;
-    return copied;
+    return live_ != nullptr ? live_->readBytes(out, size, timeout_ms) : 0;
 }
 
 }  // namespace host

@@ -1,5 +1,6 @@
 #include "platform/host/video/HostMediaRecorder.h"
 
+#include <dlfcn.h>
 #include <time.h>
 #include <wels/codec_api.h>
 
@@ -9,6 +10,7 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <mutex>
 #include <system_error>
 
 #include "platform/Ports.h"
@@ -54,6 +56,39 @@ size_t StartCodeLength(const uint8_t* p, int len) {
     if (len >= 4 && p[0] == 0 && p[1] == 0 && p[2] == 0 && p[3] == 1) return 4;
     if (len >= 3 && p[0] == 0 && p[1] == 0 && p[2] == 1) return 3;
     return 0;
+}
+
+// The two C entry points of OpenH264; the encoder itself is reached through its vtable.
+struct OpenH264 {
+    decltype(&WelsCreateSVCEncoder) create = nullptr;
+    decltype(&WelsDestroySVCEncoder) destroy = nullptr;
+};
+
+// Loads OpenH264 at the first encoder and keeps it; a failure logs one line and is tried
+// again at the next prepare. Null when it does not load.
+const OpenH264* LoadOpenH264() {
+    static std::mutex mutex;
+    static OpenH264 api;
+    std::lock_guard<std::mutex> hold(mutex);
+    if (api.create != nullptr) return &api;
+    void* library = dlopen(ORVEX_OPENH264_SONAME, RTLD_NOW | RTLD_LOCAL);
+    OpenH264 found;
+    if (library != nullptr) {
+        found.create =
+            reinterpret_cast<decltype(found.create)>(dlsym(library, "WelsCreateSVCEncoder"));
+        found.destroy =
+            reinterpret_cast<decltype(found.destroy)>(dlsym(library, "WelsDestroySVCEncoder"));
+    }
+    if (found.create == nullptr || found.destroy == nullptr) {
+        const char* why = dlerror();
+        std::string line = std::string("MediaRecorder: cannot load " ORVEX_OPENH264_SONAME ": ") +
+                           (why != nullptr ? why : "no encoder entry points");
+        Log().Write(kLogIdSystem, kLogError, kTag, line.c_str());
+        if (library != nullptr) dlclose(library);
+        return nullptr;
+    }
+    api = found;
+    return &api;
 }
 
 // Whether flattened camera parameters select the sub window (traveling-mode 4).
@@ -157,7 +192,9 @@ int HostMediaRecorder::prepare() {
     parcel_.writeInt32(0);
     parcel_.clear();
     if (int rc = openSource()) return rc;
-    if (int rc = openEncoder()) {
+    // "none" encodes nothing (another binder client sends the frames): no OpenH264 at all.
+    int rc = source_.kind == SourceChoice::kNone ? 0 : openEncoder();
+    if (rc != 0) {
         live_.reset();
         return rc;
     }
@@ -206,7 +243,9 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
 }
 
 int HostMediaRecorder::openEncoder() {
-    if (WelsCreateSVCEncoder(&encoder_) != 0 || encoder_ == nullptr) {
+    const OpenH264* openh264 = LoadOpenH264();
+    if (openh264 == nullptr) return kUnknownError;
+    if (openh264->create(&encoder_) != 0 || encoder_ == nullptr) {
         encoder_ = nullptr;
         Note("MediaRecorder: OpenH264 encoder cannot be created");
         return kUnknownError;
@@ -265,7 +304,8 @@ int HostMediaRecorder::openEncoder() {
 void HostMediaRecorder::closeEncoder() {
     if (encoder_ == nullptr) return;
     encoder_->Uninitialize();
-    WelsDestroySVCEncoder(encoder_);
+    // An encoder exists only once the library has loaded, so this finds it loaded.
+    LoadOpenH264()->destroy(encoder_);
     encoder_ = nullptr;
 }
 
@@ -311,7 +351,7 @@ int HostMediaRecorder::release() {
 }
 
 HostMediaRecorder::Encoded HostMediaRecorder::encodeFrame(uint32_t frame, uint64_t ms) {
-    if (state_ != State::kPrepared) return Encoded{};
+    if (state_ != State::kPrepared || encoder_ == nullptr) return Encoded{};
     return encodeNext(frame, ms);
 }
 

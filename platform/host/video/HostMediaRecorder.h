@@ -28,6 +28,7 @@ class GstSource;
 // the test pattern or, as the host properties choose at prepare, the newest frame of a
 // GStreamer source (screen, camera, pipeline); a source lost mid-stream gives way to the
 // pattern marked "no signal". A camera set to the sub window picks the sub window's source.
+// OpenH264 is loaded at the first prepare whose source is not "none".
 // Thread contract: MediaRecorder calls and encodeFrame from one thread; between start and stop
 // the recorder's own thread owns the encoder and buffers; the counters read from any thread.
 class HostMediaRecorder final : public MediaRecorder {
@@ -69,8 +70,8 @@ public:
         bool key = false;
     };
     // The thread's work for one frame, minus the binder: takes frame `frame` as captured at
-    // host clock time `ms` and encodes it. Only after prepare and before start (else empty);
-    // size 0 when the encoder skipped the frame.
+    // host clock time `ms` and encodes it. Only after prepare and before start, and never for
+    // "none" (else empty); size 0 when the encoder skipped the frame.
     Encoded encodeFrame(uint32_t frame, uint64_t ms);
 
     int videoBitrate() const { return bitrate_; }
