@@ -445,6 +445,11 @@ void HostMediaRecorder::run() {
     const uint64_t period_ns = 1000000000u / fps_;
     uint64_t n = 0;
     std::unique_lock<std::mutex> lock(mutex_);
+    if (source_.kind == SourceChoice::kNone) {
+        // The frames come from another binder client, such as orvex-feed: nothing to pace.
+        wake_.wait(lock, [this] { return stopping_; });
+        return;
+    }
     for (;;) {
         // Frame n is due at a fixed offset from the start, so waits never add up to drift.
         uint64_t due_ns = start_ns + n * 1000000000u / fps_;
@@ -460,11 +465,8 @@ void HostMediaRecorder::run() {
             dropped_.fetch_add(behind, std::memory_order_relaxed);
             due_ns = start_ns + n * 1000000000u / fps_;
         }
-        // "none": the frames come from another binder client, such as orvex-feed.
-        if (source_.kind != SourceChoice::kNone) {
-            Encoded frame = encodeNext(static_cast<uint32_t>(n), due_ns / 1000000u);
-            if (frame.size > 0) deliver(frame);
-        }
+        Encoded frame = encodeNext(static_cast<uint32_t>(n), due_ns / 1000000u);
+        if (frame.size > 0) deliver(frame);
         ++n;
         lock.lock();
     }
