@@ -6,6 +6,7 @@
 #include <sys/eventfd.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/uio.h>
 #include <sys/un.h>
 #include <unistd.h>
 
@@ -97,6 +98,33 @@ bool SendAll(int fd, const void* buf, size_t len) {
             return false;
         }
         sent += static_cast<size_t>(n);
+    }
+    return true;
+}
+
+// Header and payload in one call, so the service wakes once for a transaction, not twice.
+bool SendBoth(int fd, const uint8_t* header, size_t header_len, const uint8_t* data, size_t len) {
+    iovec parts[2] = {{const_cast<uint8_t*>(header), header_len},
+                      {const_cast<uint8_t*>(data), len}};
+    msghdr msg{};
+    msg.msg_iov = parts;
+    msg.msg_iovlen = 2;
+    while (msg.msg_iovlen > 0) {
+        ssize_t n = sendmsg(fd, &msg, MSG_NOSIGNAL);
+        if (n < 0) {
+            if (errno == EINTR) continue;
+            return false;
+        }
+        auto sent = static_cast<size_t>(n);
+        while (msg.msg_iovlen > 0 && sent >= msg.msg_iov->iov_len) {
+            sent -= msg.msg_iov->iov_len;
+            ++msg.msg_iov;
+            --msg.msg_iovlen;
+        }
+        if (msg.msg_iovlen > 0) {
+            msg.msg_iov->iov_base = static_cast<uint8_t*>(msg.msg_iov->iov_base) + sent;
+            msg.msg_iov->iov_len -= sent;
+        }
     }
     return true;
 }
@@ -408,7 +436,7 @@ int HostBinder::TransactOn(Outgoing& out, const std::string& path, const uint8_t
             out.fd = ConnectTo(path, false);
             if (out.fd < 0) return kDeadObject;
         }
-        if (SendAll(out.fd, header, kHeaderSize) && SendAll(out.fd, data.data(), data.size())) {
+        if (SendBoth(out.fd, header, kHeaderSize, data.data(), data.size())) {
             break;
         }
         close(out.fd);
