@@ -45,12 +45,14 @@ public:
     void read_audio_payload_type();
     // Takes how idle loops wait from the property kv.orvex.wake: "poll" (the default: fixed
     // short sleeps) or "event" (a ring's consumer sleeps until a write, the run-flag loops
-    // look ten times less often). Anything else is logged and leaves polling. Called once,
-    // when the server opens; threads read it when they start.
+    // until they are woken). Anything else is logged and leaves polling. Called once, when the
+    // server opens; threads read it when they start.
     void read_wake_mode();
     bool wake_on_write() const { return m_wake_on_write.load(std::memory_order_relaxed); }
     // The sleep of the loops that only watch a run flag (the main and binder service loops).
-    unsigned run_flag_poll_us() const { return wake_on_write() ? 100000 : 10000; }
+    // Waiting for writes, they are woken instead: SIGTERM interrupts main's sleep, and the
+    // service's stop notifies its thread; the second is only a bound.
+    unsigned run_flag_poll_us() const { return wake_on_write() ? 1000000 : 10000; }
 
     void mp3_config_ok();
     void h264_config_frequency_ok();

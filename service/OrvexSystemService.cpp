@@ -3,6 +3,10 @@
 #include <pthread.h>
 #include <unistd.h>
 
+#include <chrono>
+#include <condition_variable>
+#include <mutex>
+
 #include "platform/Ports.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
@@ -15,6 +19,8 @@ namespace {
 constexpr const char* kTag = "orvex:::startorvexsevice";
 
 std::atomic<bool> g_service_run{false};
+std::mutex g_service_lock;  // with g_service_wake: ends a waiting service loop at once
+std::condition_variable g_service_wake;
 pthread_t g_service_thread{};
 bool g_service_started = false;
 
@@ -28,8 +34,16 @@ int start_orvex_service_main(std::atomic<bool>* run) {
     android::OrvexService::instantiate();
     OrvexPuts("\n start orvex service ");
     OrvexLog(kTag, "\n start orvex service \n");
-    const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
-    while (run->load(std::memory_order_relaxed)) usleep(poll_us);
+    Global_Config* config = Global_Config::instance();
+    const useconds_t poll_us = config->run_flag_poll_us();
+    if (config->wake_on_write()) {
+        std::unique_lock<std::mutex> hold(g_service_lock);
+        while (run->load(std::memory_order_relaxed)) {
+            g_service_wake.wait_for(hold, std::chrono::microseconds(poll_us));
+        }
+    } else {
+        while (run->load(std::memory_order_relaxed)) usleep(poll_us);
+    }
     OrvexPuts("\n end orvex service ");
     OrvexLog(kTag, "\n end orvex service \n");
     OrvexPrintLog(kTag, "OrvexServiceThread end");
@@ -58,7 +72,11 @@ int start_orvex_system_service() {
 
 void close_orvex_system_service() {
     OrvexPrintLog(kTag, "close_orvex_system_service");
-    g_service_run = false;
+    {
+        std::lock_guard<std::mutex> hold(g_service_lock);
+        g_service_run = false;
+    }
+    g_service_wake.notify_all();
     if (g_service_started) pthread_join(g_service_thread, nullptr);
     g_service_started = false;
 }

@@ -130,7 +130,7 @@ TEST_F(GlobalConfigTest, WakeModeProperty) {
         {nullptr, false, 10000, {}},
         {"", false, 10000, {}},
         {"poll", false, 10000, {}},
-        {"event", true, 100000, {}},
+        {"event", true, 1000000, {}},
         {"Event", false, 10000, {"kv.orvex.wake=\"Event" + bad}},
         {"event ", false, 10000, {"kv.orvex.wake=\"event " + bad}},
         {"1", false, 10000, {"kv.orvex.wake=\"1" + bad}},
