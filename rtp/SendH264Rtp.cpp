@@ -7,6 +7,7 @@
 
 #include "media/LazyInstance.h"
 #include "rtp/Base64.h"
+#include "rtp/FrameLatency.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
 #include "rtp/h264_sps.h"
@@ -63,6 +64,15 @@ void H264RtpTransportSession::InspectParameterSets(const Buffer_Item& item) {
     }
 }
 
+void H264RtpTransportSession::ReportLatency(unsigned ring_wait_ms, Clock::time_point send_start,
+                                            FrameLatency* latency) {
+    auto send_us = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - send_start);
+    char line[160];
+    if (latency->Add(ring_wait_ms, static_cast<uint32_t>(send_us.count()), line, sizeof line)) {
+        OrvexLog(kTag, "%s", line);
+    }
+}
+
 void H264RtpTransportSession::procH264Thread() {
     NameThisThread("orvex-h264-send");
     int sock = socket(AF_INET, SOCK_DGRAM, 0);
@@ -79,6 +89,9 @@ void H264RtpTransportSession::procH264Thread() {
     H264SendState state;
     uint32_t ts = 0;
     uint16_t sequence = 0;
+
+    const bool report_latency = config->report_latency();
+    FrameLatency latency;
 
     bool recompute = true;
     unsigned video_ms = 0;
@@ -116,8 +129,11 @@ void H264RtpTransportSession::procH264Thread() {
         }
         AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);
         config->set_timestamp(PositionMs(ts, rate), true);
+        const unsigned send_ms = report_latency ? GetTimeStampMillsec() : 0;
+        const auto send_start = report_latency ? Clock::now() : Clock::time_point();
         PacketiseH264Item(item->data, static_cast<unsigned>(item->length), ts, payload_type,
                           &sequence, fanout);
+        if (report_latency) ReportLatency(send_ms - item->timestamp, send_start, &latency);
         state.AfterSend(&sequence);
         recompute = true;
     }

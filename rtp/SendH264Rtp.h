@@ -1,8 +1,11 @@
 #pragma once
 
+#include <chrono>
 #include <string>
 
 #include "rtp/RtpSendSession.h"
+
+class FrameLatency;
 
 // The process-wide video sender: one thread takes H.264 items (start code + NAL unit) from the
 // video ring, stamps them on the 90 kHz clock, keeps at most 250 ms ahead of the audio sender,
@@ -17,8 +20,11 @@ public:
 private:
     H264RtpTransportSession();
     void BeforeStart() override;
+    using Clock = std::chrono::steady_clock;
+
     void Run() override { procH264Thread(); }
     void procH264Thread();
+    void ReportLatency(unsigned ring_wait_ms, Clock::time_point send_start, FrameLatency* latency);
     // Dormant parameter-set inspection: kept so a cleared flag inspects the next SPS/PPS.
     void InspectParameterSets(const Buffer_Item& item);
 

@@ -11,6 +11,7 @@ bool RtspService_t::Open(unsigned port) {
     m_config->m_rtsp_port = port;
     m_config->read_audio_payload_type();
     m_config->read_wake_mode();
+    m_config->read_latency_report();
     m_video = new MediaStreamH264("h264");
     m_audio = new MediaStreamMP4A("aac", -1);
     m_session = new MediaSession("skyvo");

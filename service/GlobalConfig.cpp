@@ -54,15 +54,30 @@ void Global_Config::read_audio_payload_type() {
     m_audio_payload_type = static_cast<int32_t>(pt);
 }
 
-void Global_Config::read_wake_mode() {
+namespace {
+
+// A two-way switch property: unset (or empty) and `off` give false, `on` true; anything else is
+// logged once, with what the service does instead, and gives false.
+bool ReadSwitch(const char* key, const char* off, const char* on, const char* otherwise) {
     char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.wake", value, "");
-    bool event = strcmp(value, "event") == 0;
-    if (!event && value[0] != '\0' && strcmp(value, "poll") != 0) {
-        OrvexLog(kTag, "kv.orvex.wake=\"%s\" is neither poll nor event; idle loops keep polling",
-                 value);
+    platform::Properties().Get(key, value, "");
+    if (strcmp(value, on) == 0) return true;
+    if (value[0] != '\0' && strcmp(value, off) != 0) {
+        OrvexLog(kTag, "%s=\"%s\" is neither %s nor %s; %s", key, value, off, on, otherwise);
     }
-    m_wake_on_write.store(event, std::memory_order_relaxed);
+    return false;
+}
+
+}  // namespace
+
+void Global_Config::read_wake_mode() {
+    m_wake_on_write.store(ReadSwitch("kv.orvex.wake", "poll", "event", "idle loops keep polling"),
+                          std::memory_order_relaxed);
+}
+
+void Global_Config::read_latency_report() {
+    m_report_latency.store(ReadSwitch("kv.orvex.latency", "0", "1", "no latency report"),
+                           std::memory_order_relaxed);
 }
 
 void Global_Config::mp3_config_ok() {

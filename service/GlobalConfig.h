@@ -49,6 +49,11 @@ public:
     // server opens; threads read it when they start.
     void read_wake_mode();
     bool wake_on_write() const { return m_wake_on_write.load(std::memory_order_relaxed); }
+    // Takes the property kv.orvex.latency: "1" makes the video sender log, every 300 frames,
+    // how long frames waited in the ring and took to send; unset or "0" does not. Anything else
+    // is logged and leaves it off. Called once, when the server opens.
+    void read_latency_report();
+    bool report_latency() const { return m_report_latency.load(std::memory_order_relaxed); }
     // The sleep of the loops that only watch a run flag (the main and binder service loops).
     // Waiting for writes, they are woken instead: SIGTERM interrupts main's sleep, and the
     // service's stop notifies its thread; the second is only a bound.
@@ -91,6 +96,7 @@ private:
     std::atomic<bool> m_flag_run_pause{false};
     std::atomic<bool> m_flag_sub{false};
     std::atomic<bool> m_wake_on_write{false};
+    std::atomic<bool> m_report_latency{false};
     TLock m_timestamp_lock;
     unsigned m_video_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;
     unsigned m_audio_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;

@@ -8,6 +8,10 @@
     rtsp_check.py split URL [SECONDS]     the same delay cut in two: capture to the frame's last
                                           packet here, and that packet to the decoded frame
 
+With --service-log FILE (the service's log, orvex.host.log=file:FILE), 'latency' and 'split'
+also print the service's own reports written meanwhile: with kv.orvex.latency=1 the video
+sender logs, every 300 frames, how long frames waited in its ring and took to send.
+
 The service announces audio as payload type 97. Its packets carry 97 too when the property
 kv.orvex.audiopt says so (the host default), and then 'measure' plays the URL with stock ffmpeg.
 Left at the television's 98, ffmpeg would drop every audio packet (it keeps to the SDP's type),
@@ -333,11 +337,33 @@ def split(url, seconds):
     return 0
 
 
+def service_reports(path, offset):
+    """The service's latency lines appended to its log since `offset`."""
+    try:
+        with open(path, "rb") as log:
+            log.seek(offset)
+            text = log.read().decode("utf-8", "replace")
+    except OSError as e:
+        return ["cannot read the service log: %s" % e]
+    return [line.split(": ", 1)[-1] for line in text.splitlines() if "latency of the last" in line]
+
+
 def main():
-    mode, url = sys.argv[1], sys.argv[2]
-    seconds = float(sys.argv[3]) if len(sys.argv) > 3 else 10.0
+    args = sys.argv[1:]
+    log = None
+    if "--service-log" in args:
+        at = args.index("--service-log")
+        log = args[at + 1]
+        del args[at:at + 2]
+    mode, url = args[0], args[1]
+    seconds = float(args[2]) if len(args) > 2 else 10.0
     modes = {"packets": packets, "measure": measure, "latency": latency, "split": split}
-    sys.exit(modes[mode](url, seconds))
+    offset = os.path.getsize(log) if log and os.path.exists(log) else 0
+    rc = modes[mode](url, seconds)
+    if log:
+        for line in service_reports(log, offset):
+            print("service: " + line)
+    sys.exit(rc)
 
 
 if __name__ == "__main__":

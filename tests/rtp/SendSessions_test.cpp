@@ -1,6 +1,7 @@
 #include <gtest/gtest.h>
 
 #include <chrono>
+#include <string>
 #include <thread>
 #include <vector>
 
@@ -188,6 +189,30 @@ TEST_P(SendSessionTest, AudioWaitsForBothClockRates) {
     Feed(audio_ring, AdtsFrame(70), 300);
     WaitEmpty(audio_ring);
     EXPECT_TRUE(r.Receive(100).empty());
+}
+
+// kv.orvex.latency=1: one line per 300 frames sent, none before; off, none at all.
+TEST_P(SendSessionTest, LatencyReportComesWithEvery300thFrame) {
+    for (const char* value : {"0", "1"}) {
+        fake.properties.Set("kv.orvex.latency", value);
+        config->read_latency_report();
+        fake.log.Clear();
+        UdpReceiver r;
+        config->set_timestamp(1000000, false);
+        video->add_dest_socket_info(Key(1), r.port(), "127.0.0.1");
+        ASSERT_EQ(video->StartSendThread(), 0);
+        for (unsigned i = 0; i < 300; ++i) Feed(video_ring, NalItem(10, 0x41), 1000 + i);
+        for (unsigned i = 0; i < 300; ++i) ASSERT_EQ(r.Receive().size(), 12u + 10) << i;
+        video->CloseSendThread();
+        std::vector<std::string> lines = fake.log.Texts("orvex:::SendH264Rtp");
+        std::vector<std::string> reports;
+        for (const std::string& l : lines) {
+            if (l.rfind("latency of the last 300 frames: ring wait p50 ", 0) == 0) {
+                reports.push_back(l);
+            }
+        }
+        EXPECT_EQ(reports.size(), value[0] == '1' ? 1u : 0u) << value;
+    }
 }
 
 INSTANTIATE_TEST_SUITE_P(WakeModes, SendSessionTest, ::testing::Values("poll", "event"));

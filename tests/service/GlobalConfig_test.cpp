@@ -117,33 +117,49 @@ TEST_F(GlobalConfigTest, AudioPayloadTypeProperty) {
     }
 }
 
-// kv.orvex.wake: "event" makes idle loops wait for writes; anything but "poll" or unset is
-// logged once and they poll, as on the television.
-TEST_F(GlobalConfigTest, WakeModeProperty) {
-    const std::string bad = "\" is neither poll nor event; idle loops keep polling";
+// The two-way switches: kv.orvex.wake ("event" makes idle loops wait for writes) and
+// kv.orvex.latency ("1" turns on the video sender's report). Anything but the two values or
+// unset is logged once and leaves the switch off, as on the television.
+TEST_F(GlobalConfigTest, SwitchProperties) {
     struct Case {
+        const char* key;
         const char* value;  // null: the property is missing
-        bool event;
-        unsigned flag_poll_us;
+        bool on;
         std::vector<std::string> log;
     } cases[] = {
-        {nullptr, false, 10000, {}},
-        {"", false, 10000, {}},
-        {"poll", false, 10000, {}},
-        {"event", true, 1000000, {}},
-        {"Event", false, 10000, {"kv.orvex.wake=\"Event" + bad}},
-        {"event ", false, 10000, {"kv.orvex.wake=\"event " + bad}},
-        {"1", false, 10000, {"kv.orvex.wake=\"1" + bad}},
+        {"kv.orvex.wake", nullptr, false, {}},
+        {"kv.orvex.wake", "", false, {}},
+        {"kv.orvex.wake", "poll", false, {}},
+        {"kv.orvex.wake", "event", true, {}},
+        {"kv.orvex.wake",
+         "Event",
+         false,
+         {"kv.orvex.wake=\"Event\" is neither poll nor event; idle loops keep polling"}},
+        {"kv.orvex.wake",
+         "event ",
+         false,
+         {"kv.orvex.wake=\"event \" is neither poll nor event; idle loops keep polling"}},
+        {"kv.orvex.latency", nullptr, false, {}},
+        {"kv.orvex.latency", "0", false, {}},
+        {"kv.orvex.latency", "1", true, {}},
+        {"kv.orvex.latency",
+         "yes",
+         false,
+         {"kv.orvex.latency=\"yes\" is neither 0 nor 1; no latency report"}},
     };
     for (const Case& c : cases) {
+        const std::string what = std::string(c.key) + "=" + (c.value ? c.value : "(missing)");
         fake.properties.Clear();
-        if (c.value != nullptr) fake.properties.Set("kv.orvex.wake", c.value);
+        if (c.value != nullptr) fake.properties.Set(c.key, c.value);
         fake.log.Clear();
         Global_Config* config = Global_Config::instance();
         config->read_wake_mode();
-        EXPECT_EQ(config->wake_on_write(), c.event) << (c.value ? c.value : "missing");
-        EXPECT_EQ(config->run_flag_poll_us(), c.flag_poll_us) << (c.value ? c.value : "missing");
-        EXPECT_EQ(fake.log.Texts("globalconfig"), c.log) << (c.value ? c.value : "missing");
+        config->read_latency_report();
+        bool wake = std::string(c.key) == "kv.orvex.wake";
+        EXPECT_EQ(config->wake_on_write(), wake && c.on) << what;
+        EXPECT_EQ(config->run_flag_poll_us(), wake && c.on ? 1000000u : 10000u) << what;
+        EXPECT_EQ(config->report_latency(), !wake && c.on) << what;
+        EXPECT_EQ(fake.log.Texts("globalconfig"), c.log) << what;
     }
 }
 
