@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <poll.h>
+#include <pthread.h>
 #include <sys/epoll.h>
 #include <sys/eventfd.h>
 #include <sys/socket.h>
@@ -282,6 +283,7 @@ void HostBinder::startThreadPool() {
 }
 
 void HostBinder::PoolLoop() {
+    pthread_setname_np(pthread_self(), "orvex-binder");
     for (;;) {
         epoll_event ev;
         int n = epoll_wait(epoll_fd_, &ev, 1, -1);

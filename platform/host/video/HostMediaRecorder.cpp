@@ -1,6 +1,7 @@
 #include "platform/host/video/HostMediaRecorder.h"
 
 #include <dlfcn.h>
+#include <pthread.h>
 #include <time.h>
 #include <wels/codec_api.h>
 
@@ -440,6 +441,7 @@ void HostMediaRecorder::deliver(const Encoded& frame) {
 }
 
 void HostMediaRecorder::run() {
+    pthread_setname_np(pthread_self(), "orvex-recorder");
     const uint64_t start_ns = MonotonicNs();
     const auto start_tp = std::chrono::steady_clock::now();
     const uint64_t period_ns = 1000000000u / fps_;
