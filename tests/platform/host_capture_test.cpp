@@ -10,14 +10,13 @@
 #include <vector>
 
 #include "platform/Ports.h"
-#include "platform/fake/FakeLog.h"
-#include "platform/fake/FakeProperties.h"
 #include "platform/host/HostAudio.h"
 #include "platform/host/capture/GstSource.h"
 #include "platform/host/capture/HostSources.h"
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
 #include "platform/host/video/TestPattern.h"
+#include "tests/platform/HostPortsTest.h"
 
 // Leaks that belong to the libraries, not to this code: GLib's allocations while it is loaded,
 // and ximagesrc's copy of its display name. Their stacks pass through libraries built without
@@ -38,19 +37,6 @@ using Clock = std::chrono::steady_clock;
 
 constexpr char kTag[] = "orvex:::host";
 
-class CountingBinder final : public platform::BinderPort {
-public:
-    int initWithDriver(const char*) override { return 0; }
-    const void* defaultServiceManager() override { return this; }
-    int addService(const char*, std::shared_ptr<platform::BinderService>) override { return 0; }
-    void startThreadPool() override {}
-    int transact(const char*, uint32_t, const platform::ParcelWriter&) override {
-        ++frames;
-        return 0;
-    }
-    std::atomic<int> frames{0};
-};
-
 // Polls `done` every 10 ms for at most `seconds`; true once it holds.
 template <typename F>
 bool WaitFor(F done, int seconds = 10) {
@@ -62,27 +48,8 @@ bool WaitFor(F done, int seconds = 10) {
     return true;
 }
 
-class HostCaptureTest : public ::testing::Test {
+class HostCaptureTest : public HostPortsTest {
 protected:
-    void SetUp() override {
-        previous_ = platform::Installed();
-        platform::Ports ports = previous_;
-        ports.log = &log_;
-        ports.properties = &properties_;
-        ports.binder = &binder_;
-        platform::Install(ports);
-    }
-    void TearDown() override { platform::Install(previous_); }
-
-    // Host log lines that contain `part`.
-    std::vector<std::string> Lines(const std::string& part) {
-        std::vector<std::string> out;
-        for (const std::string& t : log_.Texts(kTag)) {
-            if (t.find(part) != std::string::npos) out.push_back(t);
-        }
-        return out;
-    }
-
     // A recorder set up the way capture start does it, up to (not including) prepare.
     std::unique_ptr<HostMediaRecorder> Recorder(int w, int h, bool sub = false) {
         HostCamera camera;
@@ -97,11 +64,6 @@ protected:
         EXPECT_EQ(r->setVideoFrameRate(30), 0);
         return r;
     }
-
-    platform::fake::FakeLog log_;
-    platform::fake::FakeProperties properties_;
-    CountingBinder binder_;
-    platform::Ports previous_;
 };
 
 TEST(HostSourceValues, ParseEveryFormAndRefuseTheRest) {

@@ -14,11 +14,10 @@
 #include <vector>
 
 #include "platform/Ports.h"
-#include "platform/fake/FakeLog.h"
-#include "platform/fake/FakeProperties.h"
 #include "platform/host/HostAudio.h"
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
+#include "tests/platform/HostPortsTest.h"
 
 // GLib's allocations while it is loaded belong to it (see host_capture_test.cpp).
 extern "C" const char* __lsan_default_suppressions() { return "leak:_dl_init\n"; }
@@ -29,15 +28,6 @@ using platform::host::HostCamera;
 using platform::host::HostMediaRecorder;
 
 constexpr char kTag[] = "orvex:::host";
-
-class NullBinder final : public platform::BinderPort {
-public:
-    int initWithDriver(const char*) override { return 0; }
-    const void* defaultServiceManager() override { return this; }
-    int addService(const char*, std::shared_ptr<platform::BinderService>) override { return 0; }
-    void startThreadPool() override {}
-    int transact(const char*, uint32_t, const platform::ParcelWriter&) override { return 0; }
-};
 
 // "openh264", "gstreamer", "module", each when mapped, space separated.
 std::string Mapped() {
@@ -52,18 +42,8 @@ std::string Mapped() {
     return out;
 }
 
-class HostLazyTest : public ::testing::Test {
+class HostLazyTest : public HostPortsTest {
 protected:
-    void SetUp() override {
-        previous_ = platform::Installed();
-        platform::Ports ports = previous_;
-        ports.log = &log_;
-        ports.properties = &properties_;
-        ports.binder = &binder_;
-        platform::Install(ports);
-    }
-    void TearDown() override { platform::Install(previous_); }
-
     // Starts the picture and the sound the way capture start does, reads a block of sound,
     // stops both. "video=RC audio=RC", the codes prepare/start and the record's start gave.
     std::string Capture() {
@@ -115,19 +95,6 @@ protected:
         if (!WIFEXITED(status) || WEXITSTATUS(status) != 0) result += " (child failed)";
         return result;
     }
-
-    std::vector<std::string> Lines(const std::string& part) {
-        std::vector<std::string> out;
-        for (const std::string& t : log_.Texts(kTag)) {
-            if (t.find(part) != std::string::npos) out.push_back(t);
-        }
-        return out;
-    }
-
-    platform::fake::FakeLog log_;
-    platform::fake::FakeProperties properties_;
-    NullBinder binder_;
-    platform::Ports previous_;
 };
 
 TEST_F(HostLazyTest, SourcesMapOnlyTheLibrariesTheyUse) {
