@@ -27,8 +27,6 @@ namespace {
 using platform::host::HostCamera;
 using platform::host::HostMediaRecorder;
 
-constexpr char kTag[] = "orvex:::host";
-
 // "openh264", "gstreamer", "module", each when mapped, space separated.
 std::string Mapped() {
     std::ifstream maps("/proc/self/maps");
