@@ -215,9 +215,7 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
     bool ended = false;
     while (!ended && run_flag->load(std::memory_order_relaxed) != 0) {
         if (g_pcm_ring.read(input, kPcmBlockBytes) < 1) {
-            if (wake_on_write) {
-                g_pcm_ring.wait_readable(kPcmBlockBytes, kEncoderIdleBoundMs);
-            } else {
+            if (!wake_on_write || !g_pcm_ring.wait_readable(kPcmBlockBytes, kEncoderIdleBoundMs)) {
                 usleep(5000);
             }
             continue;

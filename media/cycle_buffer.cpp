@@ -221,7 +221,7 @@ void cycle_buffer::RingBell(bool wake) {
     m_bell.notify_one();
 }
 
-void cycle_buffer::wait_readable(uint32_t len, unsigned max_ms) {
+bool cycle_buffer::wait_readable(uint32_t len, unsigned max_ms) {
     auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(max_ms);
     {
         // A ring left by an earlier wait that timed out is not for this one.
@@ -230,7 +230,7 @@ void cycle_buffer::wait_readable(uint32_t len, unsigned max_ms) {
     }
     {
         thread_mutex::Scoped hold(m_lock);
-        if (ReaderSatisfied(len)) return;
+        if (ReaderSatisfied(len)) return false;
         m_reader_wants = len > 0 ? len : 1;
     }
     {
@@ -240,6 +240,7 @@ void cycle_buffer::wait_readable(uint32_t len, unsigned max_ms) {
     }
     thread_mutex::Scoped hold(m_lock);
     m_reader_wants = 0;
+    return true;
 }
 
 void cycle_buffer::wake_reader() { RingBell(true); }

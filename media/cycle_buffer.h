@@ -23,7 +23,8 @@ struct Buffer_Item {
 // (newwrite/newread). One byte always stays unused so that full and empty differ.
 // Thread contract: any number of threads may write (write, newwrite) and reset at once; each
 // write lands whole or not at all, and a reset waits for the writes already under way, then
-// empties the ring. One consumer (read, newread) at a time; reset only while it is stopped.
+// empties the ring. One consumer (read, newread, wait_readable) at a time; reset only while it
+// is stopped; wake_reader from any thread.
 // No allocation after construction.
 class cycle_buffer {
 public:
@@ -45,8 +46,10 @@ public:
     void reset();
     // For the consumer with nothing to take: returns once `len` bytes can be read, after a
     // wake_reader that has not yet ended a wait, or after `max_ms`, whichever comes first. The
-    // write that brings the bytes ends the wait at once, so a consumer need not poll.
-    void wait_readable(uint32_t len, unsigned max_ms);
+    // write that brings the bytes ends the wait at once, so a consumer need not poll. False when
+    // `len` bytes were readable already: the consumer could not use what is there (a drop, a
+    // broken item stream) and must pace itself rather than look again at once.
+    bool wait_readable(uint32_t len, unsigned max_ms);
     // Ends the consumer's current or next wait_readable (to stop it without a timeout).
     void wake_reader();
 

@@ -40,9 +40,9 @@ void RtpSendSession::CloseSendThread() {
 }
 
 void RtpSendSession::Idle(useconds_t poll_us) {
-    if (m_wake_on_write.load(std::memory_order_relaxed) && m_ring != nullptr) {
-        m_ring->wait_readable(kItemHeaderSize + 1, kIdleBoundMs);
-    } else {
+    // What is in the ring was just dropped or cannot be read: sleep as when polling.
+    if (!m_wake_on_write.load(std::memory_order_relaxed) || m_ring == nullptr ||
+        !m_ring->wait_readable(kItemHeaderSize + 1, kIdleBoundMs)) {
         usleep(poll_us);
     }
 }

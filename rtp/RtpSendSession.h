@@ -46,7 +46,7 @@ protected:
     // The send loop; returns once m_running is 0.
     virtual void Run() = 0;
     // The loop's pause when it has nothing to send: `poll_us` of sleep, or, when the loops wait
-    // for writes, until the ring holds an item (at most a long safety bound).
+    // for writes and the ring is empty, until an item is written (at most a safety bound).
     void Idle(useconds_t poll_us);
 
     std::atomic<int> m_running{1};

@@ -202,9 +202,10 @@ TEST_F(CycleBufferTest, WaitReadableEndsOnlyWhenEnoughIsThere) {
     for (uint32_t wanted : {1u, 1000u, 3840u}) {
         std::atomic<bool> waiting{false};
         unsigned seen = 0;
+        bool waited = false;
         std::thread consumer([&] {
             waiting = true;
-            ring.wait_readable(wanted, kHour);
+            waited = ring.wait_readable(wanted, kHour);
             seen = ring.used_space();
         });
         while (!waiting) std::this_thread::yield();
@@ -213,7 +214,9 @@ TEST_F(CycleBufferTest, WaitReadableEndsOnlyWhenEnoughIsThere) {
             ASSERT_EQ(ring.write(chunk.data(), 1000), 1000);
         }
         consumer.join();
+        EXPECT_TRUE(waited);
         EXPECT_GE(seen, wanted);
+        EXPECT_FALSE(ring.wait_readable(wanted, kHour));  // there already: no wait at all
         std::vector<unsigned char> sink(ring.used_space());
         ring.read(sink.data(), static_cast<int>(sink.size()));
     }

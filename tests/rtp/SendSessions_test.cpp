@@ -191,6 +191,26 @@ TEST_P(SendSessionTest, AudioWaitsForBothClockRates) {
     EXPECT_TRUE(r.Receive(100).empty());
 }
 
+// A broken item stream leaves bytes in the ring that no read takes: the loop must keep its
+// pace (a line per 2 ms sleep) rather than look again at once.
+TEST_P(SendSessionTest, BrokenItemStreamDoesNotSpinTheSender) {
+    config->set_timestamp(1000000, false);
+    unsigned char broken[18] = {0x80, 0x84, 0x1E, 0x00};  // a length of 2 000 000, then 10 bytes
+    ASSERT_EQ(video_ring.write(broken, sizeof broken), 18);
+    ::testing::internal::CaptureStdout();
+    ASSERT_EQ(video->StartSendThread(), 0);
+    std::this_thread::sleep_for(std::chrono::milliseconds(200));
+    video->CloseSendThread();
+    ::testing::internal::GetCapturedStdout();
+    size_t lines = 0;
+    for (const std::string& l : fake.log.Texts("orvex:::cycle_buffer")) {
+        if (l == "\n video FRAME_SIZE is not enough !--1 \n") ++lines;
+    }
+    EXPECT_GT(lines, 0u);
+    EXPECT_LT(lines, 200u);  // at most one per 2 ms, with room for a slow machine
+    EXPECT_FALSE(video_ring.item_stream_valid());
+}
+
 // kv.orvex.latency=1: one line per 300 frames sent, none before; off, none at all.
 TEST_P(SendSessionTest, LatencyReportComesWithEvery300thFrame) {
     for (const char* value : {"0", "1"}) {
@@ -202,8 +222,9 @@ TEST_P(SendSessionTest, LatencyReportComesWithEvery300thFrame) {
         video->add_dest_socket_info(Key(1), r.port(), "127.0.0.1");
         ASSERT_EQ(video->StartSendThread(), 0);
         for (unsigned i = 0; i < 300; ++i) Feed(video_ring, NalItem(10, 0x41), 1000 + i);
-        for (unsigned i = 0; i < 300; ++i) ASSERT_EQ(r.Receive().size(), 12u + 10) << i;
-        video->CloseSendThread();
+        WaitEmpty(video_ring);
+        video->CloseSendThread();  // the item taken last is sent before the loop ends
+        EXPECT_EQ(r.Receive().size(), 12u + 10);
         std::vector<std::string> lines = fake.log.Texts("orvex:::SendH264Rtp");
         std::vector<std::string> reports;
         for (const std::string& l : lines) {
