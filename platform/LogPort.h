@@ -8,6 +8,8 @@ namespace platform {
 // Values as the Android log headers number them.
 constexpr int kLogIdSystem = 3;  // LOG_ID_SYSTEM
 constexpr int kLogDebug = 3;     // ANDROID_LOG_DEBUG
+constexpr int kLogInfo = 4;      // ANDROID_LOG_INFO
+constexpr int kLogWarn = 5;      // ANDROID_LOG_WARN
 constexpr int kLogError = 6;     // ANDROID_LOG_ERROR
 
 class LogPort {

@@ -1,6 +1,7 @@
 #include "rtsp/RtspTransport.h"
 
 #include <arpa/inet.h>
+#include <fcntl.h>
 #include <netinet/tcp.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -13,6 +14,7 @@
 #include "platform/LogPort.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
+#include "rtsp/CaptureQuery.h"
 #include "rtsp/RtspResponse.h"
 #include "rtsp/RtspSession.h"
 #include "server/QuitFlag.h"
@@ -28,6 +30,8 @@ namespace {
 constexpr const char* kTag = "orvex:::RtspTransport";
 constexpr int kMaxClients = 5;
 std::atomic<int> g_select_wait_ms{2000};
+// While capture is held, a stopped capture comes back within this wait.
+constexpr int kHeldSelectWaitMs = 250;
 
 void ResetOnClose(int fd) {
     linger reset{1, 0};
@@ -71,6 +75,10 @@ RtspTransport::~RtspTransport() {
     m_running.store(0, std::memory_order_relaxed);
     if (m_thread_started) pthread_join(m_thread, nullptr);
     Close();
+    for (std::atomic<int>* end : {&m_wake_read, &m_wake_write}) {
+        int fd = end->exchange(-1);
+        if (fd >= 0) close(fd);
+    }
 }
 
 int RtspTransport::listen_port() const { return ntohs(m_listen_addr.sin_port); }
@@ -176,9 +184,79 @@ void RtspTransport::ServePipRestart() {
     m_reopen_pending = false;
 }
 
+void RtspTransport::HoldCapture(const std::string& query) {
+    {
+        std::lock_guard<std::mutex> hold(m_hold_lock);
+        if (!query.empty()) {
+            m_hold_query = query;
+            m_hold_query_pending = true;
+        }
+    }
+    m_capture_holders.fetch_add(1, std::memory_order_relaxed);
+    Wake();
+}
+
+void RtspTransport::ReleaseCapture() {
+    int before = m_capture_holders.load(std::memory_order_relaxed);
+    while (before > 0 && !m_capture_holders.compare_exchange_weak(before, before - 1)) {
+    }
+    Wake();
+}
+
+void RtspTransport::Wake() {
+    if (m_wake_write.load(std::memory_order_acquire) < 0) {
+        std::lock_guard<std::mutex> hold(m_wake_lock);
+        int fds[2];
+        if (m_wake_write.load(std::memory_order_relaxed) < 0 &&
+            pipe2(fds, O_NONBLOCK | O_CLOEXEC) == 0) {
+            m_wake_read.store(fds[0], std::memory_order_release);
+            m_wake_write.store(fds[1], std::memory_order_release);
+        }
+    }
+    int fd = m_wake_write.load(std::memory_order_acquire);
+    char byte = 1;
+    // A full pipe already holds a wake-up.
+    if (fd >= 0 && write(fd, &byte, 1) < 0 && errno != EAGAIN) {
+        OrvexLogPriority(platform::kLogWarn, kTag, "listener wake failed: %s", strerror(errno));
+    }
+}
+
+void RtspTransport::DrainWake() {
+    int fd = m_wake_read.load(std::memory_order_acquire);
+    char bytes[64];
+    while (fd >= 0 && read(fd, bytes, sizeof bytes) > 0) {
+    }
+}
+
+void RtspTransport::ServeCaptureHolders() {
+    int holders = m_capture_holders.load(std::memory_order_relaxed);
+    bool nobody = m_client_count.load(std::memory_order_relaxed) == 0;
+    if (holders == 0) {
+        // The last hold went: stop what it kept running, unless an RTSP client is here.
+        if (m_held && nobody && g_capture_running.load(std::memory_order_relaxed) != 0) {
+            CloseVideoAndAudioDecodeAndSend();
+        }
+        m_held = false;
+        return;
+    }
+    m_held = true;
+    std::string query;
+    {
+        std::lock_guard<std::mutex> hold(m_hold_lock);
+        if (m_hold_query_pending) query.swap(m_hold_query);
+        m_hold_query_pending = false;
+    }
+    // An RTSP client's own choice stands; a refused query leaves the last accepted one.
+    if (!query.empty() && nobody && ApplyCaptureQuery(query) != CaptureQueryResult::kApplied) {
+        OrvexLogPriority(platform::kLogWarn, kTag, "capture keys refused: %s", query.c_str());
+    }
+    if (g_capture_running.load(std::memory_order_relaxed) == 0) StartCaptureAndSend();
+}
+
 void RtspTransport::ListenThread() {
     while (m_running.load(std::memory_order_relaxed) == 1) {
         ServePipRestart();
+        ServeCaptureHolders();
         fd_set ready;
         FD_ZERO(&ready);
         int max_fd = m_listen_fd;
@@ -187,9 +265,16 @@ void RtspTransport::ListenThread() {
             FD_SET(entry.first, &ready);
             if (entry.first > max_fd) max_fd = entry.first;
         }
+        int wake_fd = m_wake_read.load(std::memory_order_acquire);
+        if (wake_fd >= 0) {
+            FD_SET(wake_fd, &ready);
+            if (wake_fd > max_fd) max_fd = wake_fd;
+        }
         int wait_ms = g_select_wait_ms.load(std::memory_order_relaxed);
+        if (m_held && wait_ms > kHeldSelectWaitMs) wait_ms = kHeldSelectWaitMs;
         timeval wait{wait_ms / 1000, (wait_ms % 1000) * 1000};
         int n = select(max_fd + 1, &ready, nullptr, nullptr, &wait);
+        if (n > 0 && wake_fd >= 0 && FD_ISSET(wake_fd, &ready)) DrainWake();
         if (n >= 0 && ProcessReadRtspSession(ready) != 0) {
             ProcessNewIncomingRtspSession(m_listen_fd, ready, max_fd);
         }
@@ -249,6 +334,11 @@ void RtspTransport::StartStreaming(int fd) {
         config->m_server_address = DottedAddress(local);
     }
     if (g_capture_running.load(std::memory_order_relaxed) != 0) return;
+    StartCaptureAndSend();
+}
+
+void RtspTransport::StartCaptureAndSend() {
+    Global_Config* config = Global_Config::instance();
     g_capture_running.store(1, std::memory_order_relaxed);
     H264RtpTransportSession* video = H264RtpTransportSession::instance();
     MP3RtpTransportSession* audio = MP3RtpTransportSession::instance();

@@ -6,6 +6,7 @@
 
 #include <atomic>
 #include <map>
+#include <mutex>
 #include <string>
 
 #include "media/MediaSessionList.h"
@@ -45,6 +46,18 @@ public:
     // The listener's select wait, two seconds in service. Tests shorten it.
     static void SetSelectWaitMs(int ms);
 
+    // Consumers beside RTSP (web viewers, the publisher) hold capture as a playing client does:
+    // while any hold stands, the listener starts capture within a second whenever it is not
+    // running (also after a departing RTSP client stopped it for all), and the last release
+    // stops it when no RTSP client is connected. `query` carries capture keys as an RTSP URL's
+    // query does, from its '?' on; the listener applies it when no RTSP client is connected (empty:
+    // keep the current choice). Any thread. With no hold ever taken the listener behaves as before.
+    void HoldCapture(const std::string& query);
+    void ReleaseCapture();
+    int capture_holders() const { return m_capture_holders.load(std::memory_order_relaxed); }
+    // Ends the listener's current select wait. Any thread; the first call opens the pipe.
+    void Wake();
+
     int ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, int& maxFd);
     int ProcessReadRtspSession(fd_set& ready);
     int ProcessDelRtspSession(int fd);
@@ -55,6 +68,9 @@ private:
     void ListenThread();
     void ServePipRestart();
     void StartStreaming(int fd);
+    void StartCaptureAndSend();
+    void ServeCaptureHolders();
+    void DrainWake();
 
     std::string m_address;
     unsigned m_port = 0;
@@ -74,6 +90,17 @@ private:
     bool m_reopen_pending = false;
     int m_reopen_countdown = 3;
     int m_reopened = 0;
+    // Capture holds; the query of the latest hold waits for the listener under its lock.
+    std::atomic<int> m_capture_holders{0};
+    bool m_held = false;  // listener thread: holds were seen, so their end may stop capture
+    std::mutex m_hold_lock;
+    std::string m_hold_query;
+    bool m_hold_query_pending = false;
+    // Self-pipe in the select set, opened on first use so that a listener nobody wakes keeps
+    // its descriptors as they were.
+    std::mutex m_wake_lock;
+    std::atomic<int> m_wake_read{-1};
+    std::atomic<int> m_wake_write{-1};
 };
 
 // Capture runs (1) from the first PLAY of a single client until any client leaves.

@@ -3,6 +3,7 @@
 #include <atomic>
 #include <thread>
 
+#include "server/FrameTap.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_service.h"
 #include "service/OrvexLog.h"
@@ -92,6 +93,7 @@ void skyvo_set_h264_rtp_config(unsigned rate) {
 
 int skyvo_add_h264_data(unsigned char* data, unsigned len) {
     if (data == nullptr || len == 0) return 0;
+    TapVideoFrame(data, len);
     ProducerScope inside;
     RtspTransport* listener = inside.listener();
     return listener != nullptr ? listener->skyvo_add_h264_data(data, len) : 0;
@@ -99,6 +101,7 @@ int skyvo_add_h264_data(unsigned char* data, unsigned len) {
 
 int skyvo_add_mp3_data(unsigned char* data, unsigned len, unsigned timestamp) {
     if (data == nullptr || len == 0) return 0;
+    TapAudioFrame(data, len, timestamp);
     ProducerScope inside;
     RtspTransport* listener = inside.listener();
     return listener != nullptr ? listener->skyvo_add_mp3_data(data, len, timestamp) : 0;

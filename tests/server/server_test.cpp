@@ -7,15 +7,18 @@
 #include <thread>
 #include <vector>
 
+#include "capture/LivecameraResolution.h"
 #include "capture/livepipmanager.h"
 #include "platform/fake/FakePlatform.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
 #include "rtsp/RtspResponse.h"
 #include "rtsp/RtspTransport.h"
+#include "server/FrameTap.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
+#include "service/Clocks.h"
 #include "service/OrvexLog.h"
 #include "tests/rtp/UdpReceiver.h"
 #include "tests/server/RtspClient.h"
@@ -464,3 +467,78 @@ TEST(ServerLifecycleTest, CloseWhileProducersFeedTouchesNoFreedServer) {
 }
 
 }  // namespace
+
+namespace {
+
+class RecordingSink : public EncodedFrameSink {
+public:
+    void OnVideoFrame(const uint8_t* data, size_t len, uint32_t time_ms) override {
+        std::lock_guard<std::mutex> hold(lock);
+        frames.emplace_back("video " + std::to_string(len) + " " + std::to_string(data[4]));
+        last_time = time_ms;
+    }
+    void OnAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) override {
+        std::lock_guard<std::mutex> hold(lock);
+        frames.emplace_back("audio " + std::to_string(len) + " " + std::to_string(data[0]));
+        last_time = time_ms;
+    }
+    std::mutex lock;
+    Calls frames;
+    uint32_t last_time = 0;
+};
+
+}  // namespace
+
+// The tap sees frames whether or not anyone plays, with the rings' time stamps.
+TEST_F(ServerTest, FrameSinksSeeEveryFrameUntilRemoved) {
+    RecordingSink sink, others[kMaxFrameSinks];
+    ASSERT_TRUE(AddFrameSink(&sink));
+    EXPECT_FALSE(AddFrameSink(&sink));
+    int added = 0;
+    for (RecordingSink& other : others) added += AddFrameSink(&other) ? 1 : 0;
+    EXPECT_EQ(added, kMaxFrameSinks - 1);
+    for (RecordingSink& other : others) RemoveFrameSink(&other);
+
+    unsigned char idr[] = {0, 0, 0, 1, 0x65, 1, 2, 3};
+    unsigned char aac[] = {0x21, 0x10, 0x04};
+    unsigned before = GetTimeStampMillsec();
+    EXPECT_EQ(skyvo_add_h264_data(idr, sizeof idr), 1);
+    EXPECT_GE(sink.last_time, before);
+    EXPECT_EQ(skyvo_add_mp3_data(aac, sizeof aac, 1234), 1);
+    EXPECT_EQ(sink.last_time, 1234u);
+    EXPECT_EQ(skyvo_add_mp3_data(aac, sizeof aac, 0), 1);
+    EXPECT_GE(sink.last_time, before);  // no producer clock: the ring's
+    EXPECT_EQ(skyvo_add_h264_data(nullptr, 4), 0);
+    RemoveFrameSink(&sink);
+    EXPECT_EQ(skyvo_add_h264_data(idr, sizeof idr), 1);
+    EXPECT_EQ(sink.frames, (Calls{"video 8 101", "audio 3 33", "audio 3 33"}));
+}
+
+// A hold starts capture with no RTSP client, brings it back after a departing client stopped
+// it for all, and its release stops it.
+TEST_F(ServerTest, CaptureHoldStartsCaptureAndOutlivesDepartingClients) {
+    RtspTransport* listener = skyvo_rtsp_service()->listener();
+    listener->HoldCapture(kQuery);
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video open", "audio open"}));
+    unsigned width = 0, height = 0;
+    get_video_resolution(&width, &height);
+    EXPECT_EQ(width, 640u);
+    EXPECT_EQ(height, 480u);
+
+    {
+        UdpReceiver v, a;
+        RtspClient c("127.0.0.1", port);
+        Play(c, v.port(), a.port());  // capture already runs: no second open
+        c.Send("TEARDOWN " + url + " RTSP/1.0\r\nCSeq: 7\r\n\r\n");
+        EXPECT_TRUE(c.ClosedWithoutAnswer());
+    }
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 6; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video open", "audio open", "video close", "audio close",
+                                      "video open", "audio open"}));
+    listener->ReleaseCapture();
+    listener->ReleaseCapture();  // one release too many changes nothing
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 8; }));
+    EXPECT_EQ(RecordedCalls().back(), "audio close");
+    EXPECT_EQ(listener->capture_holders(), 0);
+}

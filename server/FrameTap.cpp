@@ -1,0 +1,63 @@
+#include "server/FrameTap.h"
+
+#include <atomic>
+#include <mutex>
+
+#include "service/Clocks.h"
+
+namespace {
+
+// The producers of the two tracks each hold the lock only while their frame is handed over;
+// registration takes the same lock, so a removed sink is never called afterwards.
+std::mutex g_sinks_lock;
+EncodedFrameSink* g_sinks[kMaxFrameSinks] = {};
+std::atomic<int> g_sink_count{0};
+
+bool AnySink() { return g_sink_count.load(std::memory_order_acquire) != 0; }
+
+template <typename Call>
+void Dispatch(Call call) {
+    std::lock_guard<std::mutex> hold(g_sinks_lock);
+    for (EncodedFrameSink* sink : g_sinks) {
+        if (sink != nullptr) call(sink);
+    }
+}
+
+}  // namespace
+
+bool AddFrameSink(EncodedFrameSink* sink) {
+    if (sink == nullptr) return false;
+    std::lock_guard<std::mutex> hold(g_sinks_lock);
+    for (EncodedFrameSink* existing : g_sinks) {
+        if (existing == sink) return false;
+    }
+    for (EncodedFrameSink*& slot : g_sinks) {
+        if (slot != nullptr) continue;
+        slot = sink;
+        g_sink_count.fetch_add(1, std::memory_order_release);
+        return true;
+    }
+    return false;
+}
+
+void RemoveFrameSink(EncodedFrameSink* sink) {
+    std::lock_guard<std::mutex> hold(g_sinks_lock);
+    for (EncodedFrameSink*& slot : g_sinks) {
+        if (slot != sink || sink == nullptr) continue;
+        slot = nullptr;
+        g_sink_count.fetch_sub(1, std::memory_order_release);
+    }
+}
+
+void TapVideoFrame(const uint8_t* data, size_t len) {
+    if (data == nullptr || len == 0 || !AnySink()) return;
+    uint32_t now = GetTimeStampMillsec();
+    Dispatch([&](EncodedFrameSink* sink) { sink->OnVideoFrame(data, len, now); });
+}
+
+void TapAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) {
+    if (data == nullptr || len == 0 || !AnySink()) return;
+    // As the ring does: a producer without a clock of its own gets the monotonic one.
+    if (time_ms == 0) time_ms = GetTimeStampMillsec();
+    Dispatch([&](EncodedFrameSink* sink) { sink->OnAudioFrame(data, len, time_ms); });
+}
