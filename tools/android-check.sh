@@ -1,5 +1,6 @@
 #!/usr/bin/env bash
-# Syntax-only check of the Android adapters (platform/android/*.cpp) for 32-bit ARM.
+# Syntax-only check, for 32-bit ARM, of every source the television build compiles (Android.bp's
+# srcs: the shared layers and the Android adapters).
 # Uses Debian's AOSP headers for binder, utils, log and cutils; tests/android_shims supplies
 # declaration-only stand-ins for what Debian lacks (camera, media, audio); the vendor SDK's
 # declarations come from platform/android/vendor. Nothing is linked or run.
@@ -44,9 +45,12 @@ FLAGS=(-std=c++17 -fsyntax-only -Wall -Wextra -Werror
 passed=0
 failed=0
 shopt -s nullglob
-files=("$ROOT"/platform/android/*.cpp)
+files=()
+while IFS= read -r src; do
+    files+=("$ROOT/$src")
+done < <(sed -n '/srcs: \[/,/\]/s/^ *"\([^"]*\)",*$/\1/p' "$ROOT/Android.bp")
 if [ "${#files[@]}" -eq 0 ]; then
-    echo "android-check: no sources under platform/android" >&2
+    echo "android-check: no sources listed in Android.bp" >&2
     exit 2
 fi
 for file in "${files[@]}"; do
