@@ -1,9 +1,8 @@
 #include "rtsp/CaptureQuery.h"
 
-#include <cstdlib>
-
 #include "capture/LivecameraResolution.h"
 #include "rtsp/KeyWordValue.h"
+#include "rtsp/RequestFields.h"
 #include "service/OrvexLog.h"
 
 namespace {
@@ -28,7 +27,7 @@ unsigned WindowCode(const std::string& v) {
     return 0;
 }
 
-unsigned Number(const std::string& v) { return static_cast<unsigned>(atoi(v.c_str())); }
+unsigned Number(const std::string& v) { return static_cast<unsigned>(LeadingInt(v).value_or(0)); }
 
 }  // namespace
 

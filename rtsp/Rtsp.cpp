@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 
+#include "rtsp/RequestFields.h"
 #include "service/OrvexLog.h"
 
 namespace {
@@ -69,7 +70,7 @@ bool Rtsp::ParseMrl(std::string mrl, std::string* host, std::string* path, int* 
     if (colon != std::string::npos) {
         size_t slash = rest.find('/', colon + 1);
         if (slash != std::string::npos) {
-            p = atoi(rest.substr(colon + 1, slash - colon - 1).c_str());
+            p = LeadingInt(std::string_view(rest).substr(colon + 1, slash - colon - 1)).value_or(0);
             rest.erase(colon, slash - colon);
         }
     }

@@ -59,8 +59,6 @@ public:
     static void SetSessionCounter(unsigned value);
 
 private:
-    // The request URL after its host (see RestAfterHost); false without one.
-    bool UrlAfterHost(std::string* rest);
     bool FindInterleavedOrPorts(const char* word, int* first, int* second);
 
     std::vector<std::string> m_request_lines;

@@ -1,8 +1,7 @@
 // Request parsing of RtspResponse: lenient and substring-based by design. The order of the
 // searches decides ambiguous requests and is part of the behaviour.
-#include <cstdlib>
-#include <cstring>
 
+#include "rtsp/RequestFields.h"
 #include "rtsp/RtspResponse.h"
 #include "service/OrvexLog.h"
 
@@ -11,34 +10,6 @@ namespace {
 // A request with more lines than this keeps its first lines only: a peer must not make us
 // hold unbounded memory.
 constexpr size_t kRequestLinesMax = 256;
-
-std::string Lower(std::string s) {
-    for (char& c : s) c = to_lower_char(c);
-    return s;
-}
-
-bool Contains(const std::string& s, const char* word) { return s.find(word) != std::string::npos; }
-
-// The URL less its first six characters ("rtsp:/"), one '/' and the host through the next
-// '/'; false when no '/' follows the host.
-bool RestAfterHost(const std::string& url, std::string* rest) {
-    std::string r = url.size() > 6 ? url.substr(6) : "";
-    if (!r.empty() && r[0] == '/') r.erase(0, 1);
-    size_t slash = r.find('/');
-    if (slash == std::string::npos) return false;
-    *rest = r.substr(slash + 1);
-    return true;
-}
-
-bool SessionNameOf(const std::string& url, std::string* name) {
-    std::string rest;
-    if (!RestAfterHost(url, &rest)) return false;
-    // Looked for before the cut, so ".../skyvo.N/trackID=1" yields no name.
-    if (Contains(rest, "trackID=")) return false;
-    rest = rest.substr(0, rest.find('/'));
-    if (name != nullptr) *name = rest;
-    return true;
-}
 
 }  // namespace
 
@@ -53,61 +24,29 @@ bool RtspResponse::GetRequests() {
         if (n == 0) break;
         if (m_request_lines.size() < kRequestLinesMax) m_request_lines.push_back(line);
     }
-    std::string cseq;
-    SearchRequests(&cseq, "CSeq");
-    m_cseq = static_cast<unsigned>(atoi(cseq.c_str()));
+    m_cseq = CSeqOf(HeaderValueOf(m_request_lines, "CSeq").value_or(""));
     return true;
 }
 
 bool RtspResponse::GetRequestType(int* type) {
     if (m_request_lines.empty()) return false;
-    // Searched anywhere in the request line, in this order: the first hit decides.
-    static const std::pair<const char*, int> kMethods[] = {
-        {"OPTIONS", kRtspOptions},
-        {"DESCRIBE", kRtspDescribe},
-        {"SETUP", kRtspSetup},
-        {"TEARDOWN", kRtspTeardown},
-        {"PLAY", kRtspPlay},
-        {"PAUSE", kRtspPause},
-        {"GET_PARAMETER", kRtspGetParameter},
-    };
-    const std::string& line = m_request_lines[0];
-    for (const auto& m : kMethods) {
-        if (Contains(line, m.first)) {
-            if (type != nullptr) *type = m.second;
-            return true;
-        }
-    }
-    return false;
+    int method = RequestMethodOf(m_request_lines[0]);
+    if (method == 0) return false;
+    if (type != nullptr) *type = method;
+    return true;
 }
 
 bool RtspResponse::SearchRequests(std::string* value, std::string key) {
-    std::string lower_key = Lower(key);
-    for (const std::string& line : m_request_lines) {
-        size_t at = Lower(line).find(lower_key);
-        if (at == std::string::npos) continue;
-        std::string v = line.substr(at + lower_key.size());
-        size_t b = v.find_first_not_of(':');
-        v = b == std::string::npos ? "" : v.substr(b);
-        size_t t = v.find_first_not_of(" \t");
-        if (t != std::string::npos) v = v.substr(t);  // only blanks left: kept as they are
-        if (value != nullptr) *value = v;
-        break;
-    }
+    std::optional<std::string> found = HeaderValueOf(m_request_lines, key);
+    if (found && value != nullptr) *value = *found;
     return true;
 }
 
 bool RtspResponse::GetRequestMrl(std::string* mrl) {
     if (m_request_lines.empty()) return false;
-    const std::string& line = m_request_lines[0];
-    size_t start = Lower(line).find("rtsp:/");
-    if (start == std::string::npos) return false;
-    size_t version = line.find("RTSP/1.0", start);
-    if (version == std::string::npos) return false;
-    std::string url = line.substr(start, version - start);
-    size_t end = url.find_last_not_of(' ');
-    url.erase(end == std::string::npos ? 0 : end + 1);
-    if (mrl != nullptr) *mrl = url;
+    std::optional<std::string> url = MrlOf(m_request_lines[0]);
+    if (!url) return false;
+    if (mrl != nullptr) *mrl = *url;
     return true;
 }
 
@@ -123,14 +62,12 @@ bool RtspResponse::GetRequestServerUrl(std::string* server) {
     return true;
 }
 
-bool RtspResponse::UrlAfterHost(std::string* rest) {
-    std::string url;
-    return GetRequestMrl(&url) && RestAfterHost(url, rest);
-}
-
 bool RtspResponse::GetRequestSessionName(std::string* name) {
     std::string url;
-    return GetRequestMrl(&url) && SessionNameOf(url, name);
+    if (!GetRequestMrl(&url)) return false;
+    std::optional<std::string> n = SessionNameOf(url);
+    if (n && name != nullptr) *name = *n;
+    return n.has_value();
 }
 
 bool RtspResponse::GetRequestSessionName(std::string* name, std::string& authTime) {
@@ -140,8 +77,9 @@ bool RtspResponse::GetRequestSessionName(std::string* name, std::string& authTim
     for (char c : url) {
         if (c != ' ') compact.push_back(c);
     }
-    std::string n;
-    if (!SessionNameOf(compact, &n)) return false;
+    std::optional<std::string> named = SessionNameOf(compact);
+    if (!named) return false;
+    std::string n = *named;
     size_t dot = n.find('.');
     if (dot != std::string::npos) {
         authTime = n.substr(dot + 1);
@@ -153,33 +91,19 @@ bool RtspResponse::GetRequestSessionName(std::string* name, std::string& authTim
 }
 
 bool RtspResponse::GetRequestStreamName(std::string* stream) {
-    std::string rest;
-    std::string s;
-    bool ok = false;
-    if (UrlAfterHost(&rest)) {
-        size_t slash = rest.find('/');
-        if (slash != std::string::npos) {
-            s = rest.substr(slash + 1);
-            ok = true;
-        } else if (Contains(rest, "trackID=")) {
-            s = rest;
-            ok = true;
-        }
-    }
-    if (stream != nullptr) *stream = s;
-    return ok;
+    std::string url;
+    std::optional<std::string> s;
+    if (GetRequestMrl(&url)) s = StreamNameOf(url);
+    if (stream != nullptr) *stream = s.value_or("");
+    return s.has_value();
 }
 
 bool RtspResponse::FindInterleavedOrPorts(const char* word, int* first, int* second) {
-    std::string transport;
-    SearchRequests(&transport, "Transport");
-    size_t at = transport.find(word);
-    if (at == std::string::npos) return false;
-    std::string value = transport.substr(at + strlen(word));
-    value = value.substr(0, value.find(';'));
-    size_t dash = value.find('-');
-    *first = atoi(value.c_str());
-    *second = atoi(dash != std::string::npos ? value.c_str() + dash + 1 : value.c_str());
+    std::optional<PortPair> pair =
+        PortPairOf(HeaderValueOf(m_request_lines, "Transport").value_or(""), word);
+    if (!pair) return false;
+    *first = pair->first;
+    *second = pair->second;
     return true;
 }
 

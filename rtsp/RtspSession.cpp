@@ -10,6 +10,7 @@
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
 #include "rtsp/CaptureQuery.h"
+#include "rtsp/RequestFields.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
 
@@ -83,7 +84,7 @@ bool RtspSession::TransportDescribe(std::string* sdp) {
     std::string name, time_text;
     m_response->GetRequestSessionName(&name, time_text);
     if (g_url_check_switch.load(std::memory_order_relaxed) != 0) {
-        int stamp = atoi(time_text.c_str());
+        int stamp = LeadingInt(time_text).value_or(0);
         timeval now{};
         gettimeofday(&now, nullptr);
         int now_sec = static_cast<int>(now.tv_sec);
@@ -135,12 +136,10 @@ void RtspSession::ResponseSetup() {
 bool RtspSession::TransportSetup(MediaSession* session, unsigned* server_port, int* client_port) {
     std::string stream;
     m_response->GetRequestStreamName(&stream);
-    size_t track = stream.find("trackID=");
-    if (track != std::string::npos) {
-        // trackID=1 is the first stream.
-        int index = atoi(stream.c_str() + track + 8) - 1;
+    std::optional<int> track = TrackIndexOf(stream);
+    if (track) {
         MediaStream* s =
-            index >= 0 ? session->GetMediaStream(static_cast<unsigned>(index)) : nullptr;
+            *track >= 0 ? session->GetMediaStream(static_cast<unsigned>(*track)) : nullptr;
         if (s == nullptr) {
             m_response->ResponseError("RTSP/1.0 404 Stream Not Found");
             return false;

@@ -542,3 +542,19 @@ TEST_F(ServerTest, CaptureHoldStartsCaptureAndOutlivesDepartingClients) {
     EXPECT_EQ(RecordedCalls().back(), "audio close");
     EXPECT_EQ(listener->capture_holders(), 0);
 }
+
+// Track numbers beyond int's range are unknown tracks, not arithmetic on them.
+TEST_F(ServerTest, OutOfRangeTrackNumbersAnswerStreamNotFound) {
+    RtspClient c("127.0.0.2", port);
+    ASSERT_EQ(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n")
+                  .compare(0, 15, "RTSP/1.0 200 OK"),
+              0);
+    int cseq = 2;
+    for (const char* track : {"-2147483648", "2147483648", "0", "99999999999999999999"}) {
+        const std::string n = std::to_string(cseq++);
+        EXPECT_EQ(c.Exchange("SETUP " + url + "/trackID=" + track + " RTSP/1.0\r\nCSeq: " + n +
+                             "\r\nTransport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n"),
+                  "RTSP/1.0 404 Stream Not Found\r\nCSeq: " + n + "\r\n\r\n")
+            << track;
+    }
+}
