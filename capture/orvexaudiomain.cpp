@@ -72,9 +72,13 @@ void* AacThread(void* flag) {
     return nullptr;
 }
 
-int Start(Worker& w, void* (*body)(void*)) {
+int Start(Worker& w, void* (*body)(void*), const char* name) {
     int rc = pthread_create(&w.handle, nullptr, body, &w.run);
     w.started = rc == 0;
+    if (rc != 0) {
+        OrvexLogPriority(platform::kLogError, kTag, "%s thread could not start (%d): no sound",
+                         name, rc);
+    }
     return rc;
 }
 
@@ -262,8 +266,8 @@ int start_audio_record_enc() {
     g_pcm_ring.reset();
     g_pcm.run = 1;
     g_aac.run = 1;
-    Start(g_aac, AacThread);
-    return Start(g_pcm, PcmThread);
+    Start(g_aac, AacThread, "AAC encoder");
+    return Start(g_pcm, PcmThread, "PCM");
 }
 
 void stop_audio_record_enc() {

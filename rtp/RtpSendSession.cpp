@@ -1,5 +1,6 @@
 #include "rtp/RtpSendSession.h"
 
+#include "platform/LogPort.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
 
@@ -25,6 +26,11 @@ int RtpSendSession::StartSendThread() {
     BeforeStart();
     int rc = pthread_create(&m_thread, nullptr, Trampoline, this);
     m_thread_started = rc == 0;
+    if (rc != 0) {
+        m_running.store(0, std::memory_order_relaxed);
+        OrvexLogPriority(platform::kLogError, "orvex:::RtpSendSession",
+                         "send thread could not start (%d): nothing is sent", rc);
+    }
     return rc;
 }
 

@@ -22,8 +22,9 @@ void CloseVideoAndAudioDecodeAndSend();
 // client connection, at most five clients (one per IPv4 address), the two media rings, and
 // the rules that start capture with the first PLAY and stop it when a client goes away.
 // A client whose connection becomes readable is served exclusively until it leaves.
-// Thread contract: Open and CloseAll from the controlling thread; the add_* producers from
-// one producer thread each; everything else runs on the listener thread.
+// Thread contract: Open and CloseAll from the controlling thread; the add_* producers from any
+// threads (the rings' producer contract, media/cycle_buffer.h); HoldCapture, ReleaseCapture and
+// Wake from any thread; everything else runs on the listener thread.
 class RtspTransport : public MediaSessionList {
 public:
     RtspTransport();

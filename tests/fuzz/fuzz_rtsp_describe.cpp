@@ -2,8 +2,9 @@
 // answered as the listener runs it: DESCRIBE hands the query keys to the capture rules and the
 // name to the served presentation and its SDP; SETUP takes the name, the stream and the
 // transport through the URL extractors. The first byte picks the platform flavour and whether
-// the URL time check is on. Run with -close_fd_mask=1: the query search traces to standard
-// output.
+// the URL time check is on; the second splits the rest into the DESCRIBE URL and the stream
+// part that SETUP appends to it, so SETUP's track numbers are reached on their own. Run with
+// -close_fd_mask=1: the query search traces to standard output.
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -36,13 +37,16 @@ struct Server {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     static Server* server = new Server();  // lives as long as the process
-    if (size < 1 || size > 8192) return 0;
+    if (size < 2 || size > 8192) return 0;
     static const char* const kFlavours[] = {"sa", "px", "dqx", ""};
     server->fake.properties.Set("kelvo.build.kelvotv", kFlavours[data[0] & 3]);
     g_url_check_switch = (data[0] & 4) != 0;
-    std::string url(reinterpret_cast<const char*>(data + 1), size - 1);
+    std::string rest(reinterpret_cast<const char*>(data + 2), size - 2);
+    size_t split = data[1] % (rest.size() + 1);
+    std::string url = rest.substr(0, split);
+    std::string stream = rest.substr(split);
     std::string request = "DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 2\r\n" +
-                          "Accept: application/sdp\r\n\r\n" + "SETUP " + url +
+                          "Accept: application/sdp\r\n\r\n" + "SETUP " + url + stream +
                           " RTSP/1.0\r\nCSeq: 3\r\n" +
                           "Transport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n";
     int fds[2];
