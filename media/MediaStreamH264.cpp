@@ -3,20 +3,9 @@
 #include <cstdio>
 
 #include "capture/LivecameraResolution.h"
+#include "media/AnnexB.h"
 #include "rtp/RtpPackets.h"
 #include "service/GlobalConfig.h"
-
-namespace {
-
-// Index of the next 0 0 1 at or after `from`, or `len`.
-unsigned FindStartCode(const unsigned char* p, unsigned len, unsigned from) {
-    for (unsigned i = from; i + 2 < len; ++i) {
-        if (p[i] == 0 && p[i + 1] == 0 && p[i + 2] == 1) return i;
-    }
-    return len;
-}
-
-}  // namespace
 
 MediaStreamH264::MediaStreamH264(const char* name) : MediaStream(name, kMediaTypeH264) {}
 
@@ -68,10 +57,10 @@ std::string MediaStreamH264::GenerateMediaSdp(unsigned payload_type, int with_co
 int MediaStreamH264::TransportData(unsigned char* data, unsigned len, int timestamp) {
     TLock::Scoped hold(m_state_lock);
     if (m_playing == 0 || data == nullptr || len < 5) return 0;
-    unsigned pos = FindStartCode(data, len, 0);
+    unsigned pos = static_cast<unsigned>(FindStartCode(data, len, 0));
     int total = 0;
     while (pos < len && len - pos >= 5) {
-        unsigned next = FindStartCode(data, len, pos + 3);
+        unsigned next = static_cast<unsigned>(FindStartCode(data, len, pos + 3));
         bool last = next >= len;
         unsigned end = next;
         if (!last && next > pos + 3 && data[next - 1] == 0) end = next - 1;  // 0 0 0 1

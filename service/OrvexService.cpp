@@ -2,6 +2,7 @@
 
 #include "capture/DumpFile.h"
 #include "capture/LivecameraResolution.h"
+#include "media/AnnexB.h"
 #include "platform/Ports.h"
 #include "server/DumpSwitches.h"
 #include "server/skyvo_rtsp.h"
@@ -19,10 +20,6 @@ DumpFile g_h264_dump(
      "Remove /data/app/orvextesth264.h264. ", "Remove /data/app/orvextesth264.h264 failed. ",
      "/n open /data/app/orvextesth264.h264 failed /n"},
     &capture_state().log_switch);
-
-bool StartCodeAt(const unsigned char* p) {
-    return p[0] == 0 && p[1] == 0 && p[2] == 0 && p[3] == 1;
-}
 
 }  // namespace
 
@@ -64,15 +61,15 @@ int OrvexService::onTransact(uint32_t code, platform::ParcelReader& data, uint32
 void sendppsandspsframe(unsigned char* buf, int len) {
     OrvexPrintLog(kTag, "sendppsandspsframe");
     if (buf == nullptr || len < 1) return;
-    int unit = 0;
+    const size_t size = static_cast<size_t>(len);
+    size_t unit = 0;
     // The buffer begins with a start code; look for the next ones after it.
-    for (int i = 4; len - i >= 4; ++i) {
-        if (!StartCodeAt(buf + i)) continue;
+    for (size_t i = FindFourByteStartCode(buf, size, 4); i < size;
+         i = FindFourByteStartCode(buf, size, i + 4)) {
         skyvo_add_h264_data(buf + unit, static_cast<unsigned>(i - unit));
         unit = i;
-        i += 3;
     }
-    skyvo_add_h264_data(buf + unit, static_cast<unsigned>(len - unit));
+    skyvo_add_h264_data(buf + unit, static_cast<unsigned>(size - unit));
 }
 
 void Test_write_h264_frame(char* buf, unsigned n) {

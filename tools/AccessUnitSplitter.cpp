@@ -1,21 +1,11 @@
 #include "tools/AccessUnitSplitter.h"
 
+#include "media/AnnexB.h"
+
 namespace tools {
 namespace {
 
 constexpr uint8_t kStartCode[4] = {0, 0, 0, 1};
-
-// Index of the next 00 00 01 at or after `from`, or `size`.
-size_t FindStartCode(const uint8_t* data, size_t size, size_t from) {
-    for (size_t i = from; i + 3 <= size; ++i) {
-        if (data[i + 2] > 1) {
-            i += 2;  // no start code can begin at i, i + 1 or i + 2
-        } else if (data[i] == 0 && data[i + 1] == 0 && data[i + 2] == 1) {
-            return i;
-        }
-    }
-    return size;
-}
 
 // Where a start code found at `sc` begins, counting the zero of a 4-byte one.
 size_t StartCodeBegin(const uint8_t* data, size_t sc) {
@@ -75,6 +65,17 @@ std::vector<std::vector<uint8_t>> SplitAccessUnits(const uint8_t* data, size_t s
     }
     if (consumed != nullptr) *consumed = pending;
     return units;
+}
+
+std::vector<Span> NalUnitSpans(const uint8_t* unit, size_t size) {
+    std::vector<Span> spans;
+    size_t begin = FindFourByteStartCode(unit, size, 0);
+    while (begin < size) {
+        size_t end = FindFourByteStartCode(unit, size, begin + 4);
+        spans.push_back({begin, end});
+        begin = end;
+    }
+    return spans;
 }
 
 }  // namespace tools

@@ -19,4 +19,13 @@ namespace tools {
 std::vector<std::vector<uint8_t>> SplitAccessUnits(const uint8_t* data, size_t size,
                                                    bool at_end = true, size_t* consumed = nullptr);
 
+// The NAL units of one access unit as SplitAccessUnits makes it: [begin, end) spans, each with
+// its 4-byte start code, in order. The platform recorder hands over one NAL unit per
+// transaction, and the service stores each transaction as one unit.
+struct Span {
+    size_t begin;
+    size_t end;
+};
+std::vector<Span> NalUnitSpans(const uint8_t* unit, size_t size);
+
 }  // namespace tools

@@ -76,7 +76,8 @@ public:
               std::chrono::duration_cast<Clock::duration>(std::chrono::duration<double>(1 / fps))) {
     }
 
-    // False once the service is gone.
+    // One access unit per frame period, one transaction per NAL unit. False once the service
+    // is gone.
     bool Send(const std::vector<uint8_t>& unit) {
         Clock::time_point now = Clock::now();
         if (sent_ == 0) {
@@ -87,19 +88,8 @@ public:
         }
         std::this_thread::sleep_until(next_);
         next_ += period_;
-        platform::ParcelWriter parcel;
-        parcel.writeInt32(static_cast<int32_t>(unit.size()));
-        parcel.writeInplace(unit.data(), unit.size());
-        parcel.writeInt32(0);
-        int status = binder_.transact(kService, kEncodedFrameCode, parcel);
-        if (status == platform::host::HostBinder::kDeadObject) {
-            fprintf(stderr, "orvex-feed: service %s is not there (sockets in %s)\n", kService,
-                    platform::host::HostBinder::BinderDir().c_str());
-            return false;
-        }
-        if (status != platform::kBinderOk && refused_++ == 0) {
-            fprintf(stderr, "orvex-feed: %s answered %d to an access unit of %zu bytes\n", kService,
-                    status, unit.size());
+        for (const tools::Span& nal : tools::NalUnitSpans(unit.data(), unit.size())) {
+            if (!Transact(unit.data() + nal.begin, nal.end - nal.begin)) return false;
         }
         ++sent_;
         return true;
@@ -109,6 +99,25 @@ public:
     size_t refused() const { return refused_; }
 
 private:
+    bool Transact(const uint8_t* nal, size_t size) {
+        parcel_.clear();
+        parcel_.writeInt32(static_cast<int32_t>(size));
+        parcel_.writeInplace(nal, size);
+        parcel_.writeInt32(0);
+        int status = binder_.transact(kService, kEncodedFrameCode, parcel_);
+        if (status == platform::host::HostBinder::kDeadObject) {
+            fprintf(stderr, "orvex-feed: service %s is not there (sockets in %s)\n", kService,
+                    platform::host::HostBinder::BinderDir().c_str());
+            return false;
+        }
+        if (status != platform::kBinderOk && refused_++ == 0) {
+            fprintf(stderr, "orvex-feed: %s answered %d to a NAL unit of %zu bytes\n", kService,
+                    status, size);
+        }
+        return true;
+    }
+
+    platform::ParcelWriter parcel_;
     platform::BinderPort& binder_;
     const Clock::duration period_;
     Clock::time_point next_;
@@ -186,7 +195,7 @@ int main(int argc, char** argv) {
     } while (ok && options.loop);
     if (!from_stdin) close(fd);
     fprintf(stderr, "orvex-feed: sent %zu access units", feeder.sent());
-    if (feeder.refused() > 0) fprintf(stderr, ", %zu refused", feeder.refused());
+    if (feeder.refused() > 0) fprintf(stderr, ", %zu NAL units refused", feeder.refused());
     fprintf(stderr, "\n");
     return ok ? 0 : 1;
 }

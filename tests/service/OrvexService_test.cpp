@@ -7,11 +7,13 @@
 #include <vector>
 
 #include "platform/fake/FakePlatform.h"
+#include "rtp/RtpPackets.h"
 #include "rtsp/RtspTransport.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
 #include "service/GlobalConfig.h"
+#include "tools/AccessUnitSplitter.h"
 
 namespace {
 
@@ -120,6 +122,43 @@ TEST_F(OrvexServiceTest, LyingOrShortParcelsNeverReadPastTheData) {
     std::vector<Bytes> items = Items();
     ASSERT_EQ(items.size(), 1u);  // only the two-byte frame was whole
     EXPECT_EQ(items[0], (Bytes{0, 0}));
+}
+
+// A picture from a stock encoder (delimiter, SEI, two slices), fed as orvex-feed feeds it: each
+// NAL unit reaches the clients as its own packets, typed as itself.
+TEST_F(OrvexServiceTest, FeedSendsEachNalUnitOfAnAccessUnitAsItsOwnFrame) {
+    const Bytes aud = {0, 0, 0, 1, 0x09, 0xF0};
+    const Bytes sei = {0, 0, 1, 0x06, 0x05, 0x02, 0xAA, 0xBB, 0x80};  // 3-byte start code
+    const Bytes first = {0, 0, 0, 1, 0x41, 0x9A, 0x11, 0x22};         // first_mb_in_slice 0
+    const Bytes second = {0, 0, 0, 1, 0x41, 0x3A, 0x33};              // first_mb_in_slice 2
+    const Bytes next = {0, 0, 0, 1, 0x09, 0xF0};
+    Bytes stream = Cat({aud, sei, first, second, next});
+    std::vector<std::vector<uint8_t>> units = tools::SplitAccessUnits(stream.data(), stream.size());
+    ASSERT_EQ(units.size(), 2u);
+    for (const tools::Span& nal : tools::NalUnitSpans(units[0].data(), units[0].size())) {
+        Bytes frame(units[0].begin() + static_cast<std::ptrdiff_t>(nal.begin),
+                    units[0].begin() + static_cast<std::ptrdiff_t>(nal.end));
+        ASSERT_EQ(Transact(101, Frame(frame)), platform::kBinderOk);
+    }
+
+    struct Packets : PacketSink {
+        void Send(const unsigned char* packet, unsigned length) override {
+            sent.emplace_back(packet + kRtpHeaderSize, packet + length);
+        }
+        std::vector<Bytes> sent;
+    } packets;
+    uint16_t sequence = 0;
+    for (const Bytes& item : Items()) {
+        PacketiseH264Item(item.data(), static_cast<unsigned>(item.size()), 0, 96, &sequence,
+                          packets);
+    }
+    const std::vector<Bytes> payloads = {
+        {0x09, 0xF0},
+        {0x06, 0x05, 0x02, 0xAA, 0xBB, 0x80},
+        {0x41, 0x9A, 0x11, 0x22},
+        {0x41, 0x3A, 0x33},
+    };
+    EXPECT_EQ(packets.sent, payloads);
 }
 
 TEST(ParcelTest, ReaderTableStaysInsideItsData) {

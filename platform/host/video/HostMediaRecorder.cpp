@@ -14,6 +14,7 @@
 #include <mutex>
 #include <system_error>
 
+#include "media/AnnexB.h"
 #include "platform/Ports.h"
 #include "platform/host/capture/GstSource.h"
 #include "platform/host/video/HostCamera.h"
@@ -50,13 +51,6 @@ uint64_t MonotonicNs() {
 std::string Trim(const std::string& s) {
     size_t b = s.find_first_not_of(" \t"), e = s.find_last_not_of(" \t");
     return b == std::string::npos ? std::string() : s.substr(b, e - b + 1);
-}
-
-// Length of the start code OpenH264 put in front of a NAL unit (it writes 4, but 3 is legal).
-size_t StartCodeLength(const uint8_t* p, int len) {
-    if (len >= 4 && p[0] == 0 && p[1] == 0 && p[2] == 0 && p[3] == 1) return 4;
-    if (len >= 3 && p[0] == 0 && p[1] == 0 && p[2] == 1) return 3;
-    return 0;
 }
 
 // The two C entry points of OpenH264; the encoder itself is reached through its vtable.
@@ -398,7 +392,7 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_
         const uint8_t* nal = layer.pBsBuf;
         for (int n = 0; n < layer.iNalCount; ++n) {
             int len = layer.pNalLengthInByte[n];
-            size_t start = StartCodeLength(nal, len);
+            size_t start = StartCodeLength(nal, static_cast<size_t>(len));
             size_t need = size + 4 + len - start;
             if (need > frame_.size()) frame_.resize(need + need / 2);
             static const uint8_t kStartCode[4] = {0, 0, 0, 1};
