@@ -7,13 +7,18 @@ constexpr int32_t kAheadLimitMs = 251;
 
 unsigned PositionMs(uint32_t timestamp, unsigned rate) {
     if (rate == 0) return 0;
-    return static_cast<unsigned>(timestamp / static_cast<double>(rate) * 1000.0);
+    // Through 64 bits, so that a slow clock wraps like the time stamps instead of overflowing.
+    return static_cast<unsigned>(
+        static_cast<uint64_t>(timestamp / static_cast<double>(rate) * 1000.0));
 }
 
 void AdvanceTimestamp(uint32_t* timestamp, unsigned rate, uint32_t item_ms,
                       uint32_t* last_item_ms) {
     if (item_ms >= *last_item_ms) {
-        *timestamp += static_cast<uint32_t>(rate * ((item_ms - *last_item_ms) / 1000.0));
+        // A gap of up to 49 days times any 32-bit rate stays below 2^64; the time stamp wraps
+        // modulo 2^32, as RTP time stamps do.
+        *timestamp += static_cast<uint32_t>(
+            static_cast<uint64_t>(rate * ((item_ms - *last_item_ms) / 1000.0)));
     }
     *last_item_ms = item_ms;
 }

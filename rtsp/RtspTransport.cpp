@@ -278,6 +278,7 @@ void RtspTransport::ListenThread() {
         if (n >= 0 && ProcessReadRtspSession(ready) != 0) {
             ProcessNewIncomingRtspSession(m_listen_fd, ready, max_fd);
         }
+        m_rounds.fetch_add(1, std::memory_order_relaxed);
     }
     OrvexPrint("\n quit all orvex loop ! ");
     // The process ends with its listener.

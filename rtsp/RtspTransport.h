@@ -56,6 +56,8 @@ public:
     void HoldCapture(const std::string& query);
     void ReleaseCapture();
     int capture_holders() const { return m_capture_holders.load(std::memory_order_relaxed); }
+    // Listener rounds completed so far, so that a test can wait for rounds to pass.
+    unsigned rounds() const { return m_rounds.load(std::memory_order_relaxed); }
     // Ends the listener's current select wait. Any thread; the first call opens the pipe.
     void Wake();
 
@@ -93,6 +95,7 @@ private:
     int m_reopened = 0;
     // Capture holds; the query of the latest hold waits for the listener under its lock.
     std::atomic<int> m_capture_holders{0};
+    std::atomic<unsigned> m_rounds{0};
     bool m_held = false;  // listener thread: holds were seen, so their end may stop capture
     std::mutex m_hold_lock;
     std::string m_hold_query;

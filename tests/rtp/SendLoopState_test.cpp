@@ -92,4 +92,26 @@ TEST(SendStateTest, TimestampsFollowItemTimes) {
     EXPECT_EQ(PositionMs(12345, 0), 0u);
 }
 
+// Long gaps (a stalled source, a clock that wrapped) move the time stamp modulo 2^32, as RTP
+// time stamps wrap, rather than overflowing the conversion.
+TEST(SendStateTest, LongGapsWrapTheTimestamp) {
+    struct Case {
+        uint32_t ts, last_ms, item_ms;
+        unsigned rate;
+        uint32_t expected;
+    };
+    const Case cases[] = {
+        {0, 0, 47721858, 90000, 4294967220u},  // 13.3 hours: just below 2^32
+        {0, 0, 47721859, 90000, 14u},          // 4294967310 - 2^32
+        {100, 0, 4294967295u, 90000, 10u},     // 49.7 days at 90 kHz
+        {0, 0, 4294967295u, 4294967295u, 1262720384u},
+    };
+    for (const Case& c : cases) {
+        uint32_t ts = c.ts, last = c.last_ms;
+        AdvanceTimestamp(&ts, c.rate, c.item_ms, &last);
+        EXPECT_EQ(ts, c.expected) << c.item_ms << " ms at " << c.rate;
+    }
+    EXPECT_EQ(PositionMs(4294967295u, 1), 4294966296u);  // 4294967295000 mod 2^32
+}
+
 }  // namespace

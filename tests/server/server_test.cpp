@@ -257,7 +257,9 @@ TEST_F(ServerTest, PlayWithTwoClientsConnectedDoesNotStartCapture) {
     ASSERT_TRUE(WaitFor([&] { return Clients() == 2; }));
     UdpReceiver v, a;
     Play(player, v.port(), a.port());
-    std::this_thread::sleep_for(std::chrono::milliseconds(50));  // capture would start by now
+    // The listener starts capture after a PLAY's answer, before it reads the next request: this
+    // answer proves it had its chance.
+    player.Exchange("GET_PARAMETER " + url + " RTSP/1.0\r\nCSeq: 6\r\n\r\n");
     EXPECT_TRUE(RecordedCalls().empty());
     player.Close();
     // Any client leaving stops capture for all: the close callbacks and the TV defaults.
@@ -388,7 +390,9 @@ TEST_F(ServerTest, PipStopClosesCaptureAndReopensThreeRoundsLaterOnlyWhenFollowi
     g_follow_main_flag = 0;
     listener.eventCallback(1);
     ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
-    std::this_thread::sleep_for(std::chrono::milliseconds(300));  // well past three rounds
+    RtspTransport* rtsp = skyvo_rtsp_service()->listener();
+    unsigned round = rtsp->rounds();
+    ASSERT_TRUE(WaitFor([&] { return rtsp->rounds() >= round + 4; }));  // past the countdown
     EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close"}));
 }
 
