@@ -1,6 +1,8 @@
 #include "capture/livepipmanager.h"
 
-#include <mutex>
+#include <memory>
+
+#include "media/thread_mutex.h"
 
 #include "platform/Ports.h"
 #include "service/OrvexLog.h"
@@ -12,14 +14,14 @@ namespace {
 
 constexpr const char* kTag = "orvex:::livepipmanager";
 
-std::mutex g_client_mutex;
-std::shared_ptr<platform::PipManagerClient> g_client;
+thread_mutex g_client_mutex;
+std::shared_ptr<platform::PipManagerClient> g_client ORVEX_GUARDED_BY(g_client_mutex);
 
 }  // namespace
 
 int openPipManager() {
     OrvexLog(kTag, "openPipManager");
-    std::lock_guard<std::mutex> hold(g_client_mutex);
+    thread_mutex::Scoped hold(g_client_mutex);
     g_client = platform::PipManager().connect();
     if (!g_client) {
         OrvexLog(kTag, "can't get pip manager");
@@ -32,7 +34,7 @@ void closePipManager() {
     OrvexLog(kTag, "closePipManager begin");
     std::shared_ptr<platform::PipManagerClient> client;
     {
-        std::lock_guard<std::mutex> hold(g_client_mutex);
+        thread_mutex::Scoped hold(g_client_mutex);
         client.swap(g_client);
     }
     if (client) client->disconnect();
@@ -40,7 +42,7 @@ void closePipManager() {
 }
 
 std::shared_ptr<platform::PipManagerClient> PipManagerClientHeld() {
-    std::lock_guard<std::mutex> hold(g_client_mutex);
+    thread_mutex::Scoped hold(g_client_mutex);
     return g_client;
 }
 

@@ -215,8 +215,12 @@ bool cycle_buffer::ReaderSatisfied(uint32_t len) {
 
 void cycle_buffer::RingBell(bool wake) {
     {
-        std::lock_guard<std::mutex> hold(m_bell_lock);
-        (wake ? m_bell_wake : m_bell_data) = true;
+        thread_mutex::Scoped hold(m_bell_lock);
+        if (wake) {
+            m_bell_wake = true;
+        } else {
+            m_bell_data = true;
+        }
     }
     m_bell.notify_one();
 }
@@ -225,7 +229,7 @@ bool cycle_buffer::wait_readable(uint32_t len, unsigned max_ms) {
     auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(max_ms);
     {
         // A ring left by an earlier wait that timed out is not for this one.
-        std::lock_guard<std::mutex> bell(m_bell_lock);
+        thread_mutex::Scoped bell(m_bell_lock);
         m_bell_data = false;
     }
     {
@@ -234,8 +238,10 @@ bool cycle_buffer::wait_readable(uint32_t len, unsigned max_ms) {
         m_reader_wants = len > 0 ? len : 1;
     }
     {
-        std::unique_lock<std::mutex> bell(m_bell_lock);
-        m_bell.wait_until(bell, until, [this] { return m_bell_data || m_bell_wake; });
+        thread_mutex::Scoped bell(m_bell_lock);
+        while (!m_bell_data && !m_bell_wake) {
+            if (m_bell.wait_until(m_bell_lock, until) == std::cv_status::timeout) break;
+        }
         m_bell_data = m_bell_wake = false;
     }
     thread_mutex::Scoped hold(m_lock);

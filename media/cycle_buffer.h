@@ -96,13 +96,13 @@ private:
     uint32_t m_waiters ORVEX_GUARDED_BY(m_lock) = 0;  // writers and resets in Wait
     std::condition_variable_any m_changed;            // a publish or a reset finished
     // What the consumer waits for in wait_readable (0: it does not wait), so that only the
-    // publish that brings that much wakes it. It sleeps on a bell of its own: a plain mutex and
-    // condition variable, rung after the ring's lock is released, cost one futex wake.
+    // publish that brings that much wakes it. It sleeps on a bell of its own, rung after the
+    // ring's lock is released.
     uint32_t m_reader_wants ORVEX_GUARDED_BY(m_lock) = 0;
-    std::mutex m_bell_lock;
-    std::condition_variable m_bell;
-    bool m_bell_data = false;  // the publish the wait asked for came (guarded by m_bell_lock)
-    bool m_bell_wake = false;  // wake_reader, kept for a wait not yet begun (m_bell_lock)
+    thread_mutex m_bell_lock;
+    std::condition_variable_any m_bell;
+    bool m_bell_data ORVEX_GUARDED_BY(m_bell_lock) = false;  // the publish the wait asked for
+    bool m_bell_wake ORVEX_GUARDED_BY(m_bell_lock) = false;  // kept for a wait not yet begun
     uint32_t m_threshold = 0;
     std::atomic<int> m_readable{0};
     uint32_t m_written_before_readable ORVEX_GUARDED_BY(m_lock) = 0;

@@ -186,7 +186,7 @@ void RtspTransport::ServePipRestart() {
 
 void RtspTransport::HoldCapture(const std::string& query) {
     {
-        std::lock_guard<std::mutex> hold(m_hold_lock);
+        thread_mutex::Scoped hold(m_hold_lock);
         if (!query.empty()) {
             m_hold_query = query;
             m_hold_query_pending = true;
@@ -205,7 +205,7 @@ void RtspTransport::ReleaseCapture() {
 
 void RtspTransport::Wake() {
     if (m_wake_write.load(std::memory_order_acquire) < 0) {
-        std::lock_guard<std::mutex> hold(m_wake_lock);
+        thread_mutex::Scoped hold(m_wake_lock);
         int fds[2];
         if (m_wake_write.load(std::memory_order_relaxed) < 0 &&
             pipe2(fds, O_NONBLOCK | O_CLOEXEC) == 0) {
@@ -242,7 +242,7 @@ void RtspTransport::ServeCaptureHolders() {
     m_held = true;
     std::string query;
     {
-        std::lock_guard<std::mutex> hold(m_hold_lock);
+        thread_mutex::Scoped hold(m_hold_lock);
         if (m_hold_query_pending) query.swap(m_hold_query);
         m_hold_query_pending = false;
     }

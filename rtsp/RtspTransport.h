@@ -6,11 +6,11 @@
 
 #include <atomic>
 #include <map>
-#include <mutex>
 #include <string>
 
 #include "media/MediaSessionList.h"
 #include "media/cycle_buffer.h"
+#include "media/thread_mutex.h"
 
 class RtspSession;
 
@@ -97,12 +97,12 @@ private:
     std::atomic<int> m_capture_holders{0};
     std::atomic<unsigned> m_rounds{0};
     bool m_held = false;  // listener thread: holds were seen, so their end may stop capture
-    std::mutex m_hold_lock;
-    std::string m_hold_query;
-    bool m_hold_query_pending = false;
+    thread_mutex m_hold_lock;
+    std::string m_hold_query ORVEX_GUARDED_BY(m_hold_lock);
+    bool m_hold_query_pending ORVEX_GUARDED_BY(m_hold_lock) = false;
     // Self-pipe in the select set, opened on first use so that a listener nobody wakes keeps
     // its descriptors as they were.
-    std::mutex m_wake_lock;
+    thread_mutex m_wake_lock;
     std::atomic<int> m_wake_read{-1};
     std::atomic<int> m_wake_write{-1};
 };

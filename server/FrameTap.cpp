@@ -1,7 +1,7 @@
 #include "server/FrameTap.h"
 
 #include <atomic>
-#include <mutex>
+#include "media/thread_mutex.h"
 
 #include "service/Clocks.h"
 
@@ -9,15 +9,15 @@ namespace {
 
 // The producers of the two tracks each hold the lock only while their frame is handed over;
 // registration takes the same lock, so a removed sink is never called afterwards.
-std::mutex g_sinks_lock;
-EncodedFrameSink* g_sinks[kMaxFrameSinks] = {};
+thread_mutex g_sinks_lock;
+EncodedFrameSink* g_sinks[kMaxFrameSinks] ORVEX_GUARDED_BY(g_sinks_lock) = {};
 std::atomic<int> g_sink_count{0};
 
 bool AnySink() { return g_sink_count.load(std::memory_order_acquire) != 0; }
 
 template <typename Call>
 void Dispatch(Call call) {
-    std::lock_guard<std::mutex> hold(g_sinks_lock);
+    thread_mutex::Scoped hold(g_sinks_lock);
     for (EncodedFrameSink* sink : g_sinks) {
         if (sink != nullptr) call(sink);
     }
@@ -27,7 +27,7 @@ void Dispatch(Call call) {
 
 bool AddFrameSink(EncodedFrameSink* sink) {
     if (sink == nullptr) return false;
-    std::lock_guard<std::mutex> hold(g_sinks_lock);
+    thread_mutex::Scoped hold(g_sinks_lock);
     for (EncodedFrameSink* existing : g_sinks) {
         if (existing == sink) return false;
     }
@@ -41,7 +41,7 @@ bool AddFrameSink(EncodedFrameSink* sink) {
 }
 
 void RemoveFrameSink(EncodedFrameSink* sink) {
-    std::lock_guard<std::mutex> hold(g_sinks_lock);
+    thread_mutex::Scoped hold(g_sinks_lock);
     for (EncodedFrameSink*& slot : g_sinks) {
         if (slot != sink || sink == nullptr) continue;
         slot = nullptr;

@@ -5,8 +5,8 @@
 
 #include <chrono>
 #include <condition_variable>
-#include <mutex>
 
+#include "media/thread_mutex.h"
 #include "platform/Ports.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
@@ -19,8 +19,8 @@ namespace {
 constexpr const char* kTag = "orvex:::startorvexsevice";
 
 std::atomic<bool> g_service_run{false};
-std::mutex g_service_lock;  // with g_service_wake: ends a waiting service loop at once
-std::condition_variable g_service_wake;
+thread_mutex g_service_lock;  // with g_service_wake: ends a waiting service loop at once
+std::condition_variable_any g_service_wake;
 pthread_t g_service_thread{};
 bool g_service_started = false;
 
@@ -37,9 +37,9 @@ int start_orvex_service_main(std::atomic<bool>* run) {
     Global_Config* config = Global_Config::instance();
     const useconds_t poll_us = config->run_flag_poll_us();
     if (config->wake_on_write()) {
-        std::unique_lock<std::mutex> hold(g_service_lock);
+        thread_mutex::Scoped hold(g_service_lock);
         while (run->load(std::memory_order_relaxed)) {
-            g_service_wake.wait_for(hold, std::chrono::microseconds(poll_us));
+            g_service_wake.wait_for(g_service_lock, std::chrono::microseconds(poll_us));
         }
     } else {
         while (run->load(std::memory_order_relaxed)) usleep(poll_us);
@@ -73,7 +73,7 @@ int start_orvex_system_service() {
 void close_orvex_system_service() {
     OrvexPrintLog(kTag, "close_orvex_system_service");
     {
-        std::lock_guard<std::mutex> hold(g_service_lock);
+        thread_mutex::Scoped hold(g_service_lock);
         g_service_run = false;
     }
     g_service_wake.notify_all();
