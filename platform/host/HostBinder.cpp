@@ -249,6 +249,7 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
         return -err;
     }
     auto listener = std::make_unique<Listener>();
+    listener->name = name;
     listener->path = path;
     listener->fd = fd;
     listener->dev = st.st_dev;
@@ -349,19 +350,30 @@ void HostBinder::Serve(int fd, BinderService& service) {
             at += want;
         }
         ParcelReader reader(data.data(), size);
-        int status;
-        try {
-            status = service.onTransact(code, reader, flags);
-        } catch (const std::exception& e) {
-            Debug("binder: transaction %u threw: %s", code, e.what());
-            status = kUnknownError;
-        } catch (...) {
-            Debug("binder: transaction %u threw", code);
-            status = kUnknownError;
-        }
-        if (!SendStatus(fd, status)) return;
+        if (!SendStatus(fd, Dispatch(service, code, reader, flags))) return;
         if (data.capacity() > kKeptBytes) std::vector<uint8_t>().swap(data);
     }
+}
+
+int HostBinder::Dispatch(BinderService& service, uint32_t code, ParcelReader& reader,
+                         uint32_t flags) {
+    try {
+        return service.onTransact(code, reader, flags);
+    } catch (const std::exception& e) {
+        Debug("binder: transaction %u threw: %s", code, e.what());
+    } catch (...) {
+        Debug("binder: transaction %u threw", code);
+    }
+    return kUnknownError;
+}
+
+std::shared_ptr<BinderService> HostBinder::LocalService(const char* name) {
+    std::lock_guard<std::mutex> hold(mutex_);
+    if (stopping_) return nullptr;
+    for (const auto& listener : listeners_) {
+        if (listener->name == name) return listener->service;
+    }
+    return nullptr;
 }
 
 bool HostBinder::TrackConnection(int fd) {
@@ -427,6 +439,10 @@ int HostBinder::transact(const char* service, uint32_t code, const ParcelWriter&
     PutLe32(header + 8, static_cast<uint32_t>(data.data().size()));
     Outgoing& out = OutgoingFor(service);
     std::lock_guard<std::mutex> hold(out.mutex);
+    if (std::shared_ptr<BinderService> local = LocalService(service)) {
+        ParcelReader reader(data.data().data(), data.data().size());
+        return Dispatch(*local, code, reader, 0);
+    }
     return TransactOn(out, dir_ + "/" + service, header, data.data());
 }
 

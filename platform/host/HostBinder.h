@@ -27,6 +27,11 @@ namespace host {
 // until it closes, so transactions on different connections run concurrently and clients
 // beyond the pool's size wait in the listen backlog until a connection ends.
 //
+// A transaction to a service registered on this same object is dispatched in-process: its
+// onTransact runs on the caller's thread over the caller's bytes, as binder runs a call into
+// its own process, with no socket, copy or thread hand-off. Other processes (orvex-feed) use
+// the sockets.
+//
 // Thread contract: addService/startThreadPool/Stop from one thread; transact from any thread
 // (one connection per service, transactions to the same service are serialised).
 class HostBinder final : public BinderPort {
@@ -69,6 +74,7 @@ public:
 
 private:
     struct Listener {
+        std::string name;
         std::string path;
         int fd = -1;
         dev_t dev = 0;
@@ -80,6 +86,9 @@ private:
         int fd = -1;
     };
 
+    static int Dispatch(BinderService& service, uint32_t code, ParcelReader& reader,
+                        uint32_t flags);
+    std::shared_ptr<BinderService> LocalService(const char* name);
     void PoolLoop();
     void Serve(int fd, BinderService& service);
     bool TrackConnection(int fd);

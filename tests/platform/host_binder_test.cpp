@@ -140,6 +140,26 @@ TEST_F(HostBinderTest, TransactionsArriveWithTheirCodeAndBytes) {
     }
 }
 
+// Within the process that registered the service, a transaction is a call on the caller's own
+// thread: no pool thread has to run for it, and after Stop nobody answers.
+TEST_F(HostBinderTest, TransactionsInTheServicesOwnProcessAreCallsOnTheCallersThread) {
+    auto service = std::make_shared<RecordingService>();
+    HostBinder server;
+    ASSERT_EQ(server.addService("orvex.rtp", service), 0);  // no thread pool started
+    ParcelWriter frame;
+    frame.writeInt32(5);
+    frame.writeInplace("\x00\x00\x00\x01\x41", 5);
+    frame.writeInt32(0);
+    EXPECT_EQ(server.transact("orvex.rtp", 101, frame), 0);
+    EXPECT_EQ(server.transact("orvex.rtp", 2, frame), platform::kBinderUnknownTransaction);
+    std::vector<Received> got = service->Take();
+    ASSERT_EQ(got.size(), 2u);
+    EXPECT_EQ(got[0], (Received{101, 0, frame.data()}));
+    server.Stop();
+    EXPECT_EQ(server.transact("orvex.rtp", 101, frame), HostBinder::kDeadObject);
+    EXPECT_TRUE(service->Take().empty());
+}
+
 TEST_F(HostBinderTest, BadPeersGetAnErrorAndTheServiceGoesOn) {
     auto service = std::make_shared<RecordingService>();
     HostBinder server;
