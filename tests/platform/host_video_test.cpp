@@ -120,7 +120,10 @@ protected:
         EXPECT_EQ(recorder_->release(), 0);
         EXPECT_EQ(camera->lock(), 0);
 
-        std::vector<Bytes> frames;
+        // One NAL unit per transaction, as the platform recorder hands them over; a frame ends
+        // with its slice (OpenH264 writes one slice per picture).
+        std::vector<Bytes> frames(1);
+        units_.clear();
         for (const Transaction& t : binder_.taken()) {
             EXPECT_EQ(t.service, "orvex.rtp");
             EXPECT_EQ(t.code, 101u);
@@ -131,12 +134,17 @@ protected:
             if (bytes == nullptr) continue;
             EXPECT_EQ(in.readInt32(), 0);
             EXPECT_EQ(t.data.size(), 4 + ((static_cast<size_t>(len) + 3) & ~size_t{3}) + 4);
-            frames.emplace_back(bytes, bytes + len);
+            units_.emplace_back(bytes, bytes + len);
+            frames.back().insert(frames.back().end(), bytes, bytes + len);
+            int type = len > 4 ? bytes[4] & 0x1F : 0;
+            if (type == 1 || type == 5) frames.emplace_back();
         }
+        frames.pop_back();  // the frame not yet begun, or a cut-off one
         return frames;
     }
 
     RecordingBinder binder_;
+    std::vector<Bytes> units_;  // what each transaction of the last Record carried
     platform::Ports previous_;
     std::shared_ptr<HostMediaRecorder> recorder_;
 };
@@ -168,11 +176,12 @@ TEST_F(HostVideoRecorderTest, RefusesWrongOrderAndWrongSettings) {
     EXPECT_NE(r.start(), 0);
 }
 
-TEST_F(HostVideoRecorderTest, DeliversEveryFrameAsOneAnnexBBuffer) {
+TEST_F(HostVideoRecorderTest, DeliversEachNalUnitOfEveryFrameOnItsOwn) {
     std::vector<Bytes> frames = Record(500);
     ASSERT_GE(frames.size(), 5u) << "about 15 expected";
     EXPECT_EQ(recorder_->framesDelivered(), frames.size());
     EXPECT_EQ(recorder_->failedTransacts(), 0u);
+    for (const Bytes& unit : units_) EXPECT_EQ(NalTypes(unit).size(), 1u);
     for (size_t i = 0; i < frames.size(); ++i) {
         const Bytes& f = frames[i];
         ASSERT_GE(f.size(), 5u);

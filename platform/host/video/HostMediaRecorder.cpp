@@ -53,6 +53,10 @@ std::string Trim(const std::string& s) {
     return b == std::string::npos ? std::string() : s.substr(b, e - b + 1);
 }
 
+// Restaging a unit behind 4 bytes adds one byte to it; room for this many units per frame
+// (OpenH264 writes a handful), past which further restaged units are left out.
+constexpr size_t kMaxNalsPerFrame = 256;
+
 // The two C entry points of OpenH264; the encoder itself is reached through its vtable.
 struct OpenH264 {
     decltype(&WelsCreateSVCEncoder) create = nullptr;
@@ -384,27 +388,39 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_
         return Encoded{};
     }
 
-    // OpenH264 gives the SPS and PPS as a layer of their own before the IDR slices: one buffer,
-    // every NAL unit behind a 4-byte start code, is what the service expects.
-    size_t size = 0;
+    // The NAL units as OpenH264 wrote them (the SPS and PPS are a layer of their own before the
+    // IDR slices), each to be handed over on its own, as the platform recorder does. It writes
+    // 4-byte start codes; a unit behind a 3-byte one is restaged behind 4 bytes.
+    nals_.clear();
+    // Room for every unit restaged, before any pointer into it is taken.
+    size_t bound = static_cast<size_t>(info.iFrameSizeInBytes) + kMaxNalsPerFrame;
+    if (frame_.size() < bound) frame_.resize(bound);
+    size_t size = 0, staged = 0;
     for (int l = 0; l < info.iLayerNum; ++l) {
         const SLayerBSInfo& layer = info.sLayerInfo[l];
         const uint8_t* nal = layer.pBsBuf;
         for (int n = 0; n < layer.iNalCount; ++n) {
-            int len = layer.pNalLengthInByte[n];
-            size_t start = StartCodeLength(nal, static_cast<size_t>(len));
-            size_t need = size + 4 + len - start;
-            if (need > frame_.size()) frame_.resize(need + need / 2);
-            static const uint8_t kStartCode[4] = {0, 0, 0, 1};
-            memcpy(frame_.data() + size, kStartCode, 4);
-            memcpy(frame_.data() + size + 4, nal + start, len - start);
-            size = need;
+            size_t len = static_cast<size_t>(layer.pNalLengthInByte[n]);
+            size_t start = StartCodeLength(nal, len);
+            if (start == 4) {
+                nals_.push_back({nal, len});
+                size += len;
+            } else if (len > start && staged + len - start + 4 <= frame_.size()) {
+                uint8_t* at = frame_.data() + staged;
+                static const uint8_t kStartCode[4] = {0, 0, 0, 1};
+                memcpy(at, kStartCode, 4);
+                memcpy(at + 4, nal + start, len - start);
+                nals_.push_back({at, len - start + 4});
+                staged += len - start + 4;
+                size += len - start + 4;
+            }
             nal += len;
         }
     }
-    if (size == 0) return Encoded{};
+    if (nals_.empty()) return Encoded{};
     Encoded out;
-    out.data = frame_.data();
+    out.nals = nals_.data();
+    out.count = nals_.size();
     out.size = size;
     out.key = info.eFrameType == videoFrameTypeIDR;
     if (out.key) {
@@ -415,11 +431,14 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_
 }
 
 void HostMediaRecorder::deliver(const Encoded& frame) {
-    parcel_.clear();
-    parcel_.writeInt32(static_cast<int32_t>(frame.size));
-    parcel_.writeInplace(frame.data, frame.size);
-    parcel_.writeInt32(0);
-    int status = Binder().transact(kFrameService, kFrameTransaction, parcel_);
+    int status = kBinderOk;
+    for (size_t i = 0; i < frame.count && status == kBinderOk; ++i) {
+        parcel_.clear();
+        parcel_.writeInt32(static_cast<int32_t>(frame.nals[i].size));
+        parcel_.writeInplace(frame.nals[i].data, frame.nals[i].size);
+        parcel_.writeInt32(0);
+        status = Binder().transact(kFrameService, kFrameTransaction, parcel_);
+    }
     if (status != kBinderOk) {
         // The service may not have registered yet: the frame is lost, the recording goes on,
         // and the next frame is a key frame so that the service can decode from its first one.

@@ -63,9 +63,16 @@ public:
     int stop() override;
     int release() override;
 
-    // One encoded frame; `data` points into the recorder's buffer until its next frame.
+    // One NAL unit behind its 4-byte start code.
+    struct Nal {
+        const uint8_t* data;
+        size_t size;
+    };
+    // One encoded frame: its NAL units in order, pointing into the encoder's (or the
+    // recorder's) buffers until the next frame; `size` counts all their bytes.
     struct Encoded {
-        const uint8_t* data = nullptr;
+        const Nal* nals = nullptr;
+        size_t count = 0;
         size_t size = 0;
         bool key = false;
     };
@@ -111,7 +118,8 @@ private:
     std::unique_ptr<TestPattern> pattern_;
     ISVCEncoder* encoder_ = nullptr;
     std::vector<uint8_t> picture_;
-    std::vector<uint8_t> frame_;
+    std::vector<Nal> nals_;
+    std::vector<uint8_t> frame_;  // NAL units OpenH264 wrote behind 3-byte start codes
     ParcelWriter parcel_;
     bool key_seen_ = false;
     uint64_t last_key_ms_ = 0;
