@@ -13,7 +13,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -22,6 +21,7 @@
 #include <utility>
 
 #include "platform/Ports.h"
+#include "platform/host/HostLog.h"
 
 namespace platform {
 namespace host {
@@ -31,15 +31,6 @@ constexpr size_t kHeaderSize = 12;
 constexpr size_t kReadChunk = 64 * 1024;
 // A connection keeps a buffer this big between transactions: any frame the rings can hold.
 constexpr size_t kKeptBytes = 1u << 20;
-
-__attribute__((format(printf, 1, 2))) void Debug(const char* format, ...) {
-    char text[512];
-    va_list args;
-    va_start(args, format);
-    vsnprintf(text, sizeof text, format, args);
-    va_end(args);
-    Log().Write(kLogIdSystem, kLogDebug, "orvex:::host", text);
-}
 
 void PutLe32(uint8_t* at, uint32_t v) {
     for (int i = 0; i < 4; ++i) at[i] = static_cast<uint8_t>(v >> (8 * i));
@@ -173,7 +164,8 @@ HostBinder::HostBinder(std::string dir, int pool_threads)
         ev.data.ptr = nullptr;
         if (epoll_ctl(epoll_fd_, EPOLL_CTL_ADD, wake_fd_, &ev) == 0) return;
     }
-    Debug("binder: no epoll/eventfd (%s); services cannot be offered", strerror(errno));
+    HostLogf(kLogWarn, "binder: no epoll/eventfd (%s); services cannot be offered",
+             strerror(errno));
     if (epoll_fd_ >= 0) close(epoll_fd_);
     if (wake_fd_ >= 0) close(wake_fd_);
     epoll_fd_ = wake_fd_ = -1;
@@ -183,7 +175,11 @@ HostBinder::~HostBinder() { Stop(); }
 
 std::string HostBinder::BinderDir() {
     const char* env = getenv("ORVEX_BINDER_DIR");
-    return env != nullptr && env[0] != '\0' ? env : "/tmp/orvex-binder";
+    if (env != nullptr && env[0] != '\0') return env;
+    // Per user, so that two users' services never meet in one folder.
+    const char* runtime = getenv("XDG_RUNTIME_DIR");
+    if (runtime != nullptr && runtime[0] == '/') return std::string(runtime) + "/orvex-binder";
+    return "/tmp/orvex-binder-" + std::to_string(getuid());
 }
 
 bool HostBinder::ValidName(const char* name) {
@@ -200,7 +196,7 @@ bool HostBinder::ValidName(const char* name) {
 
 int HostBinder::initWithDriver(const char* driver) {
     driver_ = driver != nullptr ? driver : "";
-    Debug("binder: driver %s (host: sockets in %s)", driver_.c_str(), dir_.c_str());
+    HostLogf(kLogDebug, "binder: driver %s (host: sockets in %s)", driver_.c_str(), dir_.c_str());
     return 0;
 }
 
@@ -214,27 +210,30 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
     std::string path = dir_ + "/" + name;
     sockaddr_un addr;
     if (!MakeAddress(path, &addr)) {
-        Debug("binder: socket path too long: %s", path.c_str());
+        HostLogf(kLogDebug, "binder: socket path too long: %s", path.c_str());
         return -ENAMETOOLONG;
     }
     std::lock_guard<std::mutex> hold(mutex_);
     if (stopping_ || epoll_fd_ < 0) return -EINVAL;
     if (mkdir(dir_.c_str(), 0700) != 0 && errno != EEXIST) {
         int err = errno;
-        Debug("binder: cannot create %s: %s", dir_.c_str(), strerror(err));
+        HostLogf(kLogWarn, "binder: cannot create %s: %s", dir_.c_str(), strerror(err));
         return -err;
     }
     struct stat st;
     if (lstat(path.c_str(), &st) == 0) {
         if (!S_ISSOCK(st.st_mode)) {
-            Debug("binder: %s exists and is not a socket", path.c_str());
+            HostLogf(kLogWarn, "binder: %s exists and is not a socket", path.c_str());
             return -EEXIST;
         }
         // Nonblocking, so a live service with a full backlog still counts as live.
         int probe = ConnectTo(path, true);
         if (probe >= 0 || errno == EAGAIN) {
             if (probe >= 0) close(probe);
-            Debug("binder: %s is already served", path.c_str());
+            HostLogf(kLogWarn,
+                     "binder: %s is served by another running orvex; to run a second one, give it "
+                     "a folder of its own: ORVEX_BINDER_DIR=/some/dir",
+                     path.c_str());
             return -EADDRINUSE;
         }
         unlink(path.c_str());  // left behind by a process that did not stop cleanly
@@ -244,7 +243,7 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
     if (bind(fd, reinterpret_cast<const sockaddr*>(&addr), sizeof addr) != 0 ||
         listen(fd, 16) != 0 || lstat(path.c_str(), &st) != 0) {
         int err = errno;
-        Debug("binder: cannot listen on %s: %s", path.c_str(), strerror(err));
+        HostLogf(kLogWarn, "binder: cannot listen on %s: %s", path.c_str(), strerror(err));
         close(fd);
         return -err;
     }
@@ -265,7 +264,7 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
         return -err;
     }
     listeners_.push_back(std::move(listener));
-    Debug("binder: service %s on %s", name, path.c_str());
+    HostLogf(kLogDebug, "binder: service %s on %s", name, path.c_str());
     return 0;
 }
 
@@ -277,7 +276,7 @@ void HostBinder::startThreadPool() {
         try {
             pool_.emplace_back(&HostBinder::PoolLoop, this);
         } catch (const std::system_error& e) {
-            Debug("binder: pool thread %d not started: %s", i, e.what());
+            HostLogf(kLogWarn, "binder: pool thread %d not started: %s", i, e.what());
             break;
         }
     }
@@ -289,7 +288,7 @@ void HostBinder::PoolLoop() {
         epoll_event ev;
         int n = epoll_wait(epoll_fd_, &ev, 1, -1);
         if (n < 0 && errno != EINTR) {
-            Debug("binder: epoll_wait: %s", strerror(errno));
+            HostLogf(kLogWarn, "binder: epoll_wait: %s", strerror(errno));
             return;
         }
         if (n <= 0) continue;
@@ -300,7 +299,7 @@ void HostBinder::PoolLoop() {
             // EAGAIN: another pool thread took the connection. Running out of descriptors
             // would otherwise spin on the still-readable listener.
             if (errno == EMFILE || errno == ENFILE || errno == ENOBUFS || errno == ENOMEM) {
-                Debug("binder: accept: %s", strerror(errno));
+                HostLogf(kLogWarn, "binder: accept: %s", strerror(errno));
                 usleep(100 * 1000);
             }
             continue;
@@ -326,14 +325,15 @@ void HostBinder::Serve(int fd, BinderService& service) {
         ssize_t got = ReadFull(fd, header, sizeof header);
         if (got == 0) return;
         if (got != static_cast<ssize_t>(sizeof header)) {
-            Debug("binder: connection dropped in a transaction header (%zd bytes)", got);
+            HostLogf(kLogDebug, "binder: connection dropped in a transaction header (%zd bytes)",
+                     got);
             return;
         }
         uint32_t code = GetLe32(header);
         uint32_t flags = GetLe32(header + 4);
         uint32_t size = GetLe32(header + 8);
         if (size > kMaxTransactionSize) {
-            Debug("binder: transaction %u of %u bytes refused", code, size);
+            HostLogf(kLogDebug, "binder: transaction %u of %u bytes refused", code, size);
             SendStatus(fd, kBadValue);
             DrainQueued(fd);
             return;
@@ -344,7 +344,8 @@ void HostBinder::Serve(int fd, BinderService& service) {
             size_t want = std::min<size_t>(size - at, kReadChunk);
             if (data.size() < at + want) data.resize(at + want);
             if (ReadFull(fd, data.data() + at, want) != static_cast<ssize_t>(want)) {
-                Debug("binder: transaction %u dropped after %zu of %u bytes", code, at, size);
+                HostLogf(kLogDebug, "binder: transaction %u dropped after %zu of %u bytes", code,
+                         at, size);
                 return;
             }
             at += want;
@@ -360,9 +361,9 @@ int HostBinder::Dispatch(BinderService& service, uint32_t code, ParcelReader& re
     try {
         return service.onTransact(code, reader, flags);
     } catch (const std::exception& e) {
-        Debug("binder: transaction %u threw: %s", code, e.what());
+        HostLogf(kLogDebug, "binder: transaction %u threw: %s", code, e.what());
     } catch (...) {
-        Debug("binder: transaction %u threw", code);
+        HostLogf(kLogDebug, "binder: transaction %u threw", code);
     }
     return kUnknownError;
 }

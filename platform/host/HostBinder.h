@@ -67,7 +67,7 @@ public:
     const std::string& dir() const { return dir_; }
     const std::string& driver() const { return driver_; }
 
-    // $ORVEX_BINDER_DIR, else /tmp/orvex-binder.
+    // $ORVEX_BINDER_DIR, else $XDG_RUNTIME_DIR/orvex-binder, else /tmp/orvex-binder-UID.
     static std::string BinderDir();
     // One path component of [A-Za-z0-9._-], neither "." nor "..".
     static bool ValidName(const char* name);

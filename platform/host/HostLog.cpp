@@ -5,8 +5,11 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <cstdarg>
 #include <cstring>
 #include <ctime>
+
+#include "platform/Ports.h"
 
 namespace platform {
 namespace host {
@@ -74,6 +77,15 @@ void HostLog::WriteLine(int priority, const char* tag, const char* line, size_t 
             static_cast<int>(getpid()), static_cast<long>(syscall(SYS_gettid)),
             PriorityLetter(priority), tag, n, line);
     fflush(out);
+}
+
+void HostLogf(int priority, const char* format, ...) {
+    char text[512];
+    va_list args;
+    va_start(args, format);
+    vsnprintf(text, sizeof text, format, args);
+    va_end(args);
+    Log().Write(kLogIdSystem, priority, "orvex:::host", text);
 }
 
 }  // namespace host

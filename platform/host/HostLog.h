@@ -32,5 +32,9 @@ private:
 // logcat's priority letter: V D I W E F, '?' for other values.
 char PriorityLetter(int priority);
 
+// One formatted line to the installed platform log under the host's tag ("orvex:::host"), cut
+// at 511 characters. Debug priority is for what a person does not need to see.
+void HostLogf(int priority, const char* format, ...) __attribute__((format(printf, 2, 3)));
+
 }  // namespace host
 }  // namespace platform

@@ -1,45 +1,24 @@
 #include "platform/host/video/HostMediaRecorder.h"
 
-#include <dlfcn.h>
 #include <pthread.h>
 #include <time.h>
-#include <wels/codec_api.h>
 
 #include <chrono>
 #include <cinttypes>
-#include <cstdarg>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <mutex>
 #include <system_error>
 
-#include "media/AnnexB.h"
 #include "platform/Ports.h"
+#include "platform/host/HostLog.h"
 #include "platform/host/capture/GstSource.h"
 #include "platform/host/video/HostCamera.h"
 
 namespace platform {
 namespace host {
 namespace {
-
-constexpr char kTag[] = "orvex:::host";
-// OpenH264 rate-controls up to this rate; faster schedules still run, just capped in the RC.
-constexpr float kEncoderMaxFps = 60.0f;
-
-void Note(const char* fmt, ...) __attribute__((format(printf, 1, 2)));
-void Note(const char* fmt, ...) {
-    char text[512];
-    va_list args;
-    va_start(args, fmt);
-    vsnprintf(text, sizeof text, fmt, args);
-    va_end(args);
-    Log().Write(kLogIdSystem, kLogDebug, kTag, text);
-}
-
-void EncoderTrace(void*, int, const char* message) {
-    Log().Write(kLogIdSystem, kLogError, kTag, message);
-}
 
 // The same clock HostClockMs reads, in nanoseconds, so frame times land on its milliseconds.
 uint64_t MonotonicNs() {
@@ -51,43 +30,6 @@ uint64_t MonotonicNs() {
 std::string Trim(const std::string& s) {
     size_t b = s.find_first_not_of(" \t"), e = s.find_last_not_of(" \t");
     return b == std::string::npos ? std::string() : s.substr(b, e - b + 1);
-}
-
-// Restaging a unit behind 4 bytes adds one byte to it; room for this many units per frame
-// (OpenH264 writes a handful), past which further restaged units are left out.
-constexpr size_t kMaxNalsPerFrame = 256;
-
-// The two C entry points of OpenH264; the encoder itself is reached through its vtable.
-struct OpenH264 {
-    decltype(&WelsCreateSVCEncoder) create = nullptr;
-    decltype(&WelsDestroySVCEncoder) destroy = nullptr;
-};
-
-// Loads OpenH264 at the first encoder and keeps it; a failure logs one line and is tried
-// again at the next prepare. Null when it does not load.
-const OpenH264* LoadOpenH264() {
-    static std::mutex mutex;
-    static OpenH264 api;
-    std::lock_guard<std::mutex> hold(mutex);
-    if (api.create != nullptr) return &api;
-    void* library = dlopen(ORVEX_OPENH264_SONAME, RTLD_NOW | RTLD_LOCAL);
-    OpenH264 found;
-    if (library != nullptr) {
-        found.create =
-            reinterpret_cast<decltype(found.create)>(dlsym(library, "WelsCreateSVCEncoder"));
-        found.destroy =
-            reinterpret_cast<decltype(found.destroy)>(dlsym(library, "WelsDestroySVCEncoder"));
-    }
-    if (found.create == nullptr || found.destroy == nullptr) {
-        const char* why = dlerror();
-        std::string line = std::string("MediaRecorder: cannot load " ORVEX_OPENH264_SONAME ": ") +
-                           (why != nullptr ? why : "no encoder entry points");
-        Log().Write(kLogIdSystem, kLogError, kTag, line.c_str());
-        if (library != nullptr) dlclose(library);
-        return nullptr;
-    }
-    api = found;
-    return &api;
 }
 
 // Whether flattened camera parameters select the sub window (traveling-mode 4).
@@ -182,24 +124,26 @@ int HostMediaRecorder::prepare() {
     size_t luma = static_cast<size_t>(pattern_->width()) * pattern_->height();
     picture_.assign(pattern_->frameSize(), TestPattern::kNeutralUV);
     memset(picture_.data(), TestPattern::kBlackY, luma);
-    // Room for a key frame far worse than the pattern ever gives; encodeNext grows it if not.
-    frame_.assign(pattern_->frameSize() + 4096, 0);
-    // Writing the largest frame once reserves the parcel's storage for the whole recording.
+    // Reserves the parcel's storage for a unit far larger than the pattern ever gives, so the
+    // recording allocates nothing per frame.
     parcel_.clear();
     parcel_.writeInt32(0);
-    parcel_.writeInplace(frame_.data(), frame_.size());
+    parcel_.writeInplace(picture_.data(), picture_.size());
     parcel_.writeInt32(0);
     parcel_.clear();
     if (int rc = openSource()) return rc;
     // "none" encodes nothing (another binder client sends the frames): no OpenH264 at all.
-    int rc = source_.kind == SourceChoice::kNone ? 0 : openEncoder();
+    int rc = source_.kind == SourceChoice::kNone || encoder_.Open(width_, height_, fps_, bitrate_)
+                 ? 0
+                 : kUnknownError;
     if (rc != 0) {
         live_.reset();
         return rc;
     }
     key_seen_ = false;
     state_ = State::kPrepared;
-    Note("MediaRecorder::prepare %dx%d @ %d fps, %d bit/s", width_, height_, fps_, bitrate_);
+    HostLogf(kLogDebug, "MediaRecorder::prepare %dx%d @ %d fps, %d bit/s", width_, height_, fps_,
+             bitrate_);
     return 0;
 }
 
@@ -214,12 +158,12 @@ int HostMediaRecorder::openSource() {
     auto live = std::make_unique<GstSource>();
     std::string error;
     if (!live->start(description, &error)) {
-        Note("MediaRecorder: video source %s cannot start: %s", source_.text.c_str(),
-             error.c_str());
+        HostLogf(kLogWarn, "MediaRecorder: video source %s cannot start: %s", source_.text.c_str(),
+                 error.c_str());
         return kUnknownError;
     }
     live_ = std::move(live);
-    Note("MediaRecorder: video from %s", source_.text.c_str());
+    HostLogf(kLogDebug, "MediaRecorder: video from %s", source_.text.c_str());
     return 0;
 }
 
@@ -231,81 +175,14 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
             live_->latestFrame(picture_.data(), pattern_->width(), pattern_->height());
             return;
         }
-        Note(
-            "MediaRecorder: video source %s stopped: %s; showing \"no signal\" until the next "
-            "start",
-            source_.text.c_str(), why.c_str());
+        HostLogf(kLogWarn,
+                 "MediaRecorder: video source %s stopped: %s; showing \"no signal\" until the next "
+                 "start",
+                 source_.text.c_str(), why.c_str());
         live_->stop();
         label_ = TestPattern::Label::kNoSignal;
     }
     pattern_->draw(frame, ms, picture_.data(), label_);
-}
-
-int HostMediaRecorder::openEncoder() {
-    const OpenH264* openh264 = LoadOpenH264();
-    if (openh264 == nullptr) return kUnknownError;
-    if (openh264->create(&encoder_) != 0 || encoder_ == nullptr) {
-        encoder_ = nullptr;
-        Note("MediaRecorder: OpenH264 encoder cannot be created");
-        return kUnknownError;
-    }
-    int level = WELS_LOG_ERROR;
-    encoder_->SetOption(ENCODER_OPTION_TRACE_LEVEL, &level);
-    WelsTraceCallback trace = &EncoderTrace;
-    encoder_->SetOption(ENCODER_OPTION_TRACE_CALLBACK, &trace);
-
-    SEncParamExt p;
-    encoder_->GetDefaultParams(&p);
-    p.iUsageType = CAMERA_VIDEO_REAL_TIME;
-    p.iPicWidth = width_;
-    p.iPicHeight = height_;
-    p.iTargetBitrate = bitrate_;
-    p.iMaxBitrate = UNSPECIFIED_BIT_RATE;
-    p.iRCMode = RC_BITRATE_MODE;
-    p.fMaxFrameRate = fps_ < kEncoderMaxFps ? static_cast<float>(fps_) : kEncoderMaxFps;
-    p.iTemporalLayerNum = 1;
-    p.iSpatialLayerNum = 1;
-    p.iComplexityMode = LOW_COMPLEXITY;
-    // Key frames are forced by capture time in encodeNext, which also covers skipped frames.
-    p.uiIntraPeriod = 0;
-    p.iNumRefFrame = 1;
-    // One SPS/PPS for the whole recording: clients take them once, from the first key frame.
-    p.eSpsPpsIdStrategy = CONSTANT_ID;
-    p.bPrefixNalAddingCtrl = false;
-    p.bEnableSSEI = false;
-    p.bSimulcastAVC = false;
-    p.iEntropyCodingModeFlag = 0;
-    // A screen in full motion costs more than the bitrate: with skipping, the rate control held
-    // 1080p at 9 fps. Viewers want the frame rate kept; the picture gets coarser instead.
-    p.bEnableFrameSkip = false;
-    p.iMultipleThreadIdc = 1;
-    p.bEnableDenoise = false;
-    p.bEnableSceneChangeDetect = false;
-    SSpatialLayerConfig& layer = p.sSpatialLayers[0];
-    layer.iVideoWidth = width_;
-    layer.iVideoHeight = height_;
-    layer.fFrameRate = p.fMaxFrameRate;
-    layer.iSpatialBitrate = bitrate_;
-    layer.iMaxSpatialBitrate = UNSPECIFIED_BIT_RATE;
-    layer.uiProfileIdc = PRO_BASELINE;
-    layer.sSliceArgument.uiSliceMode = SM_SINGLE_SLICE;
-    if (encoder_->InitializeExt(&p) != cmResultSuccess) {
-        Note("MediaRecorder: OpenH264 refuses %dx%d @ %d fps, %d bit/s", width_, height_, fps_,
-             bitrate_);
-        closeEncoder();
-        return kUnknownError;
-    }
-    int format = videoFormatI420;
-    encoder_->SetOption(ENCODER_OPTION_DATAFORMAT, &format);
-    return 0;
-}
-
-void HostMediaRecorder::closeEncoder() {
-    if (encoder_ == nullptr) return;
-    encoder_->Uninitialize();
-    // An encoder exists only once the library has loaded, so this finds it loaded.
-    LoadOpenH264()->destroy(encoder_);
-    encoder_ = nullptr;
 }
 
 int HostMediaRecorder::start() {
@@ -317,11 +194,11 @@ int HostMediaRecorder::start() {
     try {
         thread_ = std::thread(&HostMediaRecorder::run, this);
     } catch (const std::system_error& e) {
-        Note("MediaRecorder::start: no encoder thread (%s)", e.what());
+        HostLogf(kLogError, "MediaRecorder::start: no encoder thread (%s)", e.what());
         return kUnknownError;
     }
     state_ = State::kRecording;
-    Note("MediaRecorder::start");
+    HostLogf(kLogDebug, "MediaRecorder::start");
     return 0;
 }
 
@@ -333,11 +210,13 @@ int HostMediaRecorder::stop() {
         }
         wake_.notify_all();
         thread_.join();
-        Note("MediaRecorder::stop: %" PRIu64 " frames delivered, %" PRIu64
-             " transactions failed, %" PRIu64 " frames dropped, %" PRIu64 " skipped by the encoder",
-             framesDelivered(), failedTransacts(), framesDropped(), framesSkipped());
+        HostLogf(kLogDebug,
+                 "MediaRecorder::stop: %" PRIu64 " frames delivered, %" PRIu64
+                 " transactions failed, %" PRIu64 " frames dropped, %" PRIu64
+                 " skipped by the encoder",
+                 framesDelivered(), failedTransacts(), framesDropped(), framesSkipped());
     }
-    closeEncoder();
+    encoder_.Close();
     live_.reset();
     if (state_ != State::kReleased) state_ = State::kIdle;
     return 0;
@@ -350,7 +229,7 @@ int HostMediaRecorder::release() {
 }
 
 HostMediaRecorder::Encoded HostMediaRecorder::encodeFrame(uint32_t frame, uint64_t ms) {
-    if (state_ != State::kPrepared || encoder_ == nullptr) return Encoded{};
+    if (state_ != State::kPrepared || !encoder_.opened()) return Encoded{};
     return encodeNext(frame, ms);
 }
 
@@ -359,70 +238,10 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_
     // Force a key frame when waiting for the next frame would stretch the gap past the
     // interval (1 ms of slack absorbs the truncation of frame times to milliseconds).
     uint64_t since = ms - last_key_ms_;
-    if (!key_seen_ || since * fps_ + 1000 > (kKeyIntervalMs + 1) * fps_) {
-        encoder_->ForceIntraFrame(true);
-    }
-
-    SSourcePicture source;
-    memset(&source, 0, sizeof source);
-    source.iColorFormat = videoFormatI420;
-    source.iPicWidth = pattern_->width();
-    source.iPicHeight = pattern_->height();
-    source.iStride[0] = source.iPicWidth;
-    source.iStride[1] = source.iStride[2] = source.iPicWidth / 2;
-    source.pData[0] = picture_.data();
-    source.pData[1] = source.pData[0] + static_cast<size_t>(source.iPicWidth) * source.iPicHeight;
-    source.pData[2] =
-        source.pData[1] + static_cast<size_t>(source.iPicWidth / 2) * (source.iPicHeight / 2);
-    source.uiTimeStamp = static_cast<long long>(ms);
-
-    SFrameBSInfo info;
-    memset(&info, 0, sizeof info);
-    if (encoder_->EncodeFrame(&source, &info) != cmResultSuccess) {
-        Note("MediaRecorder: OpenH264 failed on frame %" PRIu32, frame);
-        return Encoded{};
-    }
-    if (info.eFrameType == videoFrameTypeSkip || info.eFrameType == videoFrameTypeInvalid) {
-        // The rate control leaves frames out when the picture costs more than the bitrate.
-        skipped_.fetch_add(1, std::memory_order_relaxed);
-        return Encoded{};
-    }
-
-    // The NAL units as OpenH264 wrote them (the SPS and PPS are a layer of their own before the
-    // IDR slices), each to be handed over on its own, as the platform recorder does. It writes
-    // 4-byte start codes; a unit behind a 3-byte one is restaged behind 4 bytes.
-    nals_.clear();
-    // Room for every unit restaged, before any pointer into it is taken.
-    size_t bound = static_cast<size_t>(info.iFrameSizeInBytes) + kMaxNalsPerFrame;
-    if (frame_.size() < bound) frame_.resize(bound);
-    size_t size = 0, staged = 0;
-    for (int l = 0; l < info.iLayerNum; ++l) {
-        const SLayerBSInfo& layer = info.sLayerInfo[l];
-        const uint8_t* nal = layer.pBsBuf;
-        for (int n = 0; n < layer.iNalCount; ++n) {
-            size_t len = static_cast<size_t>(layer.pNalLengthInByte[n]);
-            size_t start = StartCodeLength(nal, len);
-            if (start == 4) {
-                nals_.push_back({nal, len});
-                size += len;
-            } else if (len > start && staged + len - start + 4 <= frame_.size()) {
-                uint8_t* at = frame_.data() + staged;
-                static const uint8_t kStartCode[4] = {0, 0, 0, 1};
-                memcpy(at, kStartCode, 4);
-                memcpy(at + 4, nal + start, len - start);
-                nals_.push_back({at, len - start + 4});
-                staged += len - start + 4;
-                size += len - start + 4;
-            }
-            nal += len;
-        }
-    }
-    if (nals_.empty()) return Encoded{};
-    Encoded out;
-    out.nals = nals_.data();
-    out.count = nals_.size();
-    out.size = size;
-    out.key = info.eFrameType == videoFrameTypeIDR;
+    bool force_key = !key_seen_ || since * fps_ + 1000 > (kKeyIntervalMs + 1) * fps_;
+    Encoded out = encoder_.Encode(picture_.data(), ms, force_key);
+    if (out.skipped) skipped_.fetch_add(1, std::memory_order_relaxed);
+    if (out.count == 0) return out;
     if (out.key) {
         key_seen_ = true;
         last_key_ms_ = ms;
@@ -444,12 +263,14 @@ void HostMediaRecorder::deliver(const Encoded& frame) {
         // and the next frame is a key frame so that the service can decode from its first one.
         failed_.fetch_add(1, std::memory_order_relaxed);
         key_seen_ = false;
-        if (!failing_) Note("MediaRecorder: %s does not take frames (%d)", kFrameService, status);
+        if (!failing_)
+            HostLogf(kLogWarn, "MediaRecorder: %s does not take frames (%d)", kFrameService,
+                     status);
         failing_ = true;
         return;
     }
     delivered_.fetch_add(1, std::memory_order_relaxed);
-    if (failing_) Note("MediaRecorder: %s takes frames again", kFrameService);
+    if (failing_) HostLogf(kLogDebug, "MediaRecorder: %s takes frames again", kFrameService);
     failing_ = false;
 }
 
@@ -488,7 +309,7 @@ void HostMediaRecorder::run() {
 }
 
 std::shared_ptr<MediaRecorder> HostMediaRecorderPort::create(const std::string& package) {
-    Note("MediaRecorder(%s)", package.c_str());
+    HostLogf(kLogDebug, "MediaRecorder(%s)", package.c_str());
     return std::make_shared<HostMediaRecorder>();
 }
 

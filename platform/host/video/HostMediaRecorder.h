@@ -13,9 +13,8 @@
 #include "platform/BinderPort.h"
 #include "platform/CapturePorts.h"
 #include "platform/host/capture/HostSources.h"
+#include "platform/host/video/OpenH264Encoder.h"
 #include "platform/host/video/TestPattern.h"
-
-class ISVCEncoder;
 
 namespace platform {
 namespace host {
@@ -63,19 +62,8 @@ public:
     int stop() override;
     int release() override;
 
-    // One NAL unit behind its 4-byte start code.
-    struct Nal {
-        const uint8_t* data;
-        size_t size;
-    };
-    // One encoded frame: its NAL units in order, pointing into the encoder's (or the
-    // recorder's) buffers until the next frame; `size` counts all their bytes.
-    struct Encoded {
-        const Nal* nals = nullptr;
-        size_t count = 0;
-        size_t size = 0;
-        bool key = false;
-    };
+    // One encoded frame: its NAL units, valid until the next frame.
+    using Encoded = OpenH264Encoder::Frame;
     // The thread's work for one frame, minus the binder: takes frame `frame` as captured at
     // host clock time `ms` and encodes it. Only after prepare and before start, and never for
     // "none" (else empty); size 0 when the encoder skipped the frame.
@@ -97,8 +85,6 @@ private:
     int settable() const;
     int openSource();
     void takePicture(uint32_t frame, uint64_t ms);
-    int openEncoder();
-    void closeEncoder();
     void run();
     Encoded encodeNext(uint32_t frame, uint64_t ms);
     void deliver(const Encoded& frame);
@@ -116,10 +102,8 @@ private:
     std::unique_ptr<GstSource> live_;
     TestPattern::Label label_ = TestPattern::Label::kNone;
     std::unique_ptr<TestPattern> pattern_;
-    ISVCEncoder* encoder_ = nullptr;
+    OpenH264Encoder encoder_;
     std::vector<uint8_t> picture_;
-    std::vector<Nal> nals_;
-    std::vector<uint8_t> frame_;  // NAL units OpenH264 wrote behind 3-byte start codes
     ParcelWriter parcel_;
     bool key_seen_ = false;
     uint64_t last_key_ms_ = 0;

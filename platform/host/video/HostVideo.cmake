@@ -2,6 +2,7 @@
 target_sources(orvex_platform_host PRIVATE
   ${PROJECT_SOURCE_DIR}/platform/host/video/HostCamera.cpp
   ${PROJECT_SOURCE_DIR}/platform/host/video/HostMediaRecorder.cpp
+  ${PROJECT_SOURCE_DIR}/platform/host/video/OpenH264Encoder.cpp
   ${PROJECT_SOURCE_DIR}/platform/host/video/TestPattern.cpp)
 
 # OpenH264 is loaded when a recorder first needs an encoder, so a service fed from outside
