@@ -21,134 +21,18 @@
 #include <utility>
 
 #include "platform/Ports.h"
+#include "platform/host/BinderWire.h"
 #include "platform/host/HostLog.h"
 
 namespace platform {
 namespace host {
 namespace {
 
-constexpr size_t kHeaderSize = 12;
+using namespace binder_wire;
+
 constexpr size_t kReadChunk = 64 * 1024;
 // A connection keeps a buffer this big between transactions: any frame the rings can hold.
 constexpr size_t kKeptBytes = 1u << 20;
-
-void PutLe32(uint8_t* at, uint32_t v) {
-    for (int i = 0; i < 4; ++i) at[i] = static_cast<uint8_t>(v >> (8 * i));
-}
-
-uint32_t GetLe32(const uint8_t* at) {
-    return uint32_t{at[0]} | uint32_t{at[1]} << 8 | uint32_t{at[2]} << 16 | uint32_t{at[3]} << 24;
-}
-
-bool MakeAddress(const std::string& path, sockaddr_un* addr) {
-    if (path.size() >= sizeof addr->sun_path) return false;
-    memset(addr, 0, sizeof *addr);
-    addr->sun_family = AF_UNIX;
-    memcpy(addr->sun_path, path.c_str(), path.size() + 1);
-    return true;
-}
-
-// A connected socket, or -1 with errno set.
-int ConnectTo(const std::string& path, bool nonblocking) {
-    sockaddr_un addr;
-    if (!MakeAddress(path, &addr)) {
-        errno = ENAMETOOLONG;
-        return -1;
-    }
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | (nonblocking ? SOCK_NONBLOCK : 0), 0);
-    if (fd < 0) return -1;
-    if (connect(fd, reinterpret_cast<const sockaddr*>(&addr), sizeof addr) != 0) {
-        int saved = errno;
-        close(fd);
-        errno = saved;
-        return -1;
-    }
-    return fd;
-}
-
-// The bytes read: `len`, fewer when the peer closed first, -1 on an error or a timeout.
-ssize_t ReadFull(int fd, void* buf, size_t len) {
-    size_t got = 0;
-    while (got < len) {
-        ssize_t n = recv(fd, static_cast<uint8_t*>(buf) + got, len - got, 0);
-        if (n == 0) break;
-        if (n < 0) {
-            if (errno == EINTR) continue;
-            return -1;
-        }
-        got += static_cast<size_t>(n);
-    }
-    return static_cast<ssize_t>(got);
-}
-
-bool SendAll(int fd, const void* buf, size_t len) {
-    size_t sent = 0;
-    while (sent < len) {
-        ssize_t n = send(fd, static_cast<const uint8_t*>(buf) + sent, len - sent, MSG_NOSIGNAL);
-        if (n < 0) {
-            if (errno == EINTR) continue;
-            return false;
-        }
-        sent += static_cast<size_t>(n);
-    }
-    return true;
-}
-
-// Header and payload in one call, so the service wakes once for a transaction, not twice.
-bool SendBoth(int fd, const uint8_t* header, size_t header_len, const uint8_t* data, size_t len) {
-    iovec parts[2] = {{const_cast<uint8_t*>(header), header_len},
-                      {const_cast<uint8_t*>(data), len}};
-    msghdr msg{};
-    msg.msg_iov = parts;
-    msg.msg_iovlen = 2;
-    while (msg.msg_iovlen > 0) {
-        ssize_t n = sendmsg(fd, &msg, MSG_NOSIGNAL);
-        if (n < 0) {
-            if (errno == EINTR) continue;
-            return false;
-        }
-        auto sent = static_cast<size_t>(n);
-        while (msg.msg_iovlen > 0 && sent >= msg.msg_iov->iov_len) {
-            sent -= msg.msg_iov->iov_len;
-            ++msg.msg_iov;
-            --msg.msg_iovlen;
-        }
-        if (msg.msg_iovlen > 0) {
-            msg.msg_iov->iov_base = static_cast<uint8_t*>(msg.msg_iov->iov_base) + sent;
-            msg.msg_iov->iov_len -= sent;
-        }
-    }
-    return true;
-}
-
-bool SendStatus(int fd, int status) {
-    uint8_t reply[4];
-    PutLe32(reply, static_cast<uint32_t>(status));
-    return SendAll(fd, reply, sizeof reply);
-}
-
-void SetTimeouts(int fd, int seconds) {
-    timeval tv{};
-    tv.tv_sec = seconds;
-    setsockopt(fd, SOL_SOCKET, SO_RCVTIMEO, &tv, sizeof tv);
-    setsockopt(fd, SOL_SOCKET, SO_SNDTIMEO, &tv, sizeof tv);
-}
-
-// Closing with unread bytes queued resets the connection, which can cost the peer the reply
-// just sent; what already arrived is read and dropped, up to a bound.
-void DrainQueued(int fd) {
-    shutdown(fd, SHUT_WR);
-    uint8_t sink[4096];
-    for (int i = 0; i < 256 && recv(fd, sink, sizeof sink, MSG_DONTWAIT) > 0; ++i) {
-    }
-}
-
-// Blocks until `fd` has data or its peer (or Stop) shut it down.
-void WaitReadable(int fd) {
-    pollfd p{fd, POLLIN, 0};
-    while (poll(&p, 1, -1) < 0 && errno == EINTR) {
-    }
-}
 
 }  // namespace
 
@@ -329,9 +213,8 @@ void HostBinder::Serve(int fd, BinderService& service) {
                      got);
             return;
         }
-        uint32_t code = GetLe32(header);
-        uint32_t flags = GetLe32(header + 4);
-        uint32_t size = GetLe32(header + 8);
+        const Header h = ReadHeader(header);
+        const uint32_t code = h.code, flags = h.flags, size = h.size;
         if (size > kMaxTransactionSize) {
             HostLogf(kLogDebug, "binder: transaction %u of %u bytes refused", code, size);
             SendStatus(fd, kBadValue);
@@ -423,53 +306,6 @@ void HostBinder::Stop() {
         if (entry.second->fd >= 0) close(entry.second->fd);
         entry.second->fd = -1;
     }
-}
-
-HostBinder::Outgoing& HostBinder::OutgoingFor(const std::string& service) {
-    std::lock_guard<std::mutex> hold(outgoing_mutex_);
-    std::unique_ptr<Outgoing>& out = outgoing_[service];
-    if (out == nullptr) out = std::make_unique<Outgoing>();
-    return *out;
-}
-
-int HostBinder::transact(const char* service, uint32_t code, const ParcelWriter& data) {
-    if (!ValidName(service) || data.data().size() > kMaxTransactionSize) return kBadValue;
-    uint8_t header[kHeaderSize];
-    PutLe32(header, code);
-    PutLe32(header + 4, 0);
-    PutLe32(header + 8, static_cast<uint32_t>(data.data().size()));
-    Outgoing& out = OutgoingFor(service);
-    std::lock_guard<std::mutex> hold(out.mutex);
-    if (std::shared_ptr<BinderService> local = LocalService(service)) {
-        ParcelReader reader(data.data().data(), data.data().size());
-        return Dispatch(*local, code, reader, 0);
-    }
-    return TransactOn(out, dir_ + "/" + service, header, data.data());
-}
-
-int HostBinder::TransactOn(Outgoing& out, const std::string& path, const uint8_t header[12],
-                           const std::vector<uint8_t>& data) {
-    for (;;) {
-        bool reused = out.fd >= 0;
-        if (!reused) {
-            out.fd = ConnectTo(path, false);
-            if (out.fd < 0) return kDeadObject;
-        }
-        if (SendBoth(out.fd, header, kHeaderSize, data.data(), data.size())) {
-            break;
-        }
-        close(out.fd);
-        out.fd = -1;
-        // A kept connection fails this way after the service restarted: connect again, once.
-        if (!reused) return kDeadObject;
-    }
-    uint8_t reply[4];
-    if (ReadFull(out.fd, reply, sizeof reply) != static_cast<ssize_t>(sizeof reply)) {
-        close(out.fd);
-        out.fd = -1;
-        return kDeadObject;
-    }
-    return static_cast<int32_t>(GetLe32(reply));
 }
 
 }  // namespace host
