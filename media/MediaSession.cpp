@@ -2,28 +2,24 @@
 
 MediaSession::MediaSession(const char* name) : m_name(name != nullptr ? name : "") {}
 
-MediaSession::~MediaSession() {
-    for (MediaStream* s : m_streams) delete s;
-}
-
 MediaStream* MediaSession::FindMediaStream(const char* name) {
     if (name == nullptr) return nullptr;
-    for (MediaStream* s : m_streams) {
-        if (s->GetName() == name) return s;
+    for (const auto& s : m_streams) {
+        if (s->GetName() == name) return s.get();
     }
     return nullptr;
 }
 
 MediaStream* MediaSession::GetMediaStream(unsigned index) {
-    return index < m_streams.size() ? m_streams[index] : nullptr;
+    return index < m_streams.size() ? m_streams[index].get() : nullptr;
 }
 
 int MediaSession::GetMediaStreamCount() { return static_cast<int>(m_streams.size()); }
 
-bool MediaSession::AddMediaStream(MediaStream* stream) {
+bool MediaSession::AddMediaStream(std::unique_ptr<MediaStream> stream) {
     if (stream == nullptr) return false;
     if (FindMediaStream(stream->GetName().c_str()) != nullptr) return false;
-    m_streams.push_back(stream);
+    m_streams.push_back(std::move(stream));
     return true;
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -11,7 +12,7 @@
 class MediaSession {
 public:
     explicit MediaSession(const char* name);
-    virtual ~MediaSession();
+    virtual ~MediaSession() = default;
     MediaSession(const MediaSession&) = delete;
     MediaSession& operator=(const MediaSession&) = delete;
 
@@ -19,13 +20,13 @@ public:
     virtual MediaStream* FindMediaStream(const char* name);
     virtual MediaStream* GetMediaStream(unsigned index);
     virtual int GetMediaStreamCount();
-    // Takes ownership; false for null or a name already present.
-    virtual bool AddMediaStream(MediaStream* stream);
+    // False for null or a name already present (the refused track is destroyed).
+    virtual bool AddMediaStream(std::unique_ptr<MediaStream> stream);
     // The session description; `origin` is accepted and not emitted.
     virtual std::string GenerateMediaSdp(const char* origin, const char* address, int with_control);
     virtual std::string GetName();
 
 private:
     std::string m_name;
-    std::vector<MediaStream*> m_streams;
+    std::vector<std::unique_ptr<MediaStream>> m_streams;
 };

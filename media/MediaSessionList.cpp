@@ -2,18 +2,17 @@
 
 MediaSessionList::~MediaSessionList() {
     TLock::Scoped hold(m_lock);
-    for (MediaSession* s : m_sessions) delete s;
     m_sessions.clear();
 }
 
-bool MediaSessionList::AddMediaSession(MediaSession* session) {
+bool MediaSessionList::AddMediaSession(std::unique_ptr<MediaSession> session) {
     if (session == nullptr) return false;
     std::string name = session->GetName();
     TLock::Scoped hold(m_lock);
-    for (MediaSession* s : m_sessions) {
+    for (const auto& s : m_sessions) {
         if (s->GetName() == name) return false;
     }
-    m_sessions.push_back(session);
+    m_sessions.push_back(std::move(session));
     return true;
 }
 
@@ -22,7 +21,6 @@ bool MediaSessionList::RemoveMediaSession(const char* name) {
     TLock::Scoped hold(m_lock);
     for (auto it = m_sessions.begin(); it != m_sessions.end(); ++it) {
         if ((*it)->GetName() == name) {
-            delete *it;
             m_sessions.erase(it);
             return true;
         }
@@ -33,8 +31,8 @@ bool MediaSessionList::RemoveMediaSession(const char* name) {
 MediaSession* MediaSessionList::FindMediaSession(const char* name) {
     if (name == nullptr) return nullptr;
     TLock::Scoped hold(m_lock);
-    for (MediaSession* s : m_sessions) {
-        if (s->GetName() == name) return s;
+    for (const auto& s : m_sessions) {
+        if (s->GetName() == name) return s.get();
     }
     return nullptr;
 }

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <memory>
 #include <vector>
 
 #include "media/MediaSession.h"
@@ -14,13 +15,13 @@ public:
     MediaSessionList(const MediaSessionList&) = delete;
     MediaSessionList& operator=(const MediaSessionList&) = delete;
 
-    // Takes ownership; false for null or a name already listed.
-    virtual bool AddMediaSession(MediaSession* session);
+    // False for null or a name already listed (the refused presentation is destroyed).
+    virtual bool AddMediaSession(std::unique_ptr<MediaSession> session);
     virtual bool RemoveMediaSession(const char* name);
     // Exact name (same length too), or null.
     virtual MediaSession* FindMediaSession(const char* name);
 
 private:
-    std::vector<MediaSession*> m_sessions ORVEX_GUARDED_BY(m_lock);
+    std::vector<std::unique_ptr<MediaSession>> m_sessions ORVEX_GUARDED_BY(m_lock);
     TLock m_lock;
 };

@@ -6,6 +6,7 @@
 #include <memory>
 
 #include "media/LazyInstance.h"
+#include "platform/UniqueFd.h"
 #include "rtp/Base64.h"
 #include "rtp/FrameLatency.h"
 #include "rtp/RtpPackets.h"
@@ -75,7 +76,7 @@ void H264RtpTransportSession::ReportLatency(unsigned ring_wait_ms, Clock::time_p
 
 void H264RtpTransportSession::procH264Thread() {
     NameThisThread("orvex-h264-send");
-    int sock = socket(AF_INET, SOCK_DGRAM, 0);
+    const platform::UniqueFd sock(socket(AF_INET, SOCK_DGRAM, 0));
     m_sps_seen = true;  // inspection stays dormant unless a flag is cleared
     m_pps_seen = true;
     m_time_scale = 1;
@@ -84,7 +85,7 @@ void H264RtpTransportSession::procH264Thread() {
     const unsigned payload_type = static_cast<unsigned>(config->m_video_payload_type);
     // A megabyte: on the heap, as a 32-bit thread stack may not hold it.
     auto item = std::make_unique<Buffer_Item>();
-    ClientFanout fanout(sock, true, "\n  h264 frame send error ! \n ");
+    ClientFanout fanout(sock.get(), true, "\n  h264 frame send error ! \n ");
     fanout.SetTargets(m_dests.targets());
     H264SendState state;
     uint32_t ts = 0;
@@ -137,7 +138,6 @@ void H264RtpTransportSession::procH264Thread() {
         state.AfterSend(&sequence);
         recompute = true;
     }
-    close(sock);
     OrvexPrint("\n exit H264RtpTransportSession::SendH264RTPPACKET ");
     OrvexPrintLog(kTag, "\n H264RtpTransportSession::event_loop_thread \n ");
 }

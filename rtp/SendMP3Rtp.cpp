@@ -7,6 +7,7 @@
 #include <memory>
 
 #include "media/LazyInstance.h"
+#include "platform/UniqueFd.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
 #include "service/GlobalConfig.h"
@@ -55,12 +56,13 @@ void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, int sockf
 void MP3RtpTransportSession::procMP3Thread() {
     NameThisThread("orvex-aac-send");
     Global_Config* config = Global_Config::instance();
-    int sock = socket(AF_INET, SOCK_DGRAM, 0);
+    const platform::UniqueFd sock(socket(AF_INET, SOCK_DGRAM, 0));
     sockaddr_in local{};
     local.sin_family = AF_INET;
     local.sin_port = htons(static_cast<uint16_t>(config->m_audio_rtp_port));
     local.sin_addr.s_addr = htonl(INADDR_ANY);
-    (void)bind(sock, reinterpret_cast<sockaddr*>(&local), sizeof local);  // unchecked, as ever
+    (void)bind(sock.get(), reinterpret_cast<sockaddr*>(&local),
+               sizeof local);  // unchecked, as ever
     const unsigned rate = config->m_audio_rtp_frequency;
     m_payload_type = static_cast<unsigned>(config->m_audio_payload_type);
     auto item = std::make_unique<Buffer_Item>();
@@ -87,10 +89,9 @@ void MP3RtpTransportSession::procMP3Thread() {
         }
         AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);
         config->set_timestamp(PositionMs(ts, rate), false);
-        sendMP3RtpPacket(*item, sock, ts, sequence);
+        sendMP3RtpPacket(*item, sock.get(), ts, sequence);
         state.AfterSend(&sequence);
         recompute = true;
     }
-    close(sock);
     OrvexPrint("\n exit MP3RtpTransportSession::SendAACRTPPACKET ");
 }

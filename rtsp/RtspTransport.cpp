@@ -88,19 +88,17 @@ bool RtspTransport::Open(const char* ip, unsigned port, unsigned extra) {
     m_address = ip != nullptr ? ip : "";
     m_port = port;
     m_extra = extra;
-    if (m_listen_fd >= 0) close(m_listen_fd);
-    m_listen_fd = socket(AF_INET, SOCK_STREAM, 0);
-    if (m_listen_fd < 0) {
+    m_listen_fd.reset(socket(AF_INET, SOCK_STREAM, 0));
+    if (!m_listen_fd.valid()) {
         OrvexPrint("failed to create socket");
         Close();
         return false;
     }
     int on = 1;
-    if (setsockopt(m_listen_fd, SOL_SOCKET, SO_REUSEADDR, &on, sizeof on) != 0) {
+    if (setsockopt(m_listen_fd.get(), SOL_SOCKET, SO_REUSEADDR, &on, sizeof on) != 0) {
         OrvexLogPriority(platform::kLogError, "orvex:::RtspSession",
                          "set reuse rtsp address wrong %s", strerror(errno));
-        close(m_listen_fd);
-        m_listen_fd = -1;
+        m_listen_fd.reset();
         return false;
     }
     m_listen_addr = sockaddr_in{};
@@ -109,17 +107,17 @@ bool RtspTransport::Open(const char* ip, unsigned port, unsigned extra) {
     m_listen_addr.sin_addr.s_addr = inet_addr(m_address.c_str());
     auto fail = [this](const char* text) {
         OrvexPrint("%s", text);
-        close(m_listen_fd);
-        m_listen_fd = -1;
+        m_listen_fd.reset();
         return false;
     };
     // Both spellings "rtstptransport" are the texts operators know.
-    if (bind(m_listen_fd, reinterpret_cast<sockaddr*>(&m_listen_addr), sizeof m_listen_addr) != 0) {
+    if (bind(m_listen_fd.get(), reinterpret_cast<sockaddr*>(&m_listen_addr),
+             sizeof m_listen_addr) != 0) {
         return fail("\n rtstptransport bind error. ");
     }
-    if (listen(m_listen_fd, 128) != 0) return fail("\n  rtstptransport listen error. ");
+    if (listen(m_listen_fd.get(), 128) != 0) return fail("\n  rtstptransport listen error. ");
     socklen_t len = sizeof m_listen_addr;
-    getsockname(m_listen_fd, reinterpret_cast<sockaddr*>(&m_listen_addr), &len);
+    getsockname(m_listen_fd.get(), reinterpret_cast<sockaddr*>(&m_listen_addr), &len);
     m_running.store(1, std::memory_order_relaxed);
     if (pthread_create(&m_thread, nullptr, StartListenThread, this) != 0) {
         OrvexPrintLog(kTag, "in Open()--->thread_create failed ");
@@ -141,16 +139,13 @@ void* RtspTransport::StartListenThread(void* self) {
 bool RtspTransport::Close() {
     if (m_opened == 0) {
         // A failed Open may have left its socket behind.
-        if (m_listen_fd >= 0) close(m_listen_fd);
-        m_listen_fd = -1;
+        m_listen_fd.reset();
         return true;
     }
-    for (auto& entry : m_sessions) delete entry.second;
     m_sessions.clear();
     m_addresses.clear();
     m_client_count.store(0, std::memory_order_relaxed);
-    if (m_listen_fd >= 0) close(m_listen_fd);
-    m_listen_fd = -1;
+    m_listen_fd.reset();
     m_opened = 0;
     return true;
 }
@@ -259,8 +254,8 @@ void RtspTransport::ListenThread() {
         ServeCaptureHolders();
         fd_set ready;
         FD_ZERO(&ready);
-        int max_fd = m_listen_fd;
-        FD_SET(m_listen_fd, &ready);
+        int max_fd = m_listen_fd.get();
+        FD_SET(m_listen_fd.get(), &ready);
         for (const auto& entry : m_sessions) {
             FD_SET(entry.first, &ready);
             if (entry.first > max_fd) max_fd = entry.first;
@@ -276,7 +271,7 @@ void RtspTransport::ListenThread() {
         int n = select(max_fd + 1, &ready, nullptr, nullptr, &wait);
         if (n > 0 && wake_fd >= 0 && FD_ISSET(wake_fd, &ready)) DrainWake();
         if (n >= 0 && ProcessReadRtspSession(ready) != 0) {
-            ProcessNewIncomingRtspSession(m_listen_fd, ready, max_fd);
+            ProcessNewIncomingRtspSession(m_listen_fd.get(), ready, max_fd);
         }
         m_rounds.fetch_add(1, std::memory_order_relaxed);
     }
@@ -322,7 +317,7 @@ int RtspTransport::ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, in
     // Answers go out line by line: without this, Nagle holds the later lines back, and a
     // connection closed right after an error answer (closes reset) would lose them.
     setsockopt(fd, IPPROTO_TCP, TCP_NODELAY, &on, sizeof on);
-    m_sessions[fd] = new RtspSession(fd, m_listen_addr, peer, this);
+    m_sessions[fd] = std::make_unique<RtspSession>(fd, m_listen_addr, peer, this);
     m_addresses[fd] = ip;
     return 1;
 }
@@ -377,7 +372,6 @@ int RtspTransport::ProcessReadRtspSession(fd_set& ready) {
             CloseVideoAndAudioDecodeAndSend();
             if (ProcessDelRtspSessionOther(fd) != 0)
                 m_client_count.fetch_sub(1, std::memory_order_relaxed);
-            delete it->second;
             m_sessions.erase(it);
             break;
         }
@@ -389,7 +383,6 @@ int RtspTransport::ProcessDelRtspSession(int fd) {
     auto it = m_sessions.find(fd);
     if (it == m_sessions.end()) return 0;
     OrvexPrint("\n RtspSessionMap delete one !");
-    delete it->second;
     m_sessions.erase(it);
     ProcessDelRtspSessionOther(fd);
     m_client_count.fetch_sub(1, std::memory_order_relaxed);

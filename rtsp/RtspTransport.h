@@ -6,11 +6,13 @@
 
 #include <atomic>
 #include <map>
+#include <memory>
 #include <string>
 
 #include "media/MediaSessionList.h"
 #include "media/cycle_buffer.h"
 #include "media/thread_mutex.h"
+#include "platform/UniqueFd.h"
 
 class RtspSession;
 
@@ -78,10 +80,10 @@ private:
     std::string m_address;
     unsigned m_port = 0;
     unsigned m_extra = 0;
-    int m_listen_fd = -1;
+    platform::UniqueFd m_listen_fd;
     sockaddr_in m_listen_addr{};
     int m_opened = 0;
-    std::map<int, RtspSession*> m_sessions;
+    std::map<int, std::unique_ptr<RtspSession>> m_sessions;
     cycle_buffer m_audio_ring{500000};
     cycle_buffer m_video_ring{8000000};
     pthread_t m_thread{};

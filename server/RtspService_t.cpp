@@ -12,14 +12,12 @@ bool RtspService_t::Open(unsigned port) {
     m_config->read_audio_payload_type();
     m_config->read_wake_mode();
     m_config->read_latency_report();
-    m_video = new MediaStreamH264("h264");
-    m_audio = new MediaStreamMP4A("aac", -1);
-    m_session = new MediaSession("skyvo");
+    auto session = std::make_unique<MediaSession>("skyvo");
     // Video first: it becomes track 1, payload type 96 in the SDP.
-    m_session->AddMediaStream(m_video);
-    m_session->AddMediaStream(m_audio);
-    m_listener = new RtspTransport();
-    m_listener->AddMediaSession(m_session);
+    session->AddMediaStream(std::make_unique<MediaStreamH264>("h264"));
+    session->AddMediaStream(std::make_unique<MediaStreamMP4A>("aac", -1));
+    m_listener = std::make_unique<RtspTransport>();
+    m_listener->AddMediaSession(std::move(session));
     OpenAudioAndVideoThread();
     return m_listener->Open("0.0.0.0", port, static_cast<unsigned>(-1));
 }
@@ -30,14 +28,8 @@ void RtspService_t::OpenAudioAndVideoThread() {
 }
 
 void RtspService_t::Release() {
-    if (m_listener != nullptr) {
-        m_listener->CloseAll();
-        delete m_listener;  // with it the presentation and its tracks
-    }
-    m_listener = nullptr;
-    m_session = nullptr;
-    m_video = nullptr;
-    m_audio = nullptr;
+    if (m_listener != nullptr) m_listener->CloseAll();
+    m_listener.reset();  // with it the presentation and its tracks
     // The send sessions go before the configuration their threads read.
     H264RtpTransportSession::CloseInstance();
     MP3RtpTransportSession::CloseInstance();

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <memory>
+
 #include "media/MediaSession.h"
 #include "media/MediaStreamH264.h"
 #include "media/MediaStreamMP4A.h"
@@ -23,14 +25,11 @@ public:
     void OpenAudioAndVideoThread();
     void Release();
 
-    RtspTransport* listener() { return m_listener; }
+    RtspTransport* listener() { return m_listener.get(); }
     Global_Config* config() { return m_config; }
 
 private:
-    RtspTransport* m_listener = nullptr;
-    MediaSession* m_session = nullptr;  // owned by the listener's session list
-    MediaStreamH264* m_video = nullptr;
-    MediaStreamMP4A* m_audio = nullptr;
+    std::unique_ptr<RtspTransport> m_listener;
     unsigned m_bookkeeping[4] = {};
     Global_Config* m_config;
 };

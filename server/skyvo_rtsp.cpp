@@ -1,6 +1,7 @@
 #include "server/skyvo_rtsp.h"
 
 #include <atomic>
+#include <memory>
 #include <thread>
 
 #include "server/FrameTap.h"
@@ -54,21 +55,19 @@ int skyvo_rtsp_sever_open(unsigned port) {
     if (service == nullptr) return 1;
     if (service->Open(port)) return 0;
     OrvexDebugPuts("Rtsp Transport open failed.");
-    g_pRtspService.store(nullptr);
+    std::unique_ptr<RtspService_t> failed(g_pRtspService.exchange(nullptr));
     WaitForProducers();
-    delete service;
     return 1;
 }
 
 void skyvo_rtsp_sever_close(void) {
-    RtspService_t* service = g_pRtspService.exchange(nullptr);
+    std::unique_ptr<RtspService_t> service(g_pRtspService.exchange(nullptr));
     if (service == nullptr) {
         OrvexDebugPuts("\n g_pRtspService is NULL ! ");
         return;
     }
     WaitForProducers();
     service->Release();
-    delete service;
 }
 
 void skyvo_set_mp3_rtp_config(unsigned rate) {

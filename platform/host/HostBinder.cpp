@@ -40,19 +40,18 @@ HostBinder::HostBinder() : HostBinder(BinderDir()) {}
 
 HostBinder::HostBinder(std::string dir, int pool_threads)
     : dir_(std::move(dir)), pool_size_(pool_threads > 0 ? pool_threads : 1) {
-    epoll_fd_ = epoll_create1(EPOLL_CLOEXEC);
-    wake_fd_ = eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK);
-    if (epoll_fd_ >= 0 && wake_fd_ >= 0) {
+    epoll_fd_.reset(epoll_create1(EPOLL_CLOEXEC));
+    wake_fd_.reset(eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK));
+    if (epoll_fd_.valid() && wake_fd_.valid()) {
         epoll_event ev{};
         ev.events = EPOLLIN;
         ev.data.ptr = nullptr;
-        if (epoll_ctl(epoll_fd_, EPOLL_CTL_ADD, wake_fd_, &ev) == 0) return;
+        if (epoll_ctl(epoll_fd_.get(), EPOLL_CTL_ADD, wake_fd_.get(), &ev) == 0) return;
     }
     HostLogf(kLogWarn, "binder: no epoll/eventfd (%s); services cannot be offered",
              strerror(errno));
-    if (epoll_fd_ >= 0) close(epoll_fd_);
-    if (wake_fd_ >= 0) close(wake_fd_);
-    epoll_fd_ = wake_fd_ = -1;
+    epoll_fd_.reset();
+    wake_fd_.reset();
 }
 
 HostBinder::~HostBinder() { Stop(); }
@@ -98,7 +97,7 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
         return -ENAMETOOLONG;
     }
     std::lock_guard<std::mutex> hold(mutex_);
-    if (stopping_ || epoll_fd_ < 0) return -EINVAL;
+    if (stopping_ || !epoll_fd_.valid()) return -EINVAL;
     if (mkdir(dir_.c_str(), 0700) != 0 && errno != EEXIST) {
         int err = errno;
         HostLogf(kLogWarn, "binder: cannot create %s: %s", dir_.c_str(), strerror(err));
@@ -141,7 +140,7 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
     epoll_event ev{};
     ev.events = EPOLLIN;
     ev.data.ptr = listener.get();
-    if (epoll_ctl(epoll_fd_, EPOLL_CTL_ADD, fd, &ev) != 0) {
+    if (epoll_ctl(epoll_fd_.get(), EPOLL_CTL_ADD, fd, &ev) != 0) {
         int err = errno;
         close(fd);
         unlink(path.c_str());
@@ -154,7 +153,7 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
 
 void HostBinder::startThreadPool() {
     std::lock_guard<std::mutex> hold(mutex_);
-    if (started_ || stopping_ || epoll_fd_ < 0) return;
+    if (started_ || stopping_ || !epoll_fd_.valid()) return;
     started_ = true;
     for (int i = 0; i < pool_size_; ++i) {
         try {
@@ -170,7 +169,7 @@ void HostBinder::PoolLoop() {
     pthread_setname_np(pthread_self(), "orvex-binder");
     for (;;) {
         epoll_event ev;
-        int n = epoll_wait(epoll_fd_, &ev, 1, -1);
+        int n = epoll_wait(epoll_fd_.get(), &ev, 1, -1);
         if (n < 0 && errno != EINTR) {
             HostLogf(kLogWarn, "binder: epoll_wait: %s", strerror(errno));
             return;
@@ -280,9 +279,9 @@ void HostBinder::Stop() {
         // Wakes threads blocked on a client; they close the descriptor themselves.
         for (int fd : serving_) shutdown(fd, SHUT_RDWR);
     }
-    if (wake_fd_ >= 0) {
+    if (wake_fd_.valid()) {
         uint64_t one = 1;
-        ssize_t ignored = write(wake_fd_, &one, sizeof one);
+        ssize_t ignored = write(wake_fd_.get(), &one, sizeof one);
         (void)ignored;
     }
     for (std::thread& t : pool_) t.join();
@@ -297,9 +296,8 @@ void HostBinder::Stop() {
         }
     }
     listeners_.clear();
-    if (epoll_fd_ >= 0) close(epoll_fd_);
-    if (wake_fd_ >= 0) close(wake_fd_);
-    epoll_fd_ = wake_fd_ = -1;
+    epoll_fd_.reset();
+    wake_fd_.reset();
     std::lock_guard<std::mutex> hold(outgoing_mutex_);
     for (auto& entry : outgoing_) {
         std::lock_guard<std::mutex> hold_out(entry.second->mutex);

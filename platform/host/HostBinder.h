@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "platform/BinderPort.h"
+#include "platform/UniqueFd.h"
 
 namespace platform {
 namespace host {
@@ -100,8 +101,8 @@ private:
     const std::string dir_;
     const int pool_size_;
     std::string driver_;
-    int epoll_fd_ = -1;
-    int wake_fd_ = -1;  // an eventfd in the epoll set: readable once Stop begins
+    UniqueFd epoll_fd_;
+    UniqueFd wake_fd_;  // an eventfd in the epoll set: readable once Stop begins
 
     std::mutex mutex_;  // guards what follows
     bool stopping_ = false;

@@ -10,6 +10,7 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <string>
 
 #include "media/MediaSessionList.h"
@@ -26,10 +27,10 @@ struct Server {
 
     Server() {
         Socket::SetReadinessWaitMs(10);
-        auto* session = new MediaSession("skyvo");
-        session->AddMediaStream(new MediaStreamH264("h264"));
-        session->AddMediaStream(new MediaStreamMP4A("aac", -1));
-        list.AddMediaSession(session);
+        auto session = std::make_unique<MediaSession>("skyvo");
+        session->AddMediaStream(std::make_unique<MediaStreamH264>("h264"));
+        session->AddMediaStream(std::make_unique<MediaStreamMP4A>("aac", -1));
+        list.AddMediaSession(std::move(session));
     }
 };
 

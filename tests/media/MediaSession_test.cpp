@@ -2,6 +2,7 @@
 #include <gtest/gtest.h>
 #include <sys/socket.h>
 
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -24,10 +25,10 @@ protected:
     ~MediaModelTest() override { Global_Config::CloseInstance(); }
 
     // The presentation the server builds: video first, then audio.
-    static MediaSession* Skyvo() {
-        auto* s = new MediaSession("skyvo");
-        s->AddMediaStream(new MediaStreamH264("h264"));
-        s->AddMediaStream(new MediaStreamMP4A("aac", -1));
+    static std::unique_ptr<MediaSession> Skyvo() {
+        auto s = std::make_unique<MediaSession>("skyvo");
+        s->AddMediaStream(std::make_unique<MediaStreamH264>("h264"));
+        s->AddMediaStream(std::make_unique<MediaStreamMP4A>("aac", -1));
         return s;
     }
 
@@ -37,9 +38,7 @@ protected:
 TEST_F(MediaModelTest, NamesAreUniqueAndLookupsExact) {
     MediaSessionList list;
     ASSERT_TRUE(list.AddMediaSession(Skyvo()));
-    MediaSession* again = Skyvo();
-    EXPECT_FALSE(list.AddMediaSession(again));
-    delete again;
+    EXPECT_FALSE(list.AddMediaSession(Skyvo()));
     EXPECT_FALSE(list.AddMediaSession(nullptr));
     MediaSession* s = list.FindMediaSession("skyvo");
     ASSERT_NE(s, nullptr);
@@ -47,9 +46,7 @@ TEST_F(MediaModelTest, NamesAreUniqueAndLookupsExact) {
     EXPECT_EQ(list.FindMediaSession("skyvo2"), nullptr);
     EXPECT_EQ(list.FindMediaSession(nullptr), nullptr);
 
-    auto* dup = new MediaStreamH264("h264");
-    EXPECT_FALSE(s->AddMediaStream(dup));
-    delete dup;
+    EXPECT_FALSE(s->AddMediaStream(std::make_unique<MediaStreamH264>("h264")));
     EXPECT_EQ(s->GetMediaStreamCount(), 2);
     EXPECT_EQ(s->GetMediaStream(0)->GetType(), 201);
     EXPECT_EQ(s->GetMediaStream(1)->GetType(), 101);
