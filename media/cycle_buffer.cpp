@@ -240,7 +240,7 @@ bool cycle_buffer::wait_readable(uint32_t len, unsigned max_ms) {
     {
         thread_mutex::Scoped bell(m_bell_lock);
         while (!m_bell_data && !m_bell_wake) {
-            if (m_bell.wait_until(m_bell_lock, until) == std::cv_status::timeout) break;
+            if (!m_bell.wait_until(m_bell_lock, until)) break;
         }
         m_bell_data = m_bell_wake = false;
     }

@@ -1,7 +1,6 @@
 #pragma once
 
 #include <atomic>
-#include <condition_variable>
 #include <cstdint>
 #include <mutex>
 
@@ -94,13 +93,13 @@ private:
     uint32_t m_in_flight ORVEX_GUARDED_BY(m_lock) = 0;
     uint32_t m_resets_waiting ORVEX_GUARDED_BY(m_lock) = 0;
     uint32_t m_waiters ORVEX_GUARDED_BY(m_lock) = 0;  // writers and resets in Wait
-    std::condition_variable_any m_changed;            // a publish or a reset finished
+    thread_condition m_changed;                       // a publish or a reset finished
     // What the consumer waits for in wait_readable (0: it does not wait), so that only the
     // publish that brings that much wakes it. It sleeps on a bell of its own, rung after the
     // ring's lock is released.
     uint32_t m_reader_wants ORVEX_GUARDED_BY(m_lock) = 0;
     thread_mutex m_bell_lock;
-    std::condition_variable_any m_bell;
+    thread_condition m_bell;
     bool m_bell_data ORVEX_GUARDED_BY(m_bell_lock) = false;  // the publish the wait asked for
     bool m_bell_wake ORVEX_GUARDED_BY(m_bell_lock) = false;  // kept for a wait not yet begun
     uint32_t m_threshold = 0;

@@ -4,7 +4,6 @@
 #include <unistd.h>
 
 #include <chrono>
-#include <condition_variable>
 
 #include "media/thread_mutex.h"
 #include "platform/Ports.h"
@@ -20,7 +19,7 @@ constexpr const char* kTag = "orvex:::startorvexsevice";
 
 std::atomic<bool> g_service_run{false};
 thread_mutex g_service_lock;  // with g_service_wake: ends a waiting service loop at once
-std::condition_variable_any g_service_wake;
+thread_condition g_service_wake;
 pthread_t g_service_thread{};
 bool g_service_started = false;
 
