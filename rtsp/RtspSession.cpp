@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "platform/LogPort.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
 #include "rtsp/CaptureQuery.h"
@@ -22,11 +23,20 @@ constexpr const char* kTag = "orvex:::RtspSession";
 
 }  // namespace
 
-RtspSession::RtspSession(int fd, sockaddr_in first, sockaddr_in second, MediaSessionList* list)
-    : m_fd(fd), m_response(std::make_unique<RtspResponse>(fd, first, second)), m_list(list) {}
+RtspSession::RtspSession(int fd, sockaddr_in first, sockaddr_in second, MediaSessionList* list,
+                         RtspAccess* access)
+    : m_fd(fd),
+      m_response(std::make_unique<RtspResponse>(fd, first, second)),
+      m_list(list),
+      m_access(access) {}
 
 RtspSession::~RtspSession() {
     OrvexPrint("\n RtspSession::~RtspSession() ");
+    // One line for a client that never got in, with the last reason it was given.
+    if (!m_refusal.empty() && !m_admitted) {
+        OrvexLogPriority(platform::kLogWarn, kTag, "%s refused: %s",
+                         DottedAddress(m_response->GetConnectAddr()).c_str(), m_refusal.c_str());
+    }
     H264RtpTransportSession::instance()->del_dest_socket_info(this);
     MP3RtpTransportSession::instance()->del_dest_socket_info(this);
     m_response.reset();  // closes the connection
@@ -43,6 +53,8 @@ int RtspSession::RtspSessionThread(int& type) {
         return -1;
     }
     m_last_activity = static_cast<int>(GetTimeHeartbeatSec());
+    int refused_result = 0;
+    if (Refused(&type, &refused_result)) return refused_result;
     switch (type) {
         case kRtspOptions:
             m_response->ResponseOptions();
@@ -77,6 +89,33 @@ int RtspSession::RtspSessionThread(int& type) {
             OrvexPrintLog(kTag, "\n rtsp method not support ");
             return -1;
     }
+}
+
+bool RtspSession::Refused(int* type, int* result) {
+    if (m_access == nullptr || !m_access->authenticating()) return false;
+    sockaddr_in peer = m_response->GetConnectAddr();
+    RtspAccess::Decision d = m_access->Judge(m_response->request_lines(), *type,
+                                             ntohl(peer.sin_addr.s_addr), DottedAddress(peer));
+    if (d.answer == RtspAccess::Answer::kServe) {
+        if (*type != kRtspOptions) m_admitted = true;
+        return false;
+    }
+    m_refusal = d.reason;
+    *type = 0;  // nothing was done: no PLAY may start capture
+    switch (d.answer) {
+        case RtspAccess::Answer::kChallenge:
+            m_response->AddField(d.header);
+            m_response->ResponseError("RTSP/1.0 401 Unauthorized");
+            break;
+        case RtspAccess::Answer::kBadRequest:
+            m_response->ResponseError("RTSP/1.0 400 Bad Request");
+            break;
+        default:
+            m_response->ResponseError("RTSP/1.0 503 Service Unavailable");
+            break;
+    }
+    *result = d.close ? -1 : 0;
+    return true;
 }
 
 bool RtspSession::TransportDescribe(std::string* sdp) {

@@ -7,6 +7,7 @@
 #include <string>
 
 #include "media/MediaSessionList.h"
+#include "rtsp/RtspAccess.h"
 #include "rtsp/RtspResponse.h"
 
 // The URL time check of DESCRIBE: off, and nothing in the service turns it on (tests do).
@@ -18,7 +19,9 @@ extern std::atomic<unsigned char> g_url_check_switch;
 // Thread contract: NOT thread safe; used by the RTSP listener's thread only.
 class RtspSession {
 public:
-    RtspSession(int fd, sockaddr_in first, sockaddr_in second, MediaSessionList* list);
+    // `access`, when given, judges every request before it is served.
+    RtspSession(int fd, sockaddr_in first, sockaddr_in second, MediaSessionList* list,
+                RtspAccess* access = nullptr);
     virtual ~RtspSession();
     RtspSession(const RtspSession&) = delete;
     RtspSession& operator=(const RtspSession&) = delete;
@@ -42,6 +45,8 @@ private:
     bool StreamSetup(MediaStream* stream, unsigned* server_port, int* client_port);
     // The media session a PLAY or PAUSE names, answering 400 or 404 when there is none.
     MediaSession* NamedSession();
+    // Answers a request that may not be served; false when it may.
+    bool Refused(int* type, int* result);
 
     int m_fd;
     std::unique_ptr<RtspResponse> m_response;
@@ -49,4 +54,7 @@ private:
     std::string m_session_name;
     std::string m_rtp_info;
     int m_last_activity = 0;
+    RtspAccess* m_access;
+    std::string m_refusal;  // why the last refused request was refused
+    bool m_admitted = false;
 };

@@ -288,6 +288,11 @@ int RtspTransport::ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, in
     if (fd < 1) return 0;
     int count = m_client_count.load(std::memory_order_relaxed);
     if (count == 0) g_accepts_without_clients.fetch_add(1, std::memory_order_relaxed);
+    if (!m_access.AdmitConnection(ntohl(peer.sin_addr.s_addr), DottedAddress(peer))) {
+        ResetOnClose(fd);
+        close(fd);
+        return 0;
+    }
     if (count > kMaxClients - 1) {
         OrvexPrint("\n CloseSockid,socketid:%d,\n", fd);
         ResetOnClose(fd);
@@ -317,7 +322,7 @@ int RtspTransport::ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, in
     // Answers go out line by line: without this, Nagle holds the later lines back, and a
     // connection closed right after an error answer (closes reset) would lose them.
     setsockopt(fd, IPPROTO_TCP, TCP_NODELAY, &on, sizeof on);
-    m_sessions[fd] = std::make_unique<RtspSession>(fd, m_listen_addr, peer, this);
+    m_sessions[fd] = std::make_unique<RtspSession>(fd, m_listen_addr, peer, this, &m_access);
     m_addresses[fd] = ip;
     return 1;
 }

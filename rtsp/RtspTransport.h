@@ -13,6 +13,7 @@
 #include "media/cycle_buffer.h"
 #include "media/thread_mutex.h"
 #include "platform/UniqueFd.h"
+#include "rtsp/RtspAccess.h"
 
 class RtspSession;
 
@@ -45,6 +46,9 @@ public:
     cycle_buffer& audio_ring() { return m_audio_ring; }
     int client_count() const { return m_client_count.load(std::memory_order_relaxed); }
     int listen_port() const;
+
+    // Who may watch; configure it before Open starts the listener.
+    RtspAccess& access() { return m_access; }
 
     // The listener's select wait, two seconds in service. Tests shorten it.
     static void SetSelectWaitMs(int ms);
@@ -81,6 +85,7 @@ private:
     unsigned m_port = 0;
     unsigned m_extra = 0;
     platform::UniqueFd m_listen_fd;
+    RtspAccess m_access;
     sockaddr_in m_listen_addr{};
     int m_opened = 0;
     std::map<int, std::unique_ptr<RtspSession>> m_sessions;

@@ -1,7 +1,35 @@
 #include "server/RtspService_t.h"
 
+#include "auth/AddressRules.h"
+#include "platform/LogPort.h"
+#include "platform/Ports.h"
+#include "platform/PropertyPort.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
+#include "service/OrvexLog.h"
+
+namespace {
+
+// kv.orvex.bind: the one address to listen on; unset, all of them. A value that is not an IPv4
+// address opens nothing rather than everything.
+bool ListenAddress(std::string* address) {
+    char value[platform::kPropertyValueMax] = {};
+    platform::Properties().Get("kv.orvex.bind", value, "");
+    uint32_t parsed = 0;
+    if (value[0] == '\0') {
+        *address = "0.0.0.0";
+        return true;
+    }
+    if (!auth::ParseIpv4(value, &parsed)) {
+        OrvexLogPriority(platform::kLogError, "orvex:::access",
+                         "kv.orvex.bind=\"%s\" is not an IPv4 address; not listening", value);
+        return false;
+    }
+    *address = value;
+    return true;
+}
+
+}  // namespace
 
 RtspService_t::RtspService_t() : m_config(Global_Config::instance()) {}
 
@@ -18,8 +46,11 @@ bool RtspService_t::Open(unsigned port) {
     session->AddMediaStream(std::make_unique<MediaStreamMP4A>("aac", -1));
     m_listener = std::make_unique<RtspTransport>();
     m_listener->AddMediaSession(std::move(session));
+    m_listener->access().Load();
     OpenAudioAndVideoThread();
-    return m_listener->Open("0.0.0.0", port, static_cast<unsigned>(-1));
+    std::string address;
+    if (!ListenAddress(&address)) return false;
+    return m_listener->Open(address.c_str(), port, static_cast<unsigned>(-1));
 }
 
 void RtspService_t::OpenAudioAndVideoThread() {

@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # End to end on this machine, with stock clients. First orvex started as the README's run
 # command starts it (the shipped host properties: audio packets carry the SDP's payload type
-# 97): ffprobe, ffmpeg and GStreamer play picture and sound, a raw RTP client checks the
+# 97; a password made at the first start, taken from the URL by every client): ffprobe, ffmpeg
+# and GStreamer play picture and sound, a raw RTP client checks the
 # packets, ffmpeg measures frame rate and A/V offset per capture size, SIGTERM stops it. Then
 # with kv.orvex.audiopt and kv.orvex.wake removed, as on the television: the audio packets
 # carry 98 again and idle threads poll.
@@ -14,7 +15,9 @@ build=$(cd "${1:-$top/build}" && pwd)
 work=$(mktemp -d)
 export ORVEX_LOG="file:$work/orvex.log"
 export ORVEX_BINDER_DIR="$work/binder"
-url() { echo "rtsp://127.0.0.1/skyvo.0?width=$1&height=$2&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"; }
+export XDG_CONFIG_HOME="$work/config"  # where run.sh keeps the credentials it makes
+creds=
+url() { echo "rtsp://${creds}127.0.0.1/skyvo.0?width=$1&height=$2&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"; }
 fail() { echo "e2e: FAILED: $*"; tail -n 20 "$work/stdout" || true; exit 1; }
 pass=0
 ok() { echo "e2e: ok: $*"; pass=$((pass + 1)); }
@@ -71,6 +74,12 @@ ok "orvex -v"
 
 if [[ $build == "$top/build" ]]; then
   start env -u ORVEX_PROP_FILE "$top/tools/run.sh"
+  play_url=$(cat "$XDG_CONFIG_HOME/orvex/play-url") || fail "run.sh made no credentials"
+  creds=$(sed -n 's|^rtsp://\([^@/]*@\).*|\1|p' <<<"$play_url")
+  grep -q "^run: made .*users.htdigest" "$work/stdout" && grep -qF "ffplay -rtsp_transport udp 'rtsp://$creds" "$work/stdout" ||
+    fail "run.sh did not print the URL with the credentials"
+  [[ $(stat -c %a "$XDG_CONFIG_HOME/orvex/users.htdigest") == 600 ]] || fail "credentials file mode"
+  ok "run.sh: credentials made (mode 0600), URL printed with them"
 else
   start env ORVEX_PROP_FILE="$top/platform/host/orvex.prop" "$build/orvex"
 fi
@@ -123,6 +132,7 @@ for size in "640 480" "1280 720" "1920 1080"; do
 done
 stop
 
+creds=
 # As on the television: no kv.orvex.audiopt, so the audio packets carry 98; no kv.orvex.wake.
 grep -v -e '^kv.orvex.audiopt=' -e '^kv.orvex.wake=' "$top/platform/host/orvex.prop" \
   >"$work/tv.prop"

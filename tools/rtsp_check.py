@@ -7,6 +7,10 @@
                                           the host pattern's capture stamp to the decoded frame
     rtsp_check.py split URL [SECONDS]     the same delay cut in two: capture to the frame's last
                                           packet here, and that packet to the decoded frame
+    rtsp_check.py guess URL SOURCE        wrong passwords from SOURCE until the connection ends,
+                                          then the URL's right one from there
+
+URLs may carry user:password@: requests are then answered with Digest when the service asks.
 
 With --service-log FILE (the service's log, orvex.host.log=file:FILE), 'latency' and 'split'
 also print the service's own reports written meanwhile: with kv.orvex.latency=1 the video
@@ -17,6 +21,7 @@ kv.orvex.audiopt says so (the host default), and then 'measure' plays the URL wi
 Left at the television's 98, ffmpeg would drop every audio packet (it keeps to the SDP's type),
 so 'measure' then hands ffmpeg its own SDP with the type the packets carry.
 """
+import hashlib
 import os
 import re
 import socket
@@ -29,17 +34,42 @@ import time
 
 
 class Session:
-    def __init__(self, url):
-        self.url = url
-        m = re.match(r"rtsp://([^/:]+)(?::(\d+))?/", url)
-        self.sock = socket.create_connection((m.group(1), int(m.group(2) or 554)), timeout=10)
+    """URLs may carry user:password@, answered with Digest when the service asks."""
+
+    def __init__(self, url, source=None):
+        m = re.match(r"rtsp://(?:([^:@/]*):([^@/]*)@)?([^/:@]+)(?::(\d+))?/", url)
+        self.user, self.password = m.group(1), m.group(2)
+        self.url = re.sub(r"^rtsp://[^@/]*@", "rtsp://", url)
+        self.realm = self.nonce = None
+        self.sock = socket.create_connection((m.group(3), int(m.group(4) or 554)), timeout=10,
+                                             source_address=(source, 0) if source else None)
         self.cseq = 0
         self.lock = threading.Lock()
 
+    def authorization(self, method, url):
+        if self.nonce is None:
+            return ""
+        md5 = lambda text: hashlib.md5(text.encode()).hexdigest()
+        ha1 = md5("%s:%s:%s" % (self.user, self.realm, self.password))
+        response = md5("%s:%s:%s" % (ha1, self.nonce, md5("%s:%s" % (method, url))))
+        return ('Authorization: Digest username="%s", realm="%s", nonce="%s", uri="%s", '
+                'response="%s"\r\n' % (self.user, self.realm, self.nonce, url, response))
+
     def request(self, method, url, headers=""):
+        head, body = self.exchange(method, url, headers)
+        if head.startswith("RTSP/1.0 401") and self.user is not None:
+            self.realm = re.search(r'realm="([^"]*)"', head).group(1)
+            self.nonce = re.search(r'nonce="([^"]*)"', head).group(1)
+            head, body = self.exchange(method, url, headers)
+        if not head.startswith("RTSP/1.0 200 OK"):
+            raise RuntimeError(method + ": " + head)
+        return head, body
+
+    def exchange(self, method, url, headers):
         with self.lock:
             self.cseq += 1
-            self.sock.sendall(("%s %s RTSP/1.0\r\nCSeq: %d\r\n%s\r\n" % (method, url, self.cseq, headers)).encode())
+            self.sock.sendall(("%s %s RTSP/1.0\r\nCSeq: %d\r\n%s%s\r\n" % (
+                method, url, self.cseq, self.authorization(method, url), headers)).encode())
             data = b""
             while b"\r\n\r\n" not in data:
                 chunk = self.sock.recv(4096)
@@ -50,9 +80,7 @@ class Session:
             m = re.search(rb"Content-Length: (\d+)", head)
             while m and len(body) < int(m.group(1)):
                 body += self.sock.recv(4096)
-            if not head.startswith(b"RTSP/1.0 200 OK"):
-                raise RuntimeError(method + ": " + head.decode(errors="replace"))
-            return head.decode(), body.decode()
+            return head.decode(errors="replace"), body.decode(errors="replace")
 
     def play(self, ports):
         _, sdp = self.request("DESCRIBE", self.url)
@@ -337,6 +365,34 @@ def split(url, seconds):
     return 0
 
 
+def guess(url, source):
+    """A scripted guesser from `source`: wrong passwords until the service ends the connection.
+    Then one more connection from the same address with the right password (the URL's)."""
+    wrong = re.sub(r"^rtsp://([^:@/]*):[^@/]*@", r"rtsp://\1:wrong@", url)
+    session = Session(wrong, source)
+    begin = time.time()
+    answers = 0
+    try:
+        while answers < 100:
+            head, _ = session.exchange("DESCRIBE", session.url, "")
+            if not head:
+                break
+            if session.nonce is not None:
+                answers += 1  # an answer that carried a (wrong) password
+            session.realm = re.search(r'realm="([^"]*)"', head).group(1)
+            session.nonce = re.search(r'nonce="([^"]*)"', head).group(1)
+    except (OSError, RuntimeError, AttributeError):
+        pass
+    took = time.time() - begin
+    try:
+        Session(url, source).request("DESCRIBE", re.sub(r"^rtsp://[^@/]*@", "rtsp://", url))
+        after = "served"
+    except (OSError, RuntimeError) as e:
+        after = "refused (%s)" % type(e).__name__
+    print("wrong_answers=%d seconds=%.3f right_password_after=%s" % (answers, took, after))
+    return 0
+
+
 def service_reports(path, offset):
     """The service's latency lines appended to its log since `offset`."""
     try:
@@ -356,6 +412,8 @@ def main():
         log = args[at + 1]
         del args[at:at + 2]
     mode, url = args[0], args[1]
+    if mode == "guess":
+        sys.exit(guess(url, args[2]))
     seconds = float(args[2]) if len(args) > 2 else 10.0
     modes = {"packets": packets, "measure": measure, "latency": latency, "split": split}
     offset = os.path.getsize(log) if log and os.path.exists(log) else 0

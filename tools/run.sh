@@ -5,8 +5,33 @@ top=$(cd "$(dirname "$0")/.." && pwd)
 "$top/tools/install-deps.sh"
 cmake -S "$top" -B "$top/build" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
 cmake --build "$top/build"
+query="skyvo.0?width=1280&height=720&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"
+# The address other machines reach this one at (the URL is for them; 127.0.0.1 also works here).
+address=$(ip -4 route get 192.0.2.1 2>/dev/null | sed -n 's/.* src \([0-9.]*\).*/\1/p' | head -n 1)
+address=${address:-127.0.0.1}
+url="rtsp://$address/$query"
+if [[ -z ${ORVEX_PROP_FILE:-} && ${ORVEX_AUTH:-on} != off ]]; then
+  # Who may watch: a user "orvex" with a random password, made at the first start. The shipped
+  # properties are copied at every start with kv.orvex.auth pointing at the credentials.
+  conf=${XDG_CONFIG_HOME:-$HOME/.config}/orvex
+  users=$conf/users.htdigest
+  mkdir -p "$conf"
+  if [[ ! -s $users ]]; then
+    password=$(ORVEX_USERS=$users "$top/tools/orvex-passwd" --random orvex)
+    (umask 077 && echo "rtsp://orvex:$password@$address/$query" >"$conf/play-url")
+    echo "run: made $users with the user \"orvex\" (change the password: tools/orvex-passwd orvex)"
+  fi
+  { echo "# Made by tools/run.sh at every start from $top/platform/host/orvex.prop: edit that one."
+    cat "$top/platform/host/orvex.prop"
+    echo "kv.orvex.auth=$users"; } >"$conf/orvex.prop"
+  export ORVEX_PROP_FILE=$conf/orvex.prop
+  if [[ -s $conf/play-url ]]; then
+    url=$(sed "s|@[^/]*/|@$address/|" "$conf/play-url")
+  else
+    url="rtsp://USER:PASSWORD@$address/$query"
+  fi
+fi
 export ORVEX_PROP_FILE="${ORVEX_PROP_FILE:-$top/platform/host/orvex.prop}"
-url="rtsp://127.0.0.1/skyvo.0?width=1280&height=720&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"
 if [[ $(id -u) -ne 0 ]] && ! getcap "$top/build/orvex" 2>/dev/null | grep -q cap_net_bind_service; then
   echo "run: orvex listens on port 554, which needs privileges on Linux. Either run as root:"
   echo "       sudo ORVEX_PROP_FILE=$ORVEX_PROP_FILE $top/build/orvex"
@@ -16,5 +41,5 @@ if [[ $(id -u) -ne 0 ]] && ! getcap "$top/build/orvex" 2>/dev/null | grep -q cap
 fi
 echo "run: starting orvex; play it with"
 echo "       ffplay -rtsp_transport udp '$url'"
-echo "     (stop with Ctrl-C or SIGTERM)"
+echo "     (stop with Ctrl-C or SIGTERM; ORVEX_AUTH=off $0 runs without passwords)"
 exec "$top/build/orvex" "$@"

@@ -7,6 +7,7 @@
 #include <thread>
 #include <vector>
 
+#include "auth/Digest.h"
 #include "capture/LivecameraResolution.h"
 #include "capture/livepipmanager.h"
 #include "platform/fake/FakePlatform.h"
@@ -562,3 +563,122 @@ TEST_F(ServerTest, OutOfRangeTrackNumbersAnswerStreamNotFound) {
             << track;
     }
 }
+
+namespace {
+
+// Who may watch: a credentials file (orvex:orvex:pw) and an allow-list of 127.0.0.0/30.
+class AccessTest : public ServerTest {
+protected:
+    void SetUp() override {
+        users = ::testing::TempDir() + "orvex-users-" + std::to_string(getpid());
+        FILE* f = fopen(users.c_str(), "w");
+        ASSERT_NE(f, nullptr);
+        fputs("orvex:orvex:2f5dc0319c3279451ae1c1d7fd646060\n", f);
+        fclose(f);
+        fake.properties.Set("kv.orvex.auth", users);
+        fake.properties.Set("kv.orvex.allow", "127.0.0.0/30");
+        ServerTest::SetUp();
+    }
+    void TearDown() override {
+        ServerTest::TearDown();
+        unlink(users.c_str());
+    }
+    // The nonce of a 401 answer, checking the answer's shape on the way (a Session line comes
+    // between CSeq and the challenge once the client has one).
+    static std::string NonceOf(const std::string& answer, const std::string& cseq) {
+        const std::string status = "RTSP/1.0 401 Unauthorized\r\nCSeq: " + cseq + "\r\n";
+        const std::string challenge = "WWW-Authenticate: Digest realm=\"orvex\", nonce=\"";
+        EXPECT_EQ(answer.compare(0, status.size(), status), 0) << answer;
+        size_t at = answer.find(challenge);
+        if (at == std::string::npos) {
+            ADD_FAILURE() << answer;
+            return "";
+        }
+        at += challenge.size();
+        EXPECT_EQ(answer.substr(at + 48), "\"\r\n\r\n") << answer;
+        return answer.substr(at, 48);
+    }
+    static std::string Authorization(const std::string& method, const std::string& uri,
+                                     const std::string& nonce, const char* password = "pw") {
+        auth::DigestFields f;
+        f.username = "orvex";
+        f.realm = "orvex";
+        f.nonce = nonce;
+        f.uri = uri;
+        std::string response =
+            auth::DigestExpectedResponse(auth::DigestHa1("orvex", "orvex", password), method, f);
+        return "Authorization: Digest username=\"orvex\", realm=\"orvex\", nonce=\"" + nonce +
+               "\", uri=\"" + uri + "\", response=\"" + response + "\"\r\n";
+    }
+
+    std::string users;
+};
+
+TEST_F(AccessTest, EveryRequestButOptionsNeedsADigestAnswer) {
+    RtspClient c("127.0.0.1", port);
+    EXPECT_EQ(c.Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n"),
+              "RTSP/1.0 200 OK\r\nCSeq: 1\r\n"
+              "Public: OPTIONS, DESCRIBE, SETUP, TEARDOWN, PLAY, PAUSE,GET_PARAMETER\r\n\r\n");
+    // A PLAY without credentials is refused and starts nothing.
+    NonceOf(c.Exchange("PLAY " + url + " RTSP/1.0\r\nCSeq: 2\r\n\r\n"), "2");
+    const std::string nonce =
+        NonceOf(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 3\r\n\r\n"), "3");
+    EXPECT_TRUE(RecordedCalls().empty());
+    EXPECT_EQ(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 4\r\n" +
+                         "Authorization: Basic b3J2ZXg6cHc=\r\n\r\n")
+                  .compare(0, 25, "RTSP/1.0 401 Unauthorized"),
+              0);
+    EXPECT_EQ(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 5\r\n" +
+                         "Authorization: Digest username=\"orvex\r\n\r\n"),
+              "RTSP/1.0 400 Bad Request\r\nCSeq: 5\r\n\r\n");
+    const std::string answer = c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 6\r\n" +
+                                          Authorization("DESCRIBE", url, nonce) + "\r\n");
+    EXPECT_EQ(answer.compare(0, 29, "RTSP/1.0 200 OK\r\nCSeq: 6\r\nSer"), 0) << answer;
+    EXPECT_NE(answer.find("m=video 0 RTP/AVP 96"), std::string::npos);
+    const std::string track = url + "/trackID=1";
+    EXPECT_EQ(c.Exchange("SETUP " + track + " RTSP/1.0\r\nCSeq: 7\r\n" +
+                         Authorization("SETUP", track, nonce) +
+                         "Transport: RTP/AVP;unicast;client_port=5000-5001\r\n\r\n")
+                  .compare(0, 26, "RTSP/1.0 200 OK\r\nCSeq: 7\r\n"),
+              0);
+    // The answer for one method does not serve another.
+    NonceOf(c.Exchange("PLAY " + url + " RTSP/1.0\r\nCSeq: 8\r\n" +
+                       Authorization("DESCRIBE", url, nonce) + "\r\n"),
+            "8");
+    EXPECT_TRUE(RecordedCalls().empty());
+    EXPECT_EQ(c.Exchange("PLAY " + url + " RTSP/1.0\r\nCSeq: 9\r\n" +
+                         Authorization("PLAY", url, nonce) + "\r\n")
+                  .compare(0, 26, "RTSP/1.0 200 OK\r\nCSeq: 9\r\n"),
+              0);
+    EXPECT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+}
+
+TEST_F(AccessTest, TenWrongAnswersLockOneAddressAndTheListKeepsOthersOut) {
+    {
+        RtspClient guesser("127.0.0.2", port);
+        const std::string nonce =
+            NonceOf(guesser.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n"), "1");
+        for (int i = 2; i <= 11; ++i) {
+            const std::string n = std::to_string(i);
+            NonceOf(guesser.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: " + n + "\r\n" +
+                                     Authorization("DESCRIBE", url, nonce, n.c_str()) + "\r\n"),
+                    n);
+        }
+        EXPECT_TRUE(guesser.ClosedWithoutAnswer());  // the tenth failure ends the connection
+    }
+    // Locked out, even with the right password; another address is not.
+    RtspClient locked("127.0.0.2", port);
+    EXPECT_TRUE(locked.ClosedWithoutAnswer());
+    RtspClient neighbour("127.0.0.3", port);
+    const std::string nonce =
+        NonceOf(neighbour.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n"), "1");
+    EXPECT_EQ(neighbour
+                  .Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 2\r\n" +
+                            Authorization("DESCRIBE", url, nonce) + "\r\n")
+                  .compare(0, 15, "RTSP/1.0 200 OK"),
+              0);
+    RtspClient outsider("127.0.0.4", port);
+    EXPECT_TRUE(outsider.ClosedWithoutAnswer());
+}
+
+}  // namespace
