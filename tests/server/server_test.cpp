@@ -681,4 +681,20 @@ TEST_F(AccessTest, TenWrongAnswersLockOneAddressAndTheListKeepsOthersOut) {
     EXPECT_TRUE(outsider.ClosedWithoutAnswer());
 }
 
+// kv.orvex.bind: one address, or nothing at all when the value is not an address.
+TEST(ListenAddressTest, TheListenerBindsTheNamedAddressOnly) {
+    platform::fake::FakePlatform fake;
+    for (const char* bad : {"localhost", "127.0.0.256", "127.0.0.1 "}) {
+        fake.properties.Set("kv.orvex.bind", bad);
+        skyvo_rtsp_sever_init();
+        EXPECT_EQ(skyvo_rtsp_sever_open(static_cast<unsigned>(FreePort())), 1) << bad;
+    }
+    fake.properties.Set("kv.orvex.bind", "127.0.0.2");
+    const int port = FreePort();
+    skyvo_rtsp_sever_init();
+    ASSERT_EQ(skyvo_rtsp_sever_open(static_cast<unsigned>(port)), 0);
+    EXPECT_FALSE(RtspClient("127.0.0.1", port).connected());  // it connects to 127.0.0.1
+    skyvo_rtsp_sever_close();
+}
+
 }  // namespace
