@@ -8,17 +8,9 @@
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
-"$top/tools/install-deps.sh" e2e
-
-work=$(mktemp -d)
-export ORVEX_LOG="file:$work/orvex.log"
-export ORVEX_BINDER_DIR="$work/binder"
+name=e2e-auth
+source "$top/tools/e2e-lib.sh"
 query="skyvo.0?width=640&height=480&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"
-fail() { echo "e2e-auth: FAILED: $*"; tail -n 20 "$work/orvex.log" || true; exit 1; }
-pass=0
-ok() { echo "e2e-auth: ok: $*"; pass=$((pass + 1)); }
-pid=
-trap '[[ -n $pid ]] && kill -9 $pid 2>/dev/null || true' EXIT
 # Log lines about one client address since the log had `$1` bytes.
 refusals() { tail -c +"$(($1 + 1))" "$work/orvex.log" | grep -c "$2 refused: $3" || true; }
 log_size() { stat -c %s "$work/orvex.log"; }
@@ -27,14 +19,7 @@ password=$(ORVEX_USERS="$work/users" "$top/tools/orvex-passwd" --random orvex)
 { cat "$top/platform/host/orvex.prop"
   echo "kv.orvex.auth=$work/users"
   echo "kv.orvex.allow=127.0.0.0/30"; } >"$work/auth.prop"
-ORVEX_PROP_FILE="$work/auth.prop" "$build/orvex" >"$work/stdout" 2>&1 &
-pid=$!
-for _ in $(seq 300); do
-  (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break
-  sleep 0.1
-done
-sleep 0.5
-kill -0 "$pid" 2>/dev/null || fail "orvex did not start"
+start env ORVEX_PROP_FILE="$work/auth.prop" "$build/orvex"
 grep -q "Digest authentication on, realm \"orvex\"" "$work/orvex.log" || fail "authentication not on"
 
 log=$(timeout -k 5 25 ffmpeg -hide_banner -nostats -rtsp_transport udp \

@@ -10,31 +10,11 @@
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
-"$top/tools/install-deps.sh" e2e
-
-work=$(mktemp -d)
-export ORVEX_LOG="file:$work/orvex.log"
-export ORVEX_BINDER_DIR="$work/binder"
+name=e2e
+source "$top/tools/e2e-lib.sh"
 export XDG_CONFIG_HOME="$work/config"  # where run.sh keeps the credentials it makes
 creds=
 url() { echo "rtsp://${creds}127.0.0.1/skyvo.0?width=$1&height=$2&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"; }
-fail() { echo "e2e: FAILED: $*"; tail -n 20 "$work/stdout" || true; exit 1; }
-pass=0
-ok() { echo "e2e: ok: $*"; pass=$((pass + 1)); }
-pid=
-trap '[[ -n $pid ]] && kill -9 $pid 2>/dev/null || true' EXIT
-
-# Starts orvex with the given command and waits until it listens on port 554.
-start() {
-  "$@" >"$work/stdout" 2>"$work/stderr" &
-  pid=$!
-  for _ in $(seq 300); do
-    (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break
-    sleep 0.1
-  done
-  sleep 0.5
-  kill -0 "$pid" 2>/dev/null || fail "orvex did not start (port 554 in use, or no privileges?)"
-}
 
 # SIGTERM while a client plays: a clean exit within 15 s with the elapsed time line.
 stop() {

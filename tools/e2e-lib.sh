@@ -1,0 +1,24 @@
+# Shared by the end-to-end scripts: sourced after `name`, `top` and `build` are set. Makes a
+# work folder with the service's log and binder sockets in it, the ok/fail reporters, and a
+# start that waits until the service listens on port 554.
+"$top/tools/install-deps.sh" e2e
+work=$(mktemp -d)
+export ORVEX_LOG="file:$work/orvex.log"
+export ORVEX_BINDER_DIR="$work/binder"
+pass=0
+fail() { echo "$name: FAILED: $*"; tail -n 20 "$work/stdout" "$work/orvex.log" 2>/dev/null || true; exit 1; }
+ok() { echo "$name: ok: $*"; pass=$((pass + 1)); }
+pid=
+trap '[[ -n $pid ]] && kill -9 $pid 2>/dev/null || true' EXIT
+
+# Starts orvex with the given command and waits until it listens on port 554.
+start() {
+  "$@" >"$work/stdout" 2>"$work/stderr" &
+  pid=$!
+  for _ in $(seq 300); do
+    (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break
+    sleep 0.1
+  done
+  sleep 0.5
+  kill -0 "$pid" 2>/dev/null || fail "orvex did not start (port 554 in use, or no privileges?)"
+}
