@@ -44,6 +44,9 @@ constexpr Known kKnown[] = {
 };
 constexpr size_t kKnownCount = sizeof(kKnown) / sizeof(kKnown[0]);
 constexpr size_t kRequired = 5;  // username through response
+constexpr size_t kQop = 6, kNc = 7, kCnonce = 8;
+static_assert(kKnown[kQop].name == "qop" && kKnown[kNc].name == "nc" &&
+              kKnown[kCnonce].name == "cnonce");
 
 // Reads one value at `*pos` into `*value` (unescaped), leaving `*pos` after it. False when it
 // is malformed or too long.
@@ -128,10 +131,10 @@ DigestParse ParseDigestAuthorization(std::string_view value, DigestFields* out) 
         if (!seen[k]) return DigestParse::kMalformed;
     if (!out->algorithm.empty() && !EqualIgnoringCase(out->algorithm, "MD5"))
         return DigestParse::kMalformed;
-    if (seen[6]) {
+    if (seen[kQop]) {
         // auth-int would need the body's digest; RTSP requests here carry no body worth it.
         if (!EqualIgnoringCase(out->qop, "auth")) return DigestParse::kMalformed;
-        if (!seen[7] || !seen[8]) return DigestParse::kMalformed;
+        if (!seen[kNc] || !seen[kCnonce]) return DigestParse::kMalformed;
     }
     return DigestParse::kOk;
 }
