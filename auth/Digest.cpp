@@ -1,129 +1,140 @@
 #include "auth/Digest.h"
 
+#include <cstddef>
+
 #include "auth/Md5.h"
 
 namespace auth {
-
 namespace {
 
+// Bounds on what a client may send: real headers are a few hundred bytes; these keep a hostile
+// one from costing more than a few kilobytes of copies.
 constexpr size_t kMaxHeader = 4096;
-constexpr size_t kMaxValue = 512;
+constexpr size_t kMaxFieldValue = 512;
 
 bool IsBlank(char c) { return c == ' ' || c == '\t'; }
 
+// NUL, CR, LF and the other control bytes would cut or split a value when it reaches a log line
+// or a C string; tab is a blank and allowed.
+bool IsControl(char c) {
+    const unsigned char u = static_cast<unsigned char>(c);
+    return (u < 0x20 && c != '\t') || u == 0x7f;
+}
+
 char Lower(char c) { return c >= 'A' && c <= 'Z' ? static_cast<char>(c - 'A' + 'a') : c; }
 
-bool SameWord(std::string_view a, std::string_view b) {
+bool EqualIgnoringCase(std::string_view a, std::string_view b) {
     if (a.size() != b.size()) return false;
-    for (size_t i = 0; i < a.size(); ++i) {
+    for (size_t i = 0; i < a.size(); ++i)
         if (Lower(a[i]) != Lower(b[i])) return false;
-    }
     return true;
 }
 
-// Reads the auth-params one by one; every step moves forward, so the work is linear.
-class ParamReader {
-public:
-    explicit ParamReader(std::string_view text) : m_text(text) {}
-
-    enum Step { kParam, kEnd, kBad };
-
-    Step Next(std::string_view* name, std::string* value) {
-        // Separators: blanks and empty list elements.
-        while (m_at < m_text.size() && (IsBlank(m_text[m_at]) || m_text[m_at] == ',')) ++m_at;
-        if (m_at == m_text.size()) return kEnd;
-        size_t start = m_at;
-        while (m_at < m_text.size() && m_text[m_at] != '=' && m_text[m_at] != ',' &&
-               !IsBlank(m_text[m_at]) && m_text[m_at] != '"') {
-            ++m_at;
-        }
-        *name = m_text.substr(start, m_at - start);
-        SkipBlanks();
-        if (name->empty() || m_at == m_text.size() || m_text[m_at] != '=') return kBad;
-        ++m_at;
-        SkipBlanks();
-        value->clear();
-        if (m_at < m_text.size() && m_text[m_at] == '"') {
-            if (!Quoted(value)) return kBad;
-        } else {
-            while (m_at < m_text.size() && m_text[m_at] != ',' && !IsBlank(m_text[m_at])) {
-                if (m_text[m_at] == '"') return kBad;  // a quote inside a token
-                value->push_back(m_text[m_at++]);
-            }
-        }
-        if (value->size() > kMaxValue) return kBad;
-        // After a value: blanks, then a comma or the end.
-        SkipBlanks();
-        if (m_at < m_text.size() && m_text[m_at] != ',') return kBad;
-        return kParam;
-    }
-
-private:
-    void SkipBlanks() {
-        while (m_at < m_text.size() && IsBlank(m_text[m_at])) ++m_at;
-    }
-    bool Quoted(std::string* value) {
-        ++m_at;  // the opening quote
-        while (m_at < m_text.size()) {
-            char c = m_text[m_at++];
-            if (c == '"') return true;
-            if (c == '\\') {
-                if (m_at == m_text.size()) return false;
-                c = m_text[m_at++];
-            }
-            if (value->size() <= kMaxValue) value->push_back(c);  // one past the bound is enough
-        }
-        return false;  // unterminated
-    }
-
-    std::string_view m_text;
-    size_t m_at = 0;
+// The known parameters, in the order of DigestFields.
+struct Known {
+    std::string_view name;
+    std::string DigestFields::*field;
 };
+constexpr Known kKnown[] = {
+    {"username", &DigestFields::username}, {"realm", &DigestFields::realm},
+    {"nonce", &DigestFields::nonce},       {"uri", &DigestFields::uri},
+    {"response", &DigestFields::response}, {"algorithm", &DigestFields::algorithm},
+    {"qop", &DigestFields::qop},           {"nc", &DigestFields::nc},
+    {"cnonce", &DigestFields::cnonce},     {"opaque", &DigestFields::opaque},
+};
+constexpr size_t kKnownCount = sizeof(kKnown) / sizeof(kKnown[0]);
+constexpr size_t kRequired = 5;  // username through response
+constexpr size_t kQop = 6, kNc = 7, kCnonce = 8;
+static_assert(kKnown[kQop].name == "qop" && kKnown[kNc].name == "nc" &&
+              kKnown[kCnonce].name == "cnonce");
+
+// Reads one value at `*pos` into `*value` (unescaped), leaving `*pos` after it. False when it
+// is malformed or too long.
+bool ReadValue(std::string_view text, size_t* pos, std::string* value) {
+    size_t p = *pos;
+    if (p < text.size() && text[p] == '"') {
+        ++p;
+        for (;;) {
+            if (p == text.size()) return false;  // unterminated
+            char c = text[p++];
+            if (c == '"') break;
+            if (c == '\\') {
+                if (p == text.size()) return false;
+                c = text[p++];
+            }
+            if (IsControl(c) || value->size() == kMaxFieldValue) return false;
+            value->push_back(c);
+        }
+    } else {
+        const size_t start = p;
+        while (p < text.size() && !IsBlank(text[p]) && text[p] != ',') {
+            const char c = text[p];
+            if (c == '"' || IsControl(c)) return false;
+            ++p;
+        }
+        // An empty token is no value at all ("nc=,").
+        if (p == start || p - start > kMaxFieldValue) return false;
+        value->assign(text.substr(start, p - start));
+    }
+    *pos = p;
+    return true;
+}
 
 }  // namespace
 
 DigestParse ParseDigestAuthorization(std::string_view value, DigestFields* out) {
-    static constexpr std::string_view kScheme = "digest";
-    if (value.size() <= kScheme.size() || !SameWord(value.substr(0, kScheme.size()), kScheme) ||
-        !IsBlank(value[kScheme.size()])) {
-        return value.size() == kScheme.size() && SameWord(value, kScheme) ? DigestParse::kMalformed
-                                                                          : DigestParse::kNotDigest;
-    }
-    if (value.size() > kMaxHeader) return DigestParse::kMalformed;
     *out = DigestFields{};
-    struct Known {
-        std::string_view name;
-        std::string* field;
-        bool seen;
-    } known[] = {
-        {"username", &out->username, false}, {"realm", &out->realm, false},
-        {"nonce", &out->nonce, false},       {"uri", &out->uri, false},
-        {"response", &out->response, false}, {"algorithm", &out->algorithm, false},
-        {"qop", &out->qop, false},           {"nc", &out->nc, false},
-        {"cnonce", &out->cnonce, false},     {"opaque", &out->opaque, false},
-    };
-    ParamReader reader(value.substr(kScheme.size()));
-    std::string_view name;
-    std::string text;
+    size_t pos = 0;
+    while (pos < value.size() && IsBlank(value[pos])) ++pos;
+    constexpr std::string_view kScheme = "Digest";
+    if (value.size() - pos <= kScheme.size() ||
+        !EqualIgnoringCase(value.substr(pos, kScheme.size()), kScheme) ||
+        !IsBlank(value[pos + kScheme.size()]))
+        return DigestParse::kNotDigest;
+    if (value.size() > kMaxHeader) return DigestParse::kMalformed;
+    pos += kScheme.size();
+
+    bool seen[kKnownCount] = {};
+    std::string unknown;  // values of parameters we skip, parsed for their shape only
     for (;;) {
-        ParamReader::Step step = reader.Next(&name, &text);
-        if (step == ParamReader::kBad) return DigestParse::kMalformed;
-        if (step == ParamReader::kEnd) break;
-        for (Known& k : known) {
-            if (!SameWord(name, k.name)) continue;
-            if (k.seen) return DigestParse::kMalformed;  // repeated
-            k.seen = true;
-            *k.field = text;
-        }
-    }
-    for (int i = 0; i < 5; ++i) {  // username, realm, nonce, uri, response
-        if (!known[i].seen) return DigestParse::kMalformed;
-    }
-    if (known[5].seen && !SameWord(out->algorithm, "MD5")) return DigestParse::kMalformed;
-    if (known[6].seen) {
-        if (!SameWord(out->qop, "auth") || !known[7].seen || !known[8].seen) {
+        while (pos < value.size() && (IsBlank(value[pos]) || value[pos] == ',')) ++pos;
+        if (pos == value.size()) break;
+
+        const size_t name_start = pos;
+        while (pos < value.size() && !IsBlank(value[pos]) && value[pos] != '=' &&
+               value[pos] != ',' && value[pos] != '"' && !IsControl(value[pos]))
+            ++pos;
+        const std::string_view name = value.substr(name_start, pos - name_start);
+        while (pos < value.size() && IsBlank(value[pos])) ++pos;
+        if (name.empty() || pos == value.size() || value[pos] != '=')
             return DigestParse::kMalformed;
+        ++pos;
+        while (pos < value.size() && IsBlank(value[pos])) ++pos;
+
+        std::string* target = &unknown;
+        for (size_t k = 0; k < kKnownCount; ++k) {
+            if (!EqualIgnoringCase(name, kKnown[k].name)) continue;
+            if (seen[k]) return DigestParse::kMalformed;
+            seen[k] = true;
+            target = &(out->*kKnown[k].field);
+            break;
         }
+        target->clear();
+        if (!ReadValue(value, &pos, target)) return DigestParse::kMalformed;
+
+        // Only blanks may stand between a value and the next comma.
+        while (pos < value.size() && IsBlank(value[pos])) ++pos;
+        if (pos < value.size() && value[pos] != ',') return DigestParse::kMalformed;
+    }
+
+    for (size_t k = 0; k < kRequired; ++k)
+        if (!seen[k]) return DigestParse::kMalformed;
+    if (!out->algorithm.empty() && !EqualIgnoringCase(out->algorithm, "MD5"))
+        return DigestParse::kMalformed;
+    if (seen[kQop]) {
+        // auth-int would need the body's digest; RTSP requests here carry no body worth it.
+        if (!EqualIgnoringCase(out->qop, "auth")) return DigestParse::kMalformed;
+        if (!seen[kNc] || !seen[kCnonce]) return DigestParse::kMalformed;
     }
     return DigestParse::kOk;
 }
@@ -137,15 +148,19 @@ std::string DigestHa1(std::string_view user, std::string_view realm, std::string
 
 std::string DigestExpectedResponse(std::string_view ha1, std::string_view method,
                                    const DigestFields& fields) {
-    std::string a2;
-    a2.append(method).append(":").append(fields.uri);
     std::string text;
+    text.reserve(method.size() + fields.uri.size() + 1);
+    text.append(method).append(":").append(fields.uri);
+    const std::string ha2 = Md5Hex(text);
+
+    text.clear();
     text.append(ha1).append(":").append(fields.nonce).append(":");
     if (!fields.qop.empty()) {
-        text.append(fields.nc).append(":").append(fields.cnonce).append(":").append(fields.qop);
-        text.append(":");
+        // The client hashes qop as it spelled it, so it goes in unchanged.
+        text.append(fields.nc).append(":").append(fields.cnonce).append(":");
+        text.append(fields.qop).append(":");
     }
-    text.append(Md5Hex(a2));
+    text.append(ha2);
     return Md5Hex(text);
 }
 

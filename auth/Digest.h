@@ -26,7 +26,13 @@ enum class DigestParse {
                  // field, an algorithm or qop we do not speak, a value over the length bound
 };
 
-// `value` is what follows "Authorization:" with any leading blanks.
+// `value` is what follows "Authorization:" with any leading blanks, without the line end.
+// The scheme is matched in any case and must be followed by a blank. Parameter values are
+// tokens or quoted strings (backslash escapes); names are matched in any case. A control byte
+// (NUL, CR, LF, ...; tab excepted) anywhere in a value is refused as kMalformed rather than
+// kept: values reach log lines and C strings, where it would cut or split them. Values are
+// bounded to 512 bytes and the whole header to 4096; the work is linear in its length.
+// Thread contract: pure functions, any thread.
 DigestParse ParseDigestAuthorization(std::string_view value, DigestFields* out);
 
 // HA1 = MD5(user:realm:password), the line format of an htdigest file.
