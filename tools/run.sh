@@ -7,7 +7,7 @@ cmake -S "$top" -B "$top/build" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev
 cmake --build "$top/build"
 query="skyvo.0?width=1280&height=720&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"
 # The address other machines reach this one at (the URL is for them; 127.0.0.1 also works here).
-address=$(ip -4 route get 192.0.2.1 2>/dev/null | sed -n 's/.* src \([0-9.]*\).*/\1/p' | head -n 1)
+address=$( (ip -4 route get 192.0.2.1 2>/dev/null || true) | sed -n 's/.* src \([0-9.]*\).*/\1/p')
 address=${address:-127.0.0.1}
 url="rtsp://$address/$query"
 if [[ -z ${ORVEX_PROP_FILE:-} && ${ORVEX_AUTH:-on} != off ]]; then
