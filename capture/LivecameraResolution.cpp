@@ -81,21 +81,36 @@ int set_video_resolution_support_more(unsigned width, unsigned height, unsigned 
     return result;
 }
 
+namespace {
+
+// The camera driver's own size numbers, not in size order.
+constexpr struct {
+    unsigned width, height;
+    int code;
+} kSizes[] = {
+    {640, 480, 3}, {720, 576, 0}, {320, 240, 1},  {480, 320, 5},  {1280, 720, 12},
+    {720, 480, 2}, {720, 400, 9}, {320, 176, 11}, {640, 368, 10}, {1920, 1080, 13},
+};
+
+}  // namespace
+
 int ResolutionCode(unsigned width, unsigned height, const char* board) {
-    // The camera driver's own size numbers, not in size order.
-    static const struct {
-        unsigned width, height;
-        int code;
-    } kSizes[] = {
-        {640, 480, 3}, {720, 576, 0}, {320, 240, 1},  {480, 320, 5},  {1280, 720, 12},
-        {720, 480, 2}, {720, 400, 9}, {320, 176, 11}, {640, 368, 10}, {1920, 1080, 13},
-    };
     for (const auto& s : kSizes) {
         if (s.width != width || s.height != height) continue;
         if (s.code == 13 && board != nullptr && strncmp(board, "tarvo", 5) == 0) return -1;
         return s.code;
     }
     return -1;
+}
+
+std::string AcceptedSizesText(const char* board) {
+    std::string text;
+    for (const auto& s : kSizes) {
+        if (ResolutionCode(s.width, s.height, board) < 0) continue;
+        if (!text.empty()) text += ", ";
+        text += std::to_string(s.width) + "x" + std::to_string(s.height);
+    }
+    return text;
 }
 
 int CheckCaptureResolution() {

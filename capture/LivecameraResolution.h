@@ -1,6 +1,7 @@
 #pragma once
 
 #include <atomic>
+#include <string>
 
 #include "capture/PlatformFlavour.h"
 
@@ -37,5 +38,7 @@ void get_platform_info();
 // The camera's code ("traveling-res") for a capture size, or -1 when the size is refused;
 // 1920x1080 is refused on boards whose name starts with "tarvo".
 int ResolutionCode(unsigned width, unsigned height, const char* board);
+// The sizes ResolutionCode accepts on `board`, as "640x480, 720x576, ...".
+std::string AcceptedSizesText(const char* board);
 // ResolutionCode of the stored size and board, logging the refusal.
 int CheckCaptureResolution();

@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "capture/LivecameraResolution.h"
 #include "platform/LogPort.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
@@ -118,6 +119,18 @@ bool RtspSession::Refused(int* type, int* result) {
     return true;
 }
 
+void RtspSession::WarnOfRefusedSize() {
+    // The answer stays 200 and the sound plays; without this line nobody learns why the
+    // picture does not.
+    const CaptureState& state = capture_state();
+    if (ResolutionCode(state.width, state.height, state.board) >= 0) return;
+    OrvexLogPriority(platform::kLogWarn, kTag,
+                     "%s asks for %ux%u, a size the capture refuses: no picture, sound only "
+                     "(accepted on %s: %s)",
+                     DottedAddress(m_response->GetConnectAddr()).c_str(), state.width, state.height,
+                     state.board, AcceptedSizesText(state.board).c_str());
+}
+
 bool RtspSession::TransportDescribe(std::string* sdp) {
     // rtsp://host/name.seconds?query: the text after the first '.' carries time and query.
     std::string name, time_text;
@@ -143,6 +156,7 @@ bool RtspSession::TransportDescribe(std::string* sdp) {
         m_response->ResponseError("RTSP/1.0 405  resolvration error !");
         return false;
     }
+    WarnOfRefusedSize();
     MediaSession* session = m_list->FindMediaSession(name.c_str());
     if (session == nullptr) {
         m_response->ResponseError("RTSP/1.0 404 File Url Not Found, Or In Incorrect Format");

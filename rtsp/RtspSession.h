@@ -45,6 +45,8 @@ private:
     bool StreamSetup(MediaStream* stream, unsigned* server_port, int* client_port);
     // The media session a PLAY or PAUSE names, answering 400 or 404 when there is none.
     MediaSession* NamedSession();
+    // One warning line when the stored capture size is one the capture will refuse.
+    void WarnOfRefusedSize();
     // Answers a request that may not be served; false when it may.
     bool Refused(int* type, int* result);
 

@@ -1,4 +1,6 @@
 #include <cstdlib>
+#include <fstream>
+#include <sstream>
 #include <string>
 
 #include "platform/Ports.h"
@@ -7,6 +9,7 @@
 #include "platform/host/HostLog.h"
 #include "platform/host/HostManagers.h"
 #include "platform/host/HostProperties.h"
+#include "platform/host/KnownProperties.h"
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
 
@@ -39,6 +42,18 @@ void InstallDefaultPorts() {
         return p;
     }();
     Install(ports);
+    // Once, with the log in place: keys that nothing reads are most likely misspelt.
+    static const bool checked = [] {
+        std::ifstream in(properties->path());
+        std::ostringstream text;
+        text << in.rdbuf();
+        if (in) {
+            host::WarnUnknownPropertyKeys(host::HostProperties::Parse(text.str()),
+                                          properties->path());
+        }
+        return true;
+    }();
+    (void)checked;
 }
 
 }  // namespace platform

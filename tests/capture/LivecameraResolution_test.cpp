@@ -51,6 +51,15 @@ TEST_F(ResolutionRulesTest, TableOfAcceptedSizes) {
     }
 }
 
+TEST_F(ResolutionRulesTest, AcceptedSizesAreListedForTheBoard) {
+    EXPECT_EQ(AcceptedSizesText("linux-host"),
+              "640x480, 720x576, 320x240, 480x320, 1280x720, 720x480, 720x400, 320x176, "
+              "640x368, 1920x1080");
+    EXPECT_EQ(AcceptedSizesText("tarvo9"),
+              "640x480, 720x576, 320x240, 480x320, 1280x720, 720x480, 720x400, 320x176, "
+              "640x368");
+}
+
 TEST_F(ResolutionRulesTest, RefusalsAreLoggedWithTheirTexts) {
     fake.properties.Set("ro.board.platform", "tarvo5");
     set_video_resolution_support_more(1920, 1080, 5, 6, 0, 0, 0, 0, 30);

@@ -10,6 +10,7 @@
 #include "platform/Ports.h"
 #include "platform/host/HostLog.h"
 #include "platform/host/HostProperties.h"
+#include "platform/host/KnownProperties.h"
 
 namespace {
 
@@ -140,6 +141,32 @@ TEST(HostPlatformTest, DefaultPortsFollowThePropertyFile) {
     unsetenv("ORVEX_PROP_FILE");
     unlink(props.c_str());
     unlink(log.c_str());
+}
+
+// A key that nothing reads is named with the known key it most likely meant.
+TEST(KnownPropertiesTest, MisspeltKeysPointToTheNearestKnownOne) {
+    const struct {
+        const char* key;
+        const char* nearest;
+    } cases[] = {
+        {"orvex.host.vidoe", "orvex.host.video"},  {"orvex.host.video.sbu", "orvex.host.video.sub"},
+        {"kv.orvex.wakeup", "kv.orvex.wake"},      {"kv.orvx.auth", "kv.orvex.auth"},
+        {"ro.board", "ro.board.platform"},         {"KV.ORVEX.LOG", "kv.orvex.log"},
+        {"orvex.host.audio ", "orvex.host.audio"}, {"kv.orvex.alow", "kv.orvex.allow"},
+    };
+    for (const auto& c : cases) {
+        EXPECT_EQ(platform::host::NearestKnownKey(c.key), c.nearest) << c.key;
+    }
+}
+
+// The shipped host properties use only keys that something reads.
+TEST(KnownPropertiesTest, TheShippedPropertiesHoldOnlyKnownKeys) {
+    std::map<std::string, std::string> values =
+        HostProperties::Parse(ReadFile(ORVEX_SHIPPED_PROPERTIES));
+    ASSERT_GT(values.size(), 5u);
+    EXPECT_EQ(platform::host::WarnUnknownPropertyKeys(values, ORVEX_SHIPPED_PROPERTIES), 0);
+    values["orvex.host.vidoe"] = "x11";
+    EXPECT_EQ(platform::host::WarnUnknownPropertyKeys(values, "p"), 1);
 }
 
 }  // namespace

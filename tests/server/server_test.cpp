@@ -697,4 +697,29 @@ TEST(ListenAddressTest, TheListenerBindsTheNamedAddressOnly) {
     skyvo_rtsp_sever_close();
 }
 
+// A size the capture refuses is still answered 200 (the sound plays); the reason is one warning
+// naming the client and the sizes that would work.
+TEST_F(ServerTest, ARefusedCaptureSizeIsOneWarningNamingTheClient) {
+    RtspClient c("127.0.0.2", port);
+    std::string refused = url;
+    refused.replace(refused.find("width=640&height=480"), 20, "width=800&height=600");
+    ASSERT_EQ(c.Exchange("DESCRIBE " + refused + " RTSP/1.0\r\nCSeq: 1\r\n\r\n")
+                  .compare(0, 15, "RTSP/1.0 200 OK"),
+              0);
+    std::vector<std::string> warnings;
+    for (const auto& e : fake.log.Entries()) {
+        if (e.priority >= platform::kLogWarn) warnings.push_back(e.text);
+    }
+    ASSERT_EQ(warnings.size(), 1u);
+    EXPECT_EQ(warnings[0].rfind("127.0.0.2 asks for 800x600, a size the capture refuses: no "
+                                "picture, sound only (accepted on android: 640x480, ",
+                                0),
+              0u)
+        << warnings[0];
+    EXPECT_TRUE(c.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 2\r\n\r\n").size() > 0);
+    size_t after = 0;
+    for (const auto& e : fake.log.Entries()) after += e.priority >= platform::kLogWarn ? 1 : 0;
+    EXPECT_EQ(after, 1u);  // an accepted size adds none
+}
+
 }  // namespace
