@@ -6,6 +6,7 @@
 #include <memory>
 #include <vector>
 
+#include "capture/AudioSampleClock.h"
 #include "capture/DumpFile.h"
 #include "capture/LivecameraResolution.h"
 #include "capture/orvexAudioRecord.h"
@@ -27,6 +28,7 @@ constexpr int kPxAttrCaptureSource = 5;
 constexpr int kUnknownResultsMax = 64;
 // When the encoder waits for PCM writes, only a lost wake-up would need this bound.
 constexpr unsigned kEncoderIdleBoundMs = 100;
+constexpr unsigned kAacFrameSamples = 1024;  // per channel, in every AAC-LC frame
 
 struct Worker {
     pthread_t handle{};
@@ -216,6 +218,8 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
     static unsigned char input[kPcmBlockBytes];
     static unsigned char output[kPcmBlockBytes];
     const bool wake_on_write = Global_Config::instance()->wake_on_write();
+    const bool by_samples = Global_Config::instance()->audio_clock_samples();
+    AudioSampleClock clock(static_cast<unsigned>(params.sampleRate), kAacFrameSamples);
     bool ended = false;
     while (!ended && run_flag->load(std::memory_order_relaxed) != 0) {
         if (g_pcm_ring.read(input, kPcmBlockBytes) < 1) {
@@ -232,7 +236,9 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
             VO_U32 r = api.GetOutputData(codec, &out, &info);
             if (r == kVoErrNone) {
                 if (get_write_aac_file()) Test_write_audio_aac(output, out.Length);
-                skyvo_add_mp3_data(output, static_cast<unsigned>(out.Length), 0);
+                // 0 lets the ring stamp the frame at write time, as on the television.
+                skyvo_add_mp3_data(output, static_cast<unsigned>(out.Length),
+                                   by_samples ? clock.Next(GetTimeStampMillsec()) : 0);
             } else if (r == kVoErrInputBufferSmall) {
                 break;
             } else if (r == kVoErrOutputBufferSmall) {

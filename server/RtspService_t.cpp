@@ -39,6 +39,7 @@ bool RtspService_t::Open(unsigned port) {
     m_config->m_rtsp_port = port;
     m_config->read_audio_payload_type();
     m_config->read_wake_mode();
+    m_config->read_audio_clock();
     m_config->read_latency_report();
     auto session = std::make_unique<MediaSession>("skyvo");
     // Video first: it becomes track 1, payload type 96 in the SDP.

@@ -80,6 +80,12 @@ void Global_Config::read_latency_report() {
                            std::memory_order_relaxed);
 }
 
+void Global_Config::read_audio_clock() {
+    m_audio_clock_samples.store(
+        ReadSwitch("kv.orvex.audioclock", "write", "samples", "audio is stamped at write time"),
+        std::memory_order_relaxed);
+}
+
 void Global_Config::mp3_config_ok() {
     m_audio_configured.store(1, std::memory_order_relaxed);
     if (m_video_configured.load(std::memory_order_relaxed) != 0) {

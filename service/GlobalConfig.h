@@ -54,6 +54,14 @@ public:
     // is logged and leaves it off. Called once, when the server opens.
     void read_latency_report();
     bool report_latency() const { return m_report_latency.load(std::memory_order_relaxed); }
+    // Takes the property kv.orvex.audioclock: "samples" stamps each AAC frame with the capture
+    // time of its first sample (so the RTP time advances by one frame's duration whatever the
+    // capture's block size); unset or "write", as on the television, stamps at write time.
+    // Anything else is logged and leaves write time. Called once, when the server opens.
+    void read_audio_clock();
+    bool audio_clock_samples() const {
+        return m_audio_clock_samples.load(std::memory_order_relaxed);
+    }
     // The sleep of the loops that only watch a run flag (the main and binder service loops).
     // Waiting for writes, they are woken instead: SIGTERM interrupts main's sleep, and the
     // service's stop notifies its thread; the second is only a bound.
@@ -97,6 +105,7 @@ private:
     std::atomic<bool> m_flag_sub{false};
     std::atomic<bool> m_wake_on_write{false};
     std::atomic<bool> m_report_latency{false};
+    std::atomic<bool> m_audio_clock_samples{false};
     TLock m_timestamp_lock;
     unsigned m_video_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;
     unsigned m_audio_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;

@@ -106,6 +106,9 @@ sleep 1
 
 packets 97
 sleep 1
+line=$(python3 "$top/tools/rtsp_check.py" stamps "$(url 640 480)" 10) || fail "audio time stamps: $line"
+ok "audio RTP time stamps step by one AAC frame: $line"
+sleep 1
 for size in "640 480" "1280 720" "1920 1080"; do
   measure $size
   sleep 1

@@ -7,6 +7,7 @@
                                           the host pattern's capture stamp to the decoded frame
     rtsp_check.py split URL [SECONDS]     the same delay cut in two: capture to the frame's last
                                           packet here, and that packet to the decoded frame
+    rtsp_check.py stamps URL [SECONDS]    the audio RTP time stamp steps (one AAC frame each)
     rtsp_check.py guess URL SOURCE        wrong passwords from SOURCE until the connection ends,
                                           then the URL's right one from there
 
@@ -365,6 +366,32 @@ def split(url, seconds):
     return 0
 
 
+def stamps(url, seconds):
+    """The audio RTP time stamp steps: one AAC frame is 1024 at 48 kHz, and the send loop's
+    millisecond rounding allows 1008-1056."""
+    video, audio = udp_pair(), udp_pair()
+    session = Session(url)
+    session.play([video.getsockname()[1], audio.getsockname()[1]])
+    audio.settimeout(1.0)
+    seen = []
+    end = time.time() + seconds
+    keep = time.time()
+    while time.time() < end:
+        try:
+            packet = audio.recv(2048)
+        except socket.timeout:
+            continue
+        seen.append(struct.unpack("!I", packet[4:8])[0])
+        if time.time() - keep > 4:
+            session.request("GET_PARAMETER", session.url)
+            keep = time.time()
+    steps = [(b - a) & 0xFFFFFFFF for a, b in zip(seen, seen[1:])]
+    outside = [s for s in steps if not 1008 <= s <= 1056]
+    print("audio_steps=%d outside_1008_1056=%d min=%d max=%d" %
+          (len(steps), len(outside), min(steps or [0]), max(steps or [0])))
+    return 0 if steps and not outside else 1
+
+
 def guess(url, source):
     """A scripted guesser from `source`: wrong passwords until the service ends the connection.
     Then one more connection from the same address with the right password (the URL's)."""
@@ -415,7 +442,8 @@ def main():
     if mode == "guess":
         sys.exit(guess(url, args[2]))
     seconds = float(args[2]) if len(args) > 2 else 10.0
-    modes = {"packets": packets, "measure": measure, "latency": latency, "split": split}
+    modes = {"packets": packets, "measure": measure, "latency": latency, "split": split,
+             "stamps": stamps}
     offset = os.path.getsize(log) if log and os.path.exists(log) else 0
     rc = modes[mode](url, seconds)
     if log:

@@ -118,8 +118,9 @@ TEST_F(GlobalConfigTest, AudioPayloadTypeProperty) {
     }
 }
 
-// The two-way switches: kv.orvex.wake ("event" makes idle loops wait for writes) and
-// kv.orvex.latency ("1" turns on the video sender's report). Anything but the two values or
+// The two-way switches: kv.orvex.wake ("event" makes idle loops wait for writes),
+// kv.orvex.latency ("1" turns on the video sender's report) and kv.orvex.audioclock
+// ("samples" stamps audio by its samples). Anything but the two values or
 // unset is logged once and leaves the switch off, as on the television.
 TEST_F(GlobalConfigTest, SwitchProperties) {
     struct Case {
@@ -147,6 +148,14 @@ TEST_F(GlobalConfigTest, SwitchProperties) {
          "yes",
          false,
          {"kv.orvex.latency=\"yes\" is neither 0 nor 1; no latency report"}},
+        {"kv.orvex.audioclock", nullptr, false, {}},
+        {"kv.orvex.audioclock", "write", false, {}},
+        {"kv.orvex.audioclock", "samples", true, {}},
+        {"kv.orvex.audioclock",
+         "sample",
+         false,
+         {"kv.orvex.audioclock=\"sample\" is neither write nor samples; audio is stamped at "
+          "write time"}},
     };
     for (const Case& c : cases) {
         const std::string what = std::string(c.key) + "=" + (c.value ? c.value : "(missing)");
@@ -156,10 +165,13 @@ TEST_F(GlobalConfigTest, SwitchProperties) {
         Global_Config* config = Global_Config::instance();
         config->read_wake_mode();
         config->read_latency_report();
-        bool wake = std::string(c.key) == "kv.orvex.wake";
-        EXPECT_EQ(config->wake_on_write(), wake && c.on) << what;
-        EXPECT_EQ(config->run_flag_poll_us(), wake && c.on ? 1000000u : 10000u) << what;
-        EXPECT_EQ(config->report_latency(), !wake && c.on) << what;
+        config->read_audio_clock();
+        const std::string key = c.key;
+        EXPECT_EQ(config->wake_on_write(), key == "kv.orvex.wake" && c.on) << what;
+        EXPECT_EQ(config->run_flag_poll_us(), key == "kv.orvex.wake" && c.on ? 1000000u : 10000u)
+            << what;
+        EXPECT_EQ(config->report_latency(), key == "kv.orvex.latency" && c.on) << what;
+        EXPECT_EQ(config->audio_clock_samples(), key == "kv.orvex.audioclock" && c.on) << what;
         EXPECT_EQ(fake.log.Texts("globalconfig"), c.log) << what;
     }
 }
