@@ -42,12 +42,17 @@ for _ in $(seq 100); do [[ -s "$work/display" ]] && break; sleep 0.1; done
 export DISPLAY=":$(cat "$work/display")"
 # No window manager paints the root window here, so a window as large as the screen shows
 # the colour.
-if [[ $mode != measure ]]; then
-  gst-launch-1.0 -q videotestsrc pattern=solid-color foreground-color=0xff$colour is-live=true \
+# Fills the screen with one colour (RGB hex), replacing the previous fill.
+drawer=
+paint() {
+  [[ -n $drawer ]] && { kill "$drawer" 2>/dev/null || true; wait "$drawer" 2>/dev/null || true; }
+  gst-launch-1.0 -q videotestsrc pattern=solid-color foreground-color=0xff$1 is-live=true \
     ! "video/x-raw,width=$screen_w,height=$screen_h,framerate=5/1" ! ximagesink \
     >"$work/window.log" 2>&1 &
-  pids+=($!)
-fi
+  drawer=$!
+  pids+=($drawer)
+}
+[[ $mode != measure ]] && paint "$colour"
 
 # A private sound server with only a null sink: its monitor is "what the machine plays".
 mkdir -p "$work/pulse"
@@ -122,23 +127,41 @@ if [[ $mode == measure ]]; then
   exit 0
 fi
 
-# Video: the mean colour of the decoded frames (each scaled to one pixel).
-timeout -k 5 40 ffmpeg -hide_banner -nostats -loglevel error -rtsp_transport udp \
-  -i "$(url 1280 720)" -map 0:v -t 5 -vf scale=1:1,format=rgb24 -fps_mode passthrough \
-  -f rawvideo "$work/rgb" \
-  || fail "ffmpeg (video) exit status"
-python3 - "$work/rgb" "$colour" <<'PY' || fail "colour"
+# Video: the mean colour of the decoded frames (each scaled to one pixel), which ffmpeg converts
+# with the colour description the stream carries: the screen's colour, then pure red, green,
+# blue and white at an HD and an SD size, each channel within the tolerance.
+colour_check() {  # width height colour tolerance
+  timeout -k 5 40 ffmpeg -y -hide_banner -nostats -loglevel error -rtsp_transport udp \
+    -i "$(url "$1" "$2")" -map 0:v -t 3 -vf scale=1:1,format=rgb24 -fps_mode passthrough \
+    -f rawvideo "$work/rgb" \
+    || fail "ffmpeg (video) exit status"
+  python3 - "$work/rgb" "$3" "$4" "$1x$2" <<'PY' || fail "colour #$3 at $1x$2"
 import sys
 data = open(sys.argv[1], "rb").read()
 want = bytes.fromhex(sys.argv[2])
 frames = [data[i:i + 3] for i in range(0, len(data) - 2, 3)][15:]  # skip the first 0.5 s
-if len(frames) < 60:
+if len(frames) < 40:
     sys.exit("only %d frames" % len(frames))
 mean = [sum(f[c] for f in frames) / len(frames) for c in range(3)]
-print("e2e-capture: ok: %d frames, mean colour #%02x%02x%02x (screen #%s)"
-      % (len(frames), *[round(m) for m in mean], sys.argv[2]))
-sys.exit(0 if all(abs(m - w) <= 12 for m, w in zip(mean, want)) else 1)
+print("e2e-capture: ok: %s: %d frames, mean colour #%02x%02x%02x (screen #%s)"
+      % (sys.argv[4], len(frames), *[round(m) for m in mean], sys.argv[2]))
+sys.exit(0 if all(abs(m - w) <= int(sys.argv[3]) for m, w in zip(mean, want)) else 1)
 PY
+  sleep 1
+}
+colour_check 1280 720 "$colour" 12
+for fill in ff0000 00ff00 0000ff ffffff; do
+  paint "$fill"
+  sleep 1
+  for size in "1280 720" "640 368"; do
+    colour_check $size "$fill" 8
+  done
+done
+ffprobe -v error -rtsp_transport udp -select_streams v -show_entries \
+  stream=color_range,color_space,color_transfer,color_primaries -of csv=p=0 "$(url 1280 720)" \
+  >"$work/probe" 2>&1 || true
+grep -q "^tv,smpte170m,smpte170m,smpte170m" "$work/probe" || fail "colour description: $(cat "$work/probe")"
+ok "colour description: $(cat "$work/probe") (BT.601, limited range, as converted)"
 sleep 1
 
 # Sound: the dominant frequency of the decoded PCM (1 s, mono, 8 kHz), by a plain DFT scan.

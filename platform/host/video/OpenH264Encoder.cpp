@@ -110,6 +110,16 @@ bool OpenH264Encoder::Open(int width, int height, int fps, int bitrate) {
     layer.iMaxSpatialBitrate = UNSPECIFIED_BIT_RATE;
     layer.uiProfileIdc = PRO_BASELINE;
     layer.sSliceArgument.uiSliceMode = SM_SINGLE_SLICE;
+    // Say which colours the samples mean: every host picture is BT.601 with limited range (the
+    // pattern's bars, and the live sources' conversion asks GStreamer for colorimetry=bt601).
+    // Without it players guess, and guess BT.709 for HD sizes: reds and greens shift.
+    layer.bVideoSignalTypePresent = true;
+    layer.uiVideoFormat = VF_UNDEF;
+    layer.bFullRange = false;
+    layer.bColorDescriptionPresent = true;
+    layer.uiColorPrimaries = CP_SMPTE170M;
+    layer.uiTransferCharacteristics = TRC_SMPTE170M;
+    layer.uiColorMatrix = CM_SMPTE170M;
     if (encoder_->InitializeExt(&p) != cmResultSuccess) {
         HostLogf(kLogError, "MediaRecorder: OpenH264 refuses %dx%d @ %d fps, %d bit/s", width,
                  height, fps, bitrate);
