@@ -61,16 +61,23 @@ load-module module-null-sink sink_name=orvexnull
 load-module module-native-protocol-unix auth-anonymous=1 socket=$work/pulse/native
 set-default-sink orvexnull
 PA
-HOME="$work/pulse" XDG_RUNTIME_DIR="$work/pulse" PULSE_RUNTIME_PATH="$work/pulse/rt" \
-  pulseaudio -n -F "$work/pulse/default.pa" --daemonize=no --exit-idle-time=-1 \
-  --disallow-exit --disable-shm=yes >"$work/pulse.log" 2>&1 &
-pids+=($!)
+# The sound server and a player of the tone on it; `sound_server` again restarts both.
+pulse= tone=
+sound_server() {
+  HOME="$work/pulse" XDG_RUNTIME_DIR="$work/pulse" PULSE_RUNTIME_PATH="$work/pulse/rt" \
+    pulseaudio -n -F "$work/pulse/default.pa" --daemonize=no --exit-idle-time=-1 \
+    --disallow-exit --disable-shm=yes >>"$work/pulse.log" 2>&1 &
+  pulse=$!
+  pids+=($pulse)
+  for _ in $(seq 100); do pactl info >/dev/null 2>&1 && break; sleep 0.1; done
+  pactl info >/dev/null 2>&1 || fail "pulseaudio did not start: $(tail -3 "$work/pulse.log")"
+  gst-launch-1.0 -q audiotestsrc is-live=true freq=$tone_hz volume=0.4 ! pulsesink \
+    >"$work/tone.log" 2>&1 &
+  tone=$!
+  pids+=($tone)
+}
 export PULSE_SERVER="unix:$work/pulse/native"
-for _ in $(seq 100); do pactl info >/dev/null 2>&1 && break; sleep 0.1; done
-pactl info >/dev/null 2>&1 || fail "pulseaudio did not start: $(tail -3 "$work/pulse.log")"
-gst-launch-1.0 -q audiotestsrc is-live=true freq=$tone_hz volume=0.4 ! pulsesink \
-  >"$work/tone.log" 2>&1 &
-pids+=($!)
+sound_server
 
 cp "$top/platform/host/orvex.prop" "$work/orvex.prop"
 cat >>"$work/orvex.prop" <<PROP
@@ -187,6 +194,57 @@ sys.exit(0 if abs(best - int(sys.argv[2])) <= 10 and rms > 300 else 1)
 PY
 
 grep -q "video from x11" "$work/orvex.log" || fail "orvex did not capture the screen"
+
+# The sound server goes away while a client plays, and comes back 4 s later: the picture keeps
+# its rate, the sound is silence meanwhile, and the tone returns without a new PLAY.
+paint "$colour"
+timeout -k 5 40 ffmpeg -y -hide_banner -nostats -loglevel info -rtsp_transport udp -i "$(url 640 480)" \
+  -map 0:v -t 20 -f null - -map 0:a -t 20 -ac 1 -ar 8000 -f s16le "$work/pcm" \
+  >"$work/restart.log" 2>&1 &
+client=$!
+sleep 4
+kill "$tone" "$pulse"
+wait "$tone" "$pulse" 2>/dev/null || true
+sleep 4
+sound_server
+wait "$client" || fail "ffmpeg across the sound server's restart: $(tail -3 "$work/restart.log")"
+frames=$(grep -o 'frame= *[0-9]*' "$work/restart.log" | tail -1 | grep -o '[0-9]*$')
+[[ ${frames:-0} -ge 500 ]] || fail "picture across the sound server's restart: ${frames:-0} frames in 20 s"
+python3 - "$work/pcm" "$tone_hz" <<'PY' || fail "sound after the sound server's restart"
+import math, struct, sys
+raw = open(sys.argv[1], "rb").read()
+pcm = struct.unpack("<%dh" % (len(raw) // 2), raw)
+def rms(a, b):
+    part = pcm[a * 8000:b * 8000]
+    return math.sqrt(sum(x * x for x in part) / max(1, len(part)))
+# seconds 1-3 the tone, 6-7 silence (server gone), 17-19 the tone again
+before, gone, after = rms(1, 3), rms(6, 7), rms(17, 19)
+print("e2e-capture: ok: sound server restarted: rms %.0f before, %.0f while gone, %.0f after" %
+      (before, gone, after))
+sys.exit(0 if before > 300 and gone < 50 and after > 300 else 1)
+PY
+grep -q "audio source pulse is back" "$work/orvex.log" || fail "no line saying the sound is back"
+ok "the picture kept going across the sound server's restart: $frames frames in 20 s"
+kill -TERM "$orvex"
+timeout 15 tail --pid="$orvex" -f /dev/null || fail "orvex still running 15 s after SIGTERM"
+sleep 1
+
+# A sound source that cannot start: the picture plays on its own, with one warning.
+sed -e 's/^orvex.host.video=x11$/orvex.host.video=pattern/' \
+  -e 's/^orvex.host.audio=pulse$/orvex.host.audio=pulse:nosuchsource/' "$work/orvex.prop" \
+  >"$work/nosource.prop"
+ORVEX_PROP_FILE="$work/nosource.prop" "$build/orvex" >"$work/stdout2" 2>&1 &
+orvex=$!
+pids+=($orvex)
+for _ in $(seq 100); do (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break; sleep 0.1; done
+sleep 0.5
+log=$(timeout -k 5 30 ffmpeg -hide_banner -nostats -rtsp_transport udp -i "$(url 640 480)" \
+  -t 10 -f null - 2>&1) || fail "pulse:nosuchsource: ffmpeg: $(tail -2 <<<"$log")"
+frames=$(grep -o 'frame= *[0-9]*' <<<"$log" | tail -1 | grep -o '[0-9]*$')
+[[ ${frames:-0} -ge 280 ]] || fail "pulse:nosuchsource: ${frames:-0} frames in 10 s"
+n=$(grep -c "audio source pulse:nosuchsource cannot start" "$work/orvex.log" || true)
+[[ $n -eq 1 ]] || fail "$n lines about pulse:nosuchsource"
+ok "pulse:nosuchsource: the picture plays alone ($frames frames in 10 s, with silence); one warning names the source"
 kill -TERM "$orvex"
 timeout 15 tail --pid="$orvex" -f /dev/null || fail "orvex still running 15 s after SIGTERM"
 echo "e2e-capture: passed"

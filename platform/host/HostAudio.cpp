@@ -3,6 +3,7 @@
 #include <dlfcn.h>
 #include <time.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstring>
 #include <memory>
@@ -45,21 +46,18 @@ public:
     int start() override {
         SourceChoice source = ChooseAudioSource();
         live_.reset();
+        wanted_.reset();
         mode_ = source.kind == SourceChoice::kTone ? Mode::kTone : Mode::kSilence;
-        if (source.live()) {
-            auto live = std::make_unique<GstSource>();
-            std::string error;
-            if (!live->start(AudioPipeline(source), &error)) {
-                std::string line =
-                    "AudioRecord: audio source " + source.text + " cannot start: " + error;
-                Log().Write(kLogIdSystem, kLogError, kTag, line.c_str());
-                return -1;
-            }
-            live_ = std::move(live);
-            source_text_ = source.text;
-            mode_ = Mode::kLive;
-        }
         restartClock();
+        if (source.live()) {
+            wanted_ = std::make_unique<SourceChoice>(source);
+            std::string error;
+            if (!openLive(&error)) {
+                // The picture goes on: this track sends silence and tries again.
+                Warn("cannot start: " + error + "; silence, trying again in 1 s");
+                retryFrom(kRetryFirstMs);
+            }
+        }
         stalled_ = false;
         started_ = true;
         return 0;
@@ -67,6 +65,7 @@ public:
     void stop() override {
         started_ = false;
         live_.reset();
+        wanted_.reset();
     }
     long read(void* buffer, size_t size) override {
         if (!started_) return -1;
@@ -74,15 +73,23 @@ public:
         if (frames > frames_per_read_) frames = frames_per_read_;
         if (frames == 0) return -1;
         auto* out = static_cast<uint8_t*>(buffer);
+        if (mode_ == Mode::kSilence && wanted_ && HostClockMs() >= retry_at_ms_) {
+            std::string error;
+            if (openLive(&error)) {
+                Warn("is back");
+                stalled_ = false;
+            } else {
+                retryFrom(std::min(retry_ms_ * 2, kRetryMaxMs));
+            }
+        }
         if (mode_ == Mode::kLive) {
             std::string why;
             if (live_->ended(&why)) {
-                std::string line = "AudioRecord: audio source " + source_text_ +
-                                   " stopped: " + why + "; silence until the next start";
-                Log().Write(kLogIdSystem, kLogError, kTag, line.c_str());
+                Warn("stopped: " + why + "; silence, trying again in 1 s");
                 live_.reset();
                 mode_ = Mode::kSilence;
                 restartClock();
+                retryFrom(kRetryFirstMs);
             } else {
                 size_t got = live_->readBytes(out, frames * 4, stalled_ ? 0 : kStallMs);
                 if (got > 0) {
@@ -107,6 +114,24 @@ public:
 
 private:
     enum class Mode { kTone, kSilence, kLive };
+    static constexpr uint64_t kRetryFirstMs = 1000;
+    static constexpr uint64_t kRetryMaxMs = 10000;
+
+    bool openLive(std::string* error) {
+        auto live = std::make_unique<GstSource>();
+        if (!live->start(AudioPipeline(*wanted_), error)) return false;
+        live_ = std::move(live);
+        mode_ = Mode::kLive;
+        return true;
+    }
+    void retryFrom(uint64_t delay_ms) {
+        retry_ms_ = delay_ms;
+        retry_at_ms_ = HostClockMs() + delay_ms;
+    }
+    void Warn(const std::string& what) {
+        std::string line = "AudioRecord: audio source " + wanted_->text + " " + what;
+        Log().Write(kLogIdSystem, kLogWarn, kTag, line.c_str());
+    }
 
     void restartClock() {
         start_ms_ = HostClockMs();
@@ -120,7 +145,9 @@ private:
     bool stalled_ = false;
     Mode mode_ = Mode::kTone;
     std::unique_ptr<GstSource> live_;
-    std::string source_text_;
+    std::unique_ptr<SourceChoice> wanted_;  // the live source asked for, while it is
+    uint64_t retry_ms_ = kRetryFirstMs;     // the back-off: 1 s, doubling to 10 s
+    uint64_t retry_at_ms_ = 0;
 };
 
 }  // namespace
