@@ -142,7 +142,7 @@ bool RtspTransport::Close() {
         m_listen_fd.reset();
         return true;
     }
-    m_sessions.clear();
+    while (!m_sessions.empty()) DropSession(m_sessions.begin());
     m_addresses.clear();
     m_client_count.store(0, std::memory_order_relaxed);
     m_listen_fd.reset();
@@ -150,10 +150,27 @@ bool RtspTransport::Close() {
     return true;
 }
 
+void RtspTransport::DropSession(std::map<int, std::unique_ptr<RtspSession>>::iterator it) {
+    {
+        thread_mutex::Scoped hold(m_clients_lock);
+        m_client_fds.erase(it->first);
+    }
+    m_sessions.erase(it);
+}
+
 void RtspTransport::CloseAll() {
     // The listener goes first: it may itself be stopping capture for a departing client, and
     // the send threads must be stopped by one thread at a time.
     m_running.store(0, std::memory_order_relaxed);
+    if (Global_Config::instance()->wake_on_write()) {
+        // Not left to time out: a client being served is cut off from reading (its request in
+        // progress still completes), and the listener's wait ends.
+        {
+            thread_mutex::Scoped hold(m_clients_lock);
+            for (int fd : m_client_fds) shutdown(fd, SHUT_RD);
+        }
+        Wake();
+    }
     if (m_thread_started) {
         pthread_join(m_thread, nullptr);
         m_thread_started = false;
@@ -323,6 +340,10 @@ int RtspTransport::ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, in
     // connection closed right after an error answer (closes reset) would lose them.
     setsockopt(fd, IPPROTO_TCP, TCP_NODELAY, &on, sizeof on);
     m_sessions[fd] = std::make_unique<RtspSession>(fd, m_listen_addr, peer, this, &m_access);
+    {
+        thread_mutex::Scoped hold(m_clients_lock);
+        m_client_fds.insert(fd);
+    }
     m_addresses[fd] = ip;
     return 1;
 }
@@ -377,7 +398,7 @@ int RtspTransport::ProcessReadRtspSession(fd_set& ready) {
             CloseVideoAndAudioDecodeAndSend();
             if (ProcessDelRtspSessionOther(fd) != 0)
                 m_client_count.fetch_sub(1, std::memory_order_relaxed);
-            m_sessions.erase(it);
+            DropSession(it);
             break;
         }
     }
@@ -388,7 +409,7 @@ int RtspTransport::ProcessDelRtspSession(int fd) {
     auto it = m_sessions.find(fd);
     if (it == m_sessions.end()) return 0;
     OrvexPrint("\n RtspSessionMap delete one !");
-    m_sessions.erase(it);
+    DropSession(it);
     ProcessDelRtspSessionOther(fd);
     m_client_count.fetch_sub(1, std::memory_order_relaxed);
     return 1;

@@ -7,6 +7,7 @@
 #include <atomic>
 #include <map>
 #include <memory>
+#include <set>
 #include <string>
 
 #include "media/MediaSessionList.h"
@@ -89,6 +90,13 @@ private:
     sockaddr_in m_listen_addr{};
     int m_opened = 0;
     std::map<int, std::unique_ptr<RtspSession>> m_sessions;
+    // Drops a client's session, forgetting its descriptor first (see m_client_fds).
+    void DropSession(std::map<int, std::unique_ptr<RtspSession>>::iterator it);
+    // The client connections, for a stop from another thread to end the listener's wait on
+    // one. A descriptor leaves the set before its session closes it, under the lock, so the
+    // stop never reaches a descriptor number that was reused.
+    thread_mutex m_clients_lock;
+    std::set<int> m_client_fds ORVEX_GUARDED_BY(m_clients_lock);
     cycle_buffer m_audio_ring{500000};
     cycle_buffer m_video_ring{8000000};
     pthread_t m_thread{};

@@ -1,3 +1,4 @@
+#include <dirent.h>
 #include <gtest/gtest.h>
 
 #include <atomic>
@@ -720,6 +721,47 @@ TEST_F(ServerTest, ARefusedCaptureSizeIsOneWarningNamingTheClient) {
     size_t after = 0;
     for (const auto& e : fake.log.Entries()) after += e.priority >= platform::kLogWarn ? 1 : 0;
     EXPECT_EQ(after, 1u);  // an accepted size adds none
+}
+
+size_t EntriesIn(const char* folder) {
+    size_t n = 0;
+    if (DIR* d = opendir(folder)) {
+        while (readdir(d) != nullptr) ++n;
+        closedir(d);
+    }
+    return n;
+}
+
+// Waiting for writes, a stop does not wait for the client being served to send its next
+// request: its connection is cut off from reading and every thread and descriptor goes.
+class EventStopTest : public ServerTest {
+protected:
+    void SetUp() override {
+        threads_before = EntriesIn("/proc/self/task");
+        fds_before = EntriesIn("/proc/self/fd");
+        fake.properties.Set("kv.orvex.wake", "event");
+        ServerTest::SetUp();
+    }
+    size_t threads_before = 0, fds_before = 0;
+};
+
+TEST_F(EventStopTest, AStopWhileAClientPlaysLeavesNoThreadOrDescriptor) {
+    Socket::SetReadinessWaitMs(60000);  // only the stop can end the wait for the next request
+    {
+        UdpReceiver video, audio;
+        RtspClient c("127.0.0.1", port);
+        Play(c, video.port(), audio.port());
+        ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+        EXPECT_GT(EntriesIn("/proc/self/task"), threads_before);
+        skyvo_rtsp_sever_close();
+        EXPECT_TRUE(c.ClosedWithoutAnswer());
+        // The departing client closes capture, and the stop once more, as it always has.
+        Calls calls = RecordedCalls();
+        calls.resize(4);
+        EXPECT_EQ(calls, (Calls{"video open", "audio open", "video close", "audio close"}));
+    }
+    EXPECT_EQ(EntriesIn("/proc/self/task"), threads_before);
+    EXPECT_EQ(EntriesIn("/proc/self/fd"), fds_before);
 }
 
 }  // namespace
