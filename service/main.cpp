@@ -1,5 +1,7 @@
 // The orvex process: starts the streaming server on port 554 and the binder service that
 // receives the encoded video, then idles until SIGTERM.
+#include <fcntl.h>
+#include <poll.h>
 #include <signal.h>
 #include <sys/time.h>
 #include <unistd.h>
@@ -26,6 +28,10 @@ int g_quit_flag = 0;
 std::atomic<long> g_signal_sec{0};
 std::atomic<long> g_signal_usec{0};
 std::atomic<int> g_pending_signal{0};
+// Waiting for writes, main sleeps on this pipe, which the handler writes to: a signal that
+// lands between main's look at the flag and its sleep still ends the sleep at once. It stays
+// open until the process ends, as a handler may still be writing.
+std::atomic<int> g_signal_pipe{-1};
 
 void sig_usr(int signo) {
     g_pending_signal.store(signo, std::memory_order_relaxed);
@@ -35,6 +41,22 @@ void sig_usr(int signo) {
     g_signal_sec.store(now.tv_sec, std::memory_order_relaxed);
     g_signal_usec.store(now.tv_usec, std::memory_order_relaxed);
     __atomic_store_n(&g_quit_flag, 0, __ATOMIC_RELAXED);
+    int fd = g_signal_pipe.load(std::memory_order_relaxed);
+    if (fd >= 0) {
+        const char byte = 1;
+        ssize_t ignored = write(fd, &byte, 1);  // async-signal-safe; a full pipe is awake
+        (void)ignored;
+    }
+}
+
+// Sleeps up to `us`, or until the signal handler writes to the pipe.
+void SleepOrSignal(int pipe_read, useconds_t us) {
+    pollfd p{pipe_read, POLLIN, 0};
+    if (poll(&p, 1, static_cast<int>(us / 1000)) == 1) {
+        char bytes[16];
+        while (read(pipe_read, bytes, sizeof bytes) > 0) {
+        }
+    }
 }
 
 // What the handler could not print itself.
@@ -103,9 +125,18 @@ int main(int argc, char** argv) {
     }
     start_orvex_system_service();
     const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
+    int signal_pipe[2] = {-1, -1};
+    if (Global_Config::instance()->wake_on_write() &&
+        pipe2(signal_pipe, O_NONBLOCK | O_CLOEXEC) == 0) {
+        g_signal_pipe.store(signal_pipe[1], std::memory_order_relaxed);
+    }
     while (__atomic_load_n(&g_quit_flag, __ATOMIC_RELAXED) != 0) {
         ReportSignal();
-        usleep(poll_us);
+        if (signal_pipe[0] >= 0) {
+            SleepOrSignal(signal_pipe[0], poll_us);
+        } else {
+            usleep(poll_us);
+        }
     }
     ReportSignal();
 
@@ -119,6 +150,7 @@ int main(int argc, char** argv) {
         (static_cast<long>(now.tv_sec) - g_signal_sec.load(std::memory_order_relaxed)) * 1000 +
         usec / 1000;  // the division truncates toward zero on the signed difference
     OrvexPrintLog(kTag, "******elapse time is %d ms", static_cast<int>(elapsed));
+
     OrvexPuts("\n orvex all services exit ! ");
     OrvexLog(kTag, "\n orvex all services exit ! \n");
     return 0;
