@@ -25,7 +25,7 @@ stop() {
   local begin status=0 took
   begin=$(date +%s%N)
   kill -TERM "$pid"
-  timeout 15 tail --pid="$pid" -f /dev/null || fail "orvex still running 15 s after SIGTERM"
+  timeout 15 tail -s 0.01 --pid="$pid" -f /dev/null || fail "orvex still running 15 s after SIGTERM"
   took=$(( ($(date +%s%N) - begin) / 1000000 ))
   wait "$pid" || status=$?
   [[ $status -eq 0 ]] || fail "exit status $status after SIGTERM"
