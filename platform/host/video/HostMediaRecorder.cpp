@@ -1,8 +1,11 @@
 #include "platform/host/video/HostMediaRecorder.h"
 
+#include "platform/host/HostClock.h"
+
 #include <pthread.h>
 #include <time.h>
 
+#include <algorithm>
 #include <chrono>
 #include <cinttypes>
 #include <cstdio>
@@ -147,24 +150,47 @@ int HostMediaRecorder::prepare() {
     return 0;
 }
 
+namespace {
+
+constexpr uint64_t kRetryFirstMs = 1000;
+constexpr uint64_t kRetryMaxMs = 10000;
+
+}  // namespace
+
 int HostMediaRecorder::openSource() {
     source_ = ChooseVideoSource(sub_);
     label_ = sub_ && source_.kind == SourceChoice::kPattern ? TestPattern::Label::kSub
                                                             : TestPattern::Label::kNone;
     live_.reset();
-    if (!source_.live()) return 0;
+    want_live_ = source_.live();
+    if (!want_live_) return 0;
+    std::string error;
+    if (!startLive(&error)) {
+        // The sound goes on: this track sends "no signal" and tries again.
+        HostLogf(kLogWarn,
+                 "MediaRecorder: video source %s cannot start: %s; showing \"no signal\", trying "
+                 "again in 1 s",
+                 source_.text.c_str(), error.c_str());
+        label_ = TestPattern::Label::kNoSignal;
+        retryLater(kRetryFirstMs);
+        return 0;
+    }
+    HostLogf(kLogDebug, "MediaRecorder: video from %s", source_.text.c_str());
+    return 0;
+}
+
+bool HostMediaRecorder::startLive(std::string* error) {
     // The pattern's size: the same even size the encoder is given.
     std::string description = VideoPipeline(source_, pattern_->width(), pattern_->height(), fps_);
     auto live = std::make_unique<GstSource>();
-    std::string error;
-    if (!live->start(description, &error)) {
-        HostLogf(kLogWarn, "MediaRecorder: video source %s cannot start: %s", source_.text.c_str(),
-                 error.c_str());
-        return kUnknownError;
-    }
+    if (!live->start(description, error)) return false;
     live_ = std::move(live);
-    HostLogf(kLogDebug, "MediaRecorder: video from %s", source_.text.c_str());
-    return 0;
+    return true;
+}
+
+void HostMediaRecorder::retryLater(uint64_t delay_ms) {
+    retry_ms_ = delay_ms;
+    retry_at_ms_ = HostClockMs() + delay_ms;
 }
 
 void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
@@ -176,11 +202,20 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
             return;
         }
         HostLogf(kLogWarn,
-                 "MediaRecorder: video source %s stopped: %s; showing \"no signal\" until the next "
-                 "start",
+                 "MediaRecorder: video source %s stopped: %s; showing \"no signal\", trying "
+                 "again in 1 s",
                  source_.text.c_str(), why.c_str());
-        live_->stop();
+        live_.reset();
         label_ = TestPattern::Label::kNoSignal;
+        retryLater(kRetryFirstMs);
+    } else if (want_live_ && live_ == nullptr && HostClockMs() >= retry_at_ms_) {
+        std::string error;
+        if (startLive(&error)) {
+            HostLogf(kLogWarn, "MediaRecorder: video source %s is back", source_.text.c_str());
+            label_ = TestPattern::Label::kNone;
+        } else {
+            retryLater(std::min(retry_ms_ * 2, kRetryMaxMs));
+        }
     }
     pattern_->draw(frame, ms, picture_.data(), label_);
 }

@@ -88,6 +88,8 @@ private:
     void run();
     Encoded encodeNext(uint32_t frame, uint64_t ms);
     void deliver(const Encoded& frame);
+    bool startLive(std::string* error);
+    void retryLater(uint64_t delay_ms);
 
     State state_ = State::kIdle;
     bool format_set_ = false;
@@ -100,6 +102,11 @@ private:
     bool sub_ = false;
     SourceChoice source_;
     std::unique_ptr<GstSource> live_;
+    // A live source that could not start or went away is tried again, after 1 s doubling to
+    // 10 s; meanwhile the picture is the pattern marked "no signal".
+    bool want_live_ = false;
+    uint64_t retry_ms_ = 0;
+    uint64_t retry_at_ms_ = 0;
     TestPattern::Label label_ = TestPattern::Label::kNone;
     std::unique_ptr<TestPattern> pattern_;
     OpenH264Encoder encoder_;
