@@ -113,6 +113,17 @@ bool RtspTransport::Open(const char* ip, unsigned port, unsigned extra) {
     // Both spellings "rtstptransport" are the texts operators know.
     if (bind(m_listen_fd.get(), reinterpret_cast<sockaddr*>(&m_listen_addr),
              sizeof m_listen_addr) != 0) {
+        const int error = errno;
+        if (error == EADDRINUSE) {
+            OrvexLogPriority(platform::kLogError, kTag,
+                             "%s:%u is held by another process (another orvex, or another RTSP "
+                             "server): stop it, or run this one in a network namespace of its own "
+                             "(unshare -n)",
+                             m_address.c_str(), port);
+        } else {
+            OrvexLogPriority(platform::kLogError, kTag, "cannot listen on %s:%u: %s",
+                             m_address.c_str(), port, strerror(error));
+        }
         return fail("\n rtstptransport bind error. ");
     }
     if (listen(m_listen_fd.get(), 128) != 0) return fail("\n  rtstptransport listen error. ");

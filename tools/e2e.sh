@@ -71,7 +71,8 @@ fi
 status=0
 "$build/orvex" >"$work/second" 2>/dev/null || status=$?
 [[ $status -eq 1 ]] && grep -q "open rtstp server failed !" "$work/second" || fail "port 554 taken: status $status"
-ok "second instance refused (port 554 taken)"
+grep -q "0.0.0.0:554 is held by another process" "$work/orvex.log" || fail "port 554 taken: no line saying so"
+ok "second instance refused (port 554 taken), with a line saying by what and what to do"
 
 streams=$(timeout -k 5 30 ffprobe -v error -rtsp_transport udp \
   -show_entries stream=codec_name,width,height,sample_rate,channels -of csv=p=0 "$(url 1280 720)")
