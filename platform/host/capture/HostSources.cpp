@@ -125,8 +125,7 @@ std::string VideoPipeline(const SourceChoice& source, int width, int height, int
         default:
             return std::string();
     }
-    // BT.601, as the pattern: the stream carries no colour description, and players take
-    // an undescribed picture for BT.601.
+    // BT.601 with limited range, as the pattern: what the encoder's colour description says.
     return head +
            " ! videoconvert ! videoscale add-borders=true ! videorate ! "
            "video/x-raw,format=I420,colorimetry=bt601,width=" +
