@@ -36,10 +36,18 @@ screen_w=1280 screen_h=720
 [[ $mode == measure ]] && screen_w=1920 screen_h=1080
 Xvfb -displayfd 3 -screen 0 "${screen_w}x${screen_h}x24" -nolisten tcp 3>"$work/display" \
   >"$work/xvfb.log" 2>&1 &
-pids+=($!)
+xvfb=$!
+pids+=($xvfb)
 for _ in $(seq 100); do [[ -s "$work/display" ]] && break; sleep 0.1; done
 [[ -s "$work/display" ]] || fail "Xvfb did not start: $(cat "$work/xvfb.log")"
 export DISPLAY=":$(cat "$work/display")"
+# The X server again, on the same display, after it was stopped.
+xvfb_again() {
+  Xvfb "$DISPLAY" -screen 0 "${screen_w}x${screen_h}x24" -nolisten tcp >>"$work/xvfb.log" 2>&1 &
+  xvfb=$!
+  pids+=($xvfb)
+  for _ in $(seq 100); do [[ -S /tmp/.X11-unix/X${DISPLAY#:} ]] && break; sleep 0.1; done
+}
 # No window manager paints the root window here, so a window as large as the screen shows
 # the colour.
 # Fills the screen with one colour (RGB hex), replacing the previous fill.
@@ -225,6 +233,50 @@ sys.exit(0 if before > 300 and gone < 50 and after > 300 else 1)
 PY
 grep -q "audio source pulse is back" "$work/orvex.log" || fail "no line saying the sound is back"
 ok "the picture kept going across the sound server's restart: $frames frames in 20 s"
+
+# The X server goes away while a client plays and comes back 4 s later on the same display:
+# orvex stays up, the picture goes on ("no signal") with the sound, and the screen comes back
+# without a new PLAY.
+timeout -k 5 50 ffmpeg -y -hide_banner -nostats -loglevel error -rtsp_transport udp \
+  -i "$(url 640 368)" -map 0:v -t 26 -vf scale=1:1,format=rgb24 -fps_mode passthrough \
+  -f rawvideo "$work/xrgb" -map 0:v -t 26 -fps_mode passthrough -f framecrc "$work/xcrc" \
+  -map 0:a -t 26 -ac 1 -ar 8000 -f s16le "$work/xpcm" >"$work/xrestart.log" 2>&1 &
+client=$!
+sleep 4
+kill "$xvfb"
+wait "$xvfb" 2>/dev/null || true
+sleep 4
+xvfb_again
+paint "$colour"
+wait "$client" || fail "ffmpeg across the X server's restart: $(tail -3 "$work/xrestart.log")"
+kill -0 "$orvex" 2>/dev/null || fail "orvex ended with the X server"
+python3 - "$work/xrgb" "$work/xcrc" "$work/xpcm" "$colour" <<'PY' || fail "picture across the X server's restart"
+import math, struct, sys
+rgb = open(sys.argv[1], "rb").read()
+lines = [l for l in open(sys.argv[2]) if l.strip() and not l.startswith("#")]
+tb = next(l for l in open(sys.argv[2]) if l.startswith("#tb 0:")).split(":")[1].strip()
+num, den = (int(x) for x in tb.split("/"))
+pts = [int(l.split(",")[1]) * num / den for l in lines]
+pts = [t - pts[0] for t in pts]
+want = bytes.fromhex(sys.argv[4])
+near = [all(abs(rgb[3 * i + c] - want[c]) <= 12 for c in range(3)) for i in range(len(pts))]
+rates = [sum(1 for t in pts if s <= t < s + 1) for s in range(1, int(pts[-1]))]
+lost = [t for t, ok in zip(pts, near) if not ok and t > 3]
+if not lost:
+    sys.exit("the screen never went away")
+back = min(t for t, ok in zip(pts, near) if ok and t > lost[0] and all(near[i] for i in range(pts.index(t), len(pts))))
+pcm = struct.unpack("<%dh" % (len(open(sys.argv[3], "rb").read()) // 2), open(sys.argv[3], "rb").read())
+gone = pcm[5 * 8000:8 * 8000]
+rms = math.sqrt(sum(x * x for x in gone) / max(1, len(gone)))
+print("e2e-capture: ok: X server stopped at ~4 s and started at ~8 s: %d frames, at least %d a "
+      "second, \"no signal\" from %.1f s, the screen back at %.1f s (%.1f s after the restart), "
+      "sound rms %.0f meanwhile" % (len(pts), min(rates), lost[0], back, back - 8.0, rms))
+sys.exit(0 if min(rates) >= 25 and back - 8.0 <= 12 and rms > 300 else 1)
+PY
+grep -q "video source x11 stopped" "$work/orvex.log" || fail "no line saying the screen was lost"
+grep -q "video source x11 is back" "$work/orvex.log" || fail "no line saying the screen is back"
+ok "$(grep -h "video source x11 stopped" "$work/orvex.log" | head -1 | sed 's/.*MediaRecorder: //')"
+
 kill -TERM "$orvex"
 timeout 15 tail --pid="$orvex" -f /dev/null || fail "orvex still running 15 s after SIGTERM"
 sleep 1

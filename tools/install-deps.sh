@@ -11,7 +11,8 @@ set -euo pipefail
 packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock-dev
           libbenchmark-dev libopenh264-dev libvo-aacenc-dev
           libgstreamer1.0-dev libgstreamer-plugins-base1.0-dev gstreamer1.0-plugins-base
-          gstreamer1.0-plugins-good gstreamer1.0-alsa)
+          gstreamer1.0-plugins-good gstreamer1.0-alsa
+          gstreamer1.0-x gstreamer1.0-tools)  # the screen: ximagesrc, in a gst-launch child
 if [[ "${1:-}" == ci ]]; then
   packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
 fi

@@ -1,5 +1,7 @@
 #include <gtest/gtest.h>
 
+#include <dirent.h>
+#include <signal.h>
 #include <stdlib.h>
 #include <algorithm>
 
@@ -15,6 +17,7 @@
 #include "platform/host/HostAudio.h"
 #include "platform/host/capture/GstSource.h"
 #include "platform/host/capture/HostSources.h"
+#include "platform/host/capture/LaunchChild.h"
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
 #include "platform/host/video/TestPattern.h"
@@ -33,6 +36,7 @@ namespace {
 using platform::host::GstSource;
 using platform::host::HostCamera;
 using platform::host::HostMediaRecorder;
+using platform::host::LaunchChild;
 using platform::host::SourceChoice;
 using platform::host::TestPattern;
 using Clock = std::chrono::steady_clock;
@@ -172,6 +176,95 @@ TEST_F(HostCaptureTest, FramesHaveTheAskedSizeRateAndBordersKeepingTheAspect) {
         EXPECT_EQ(LumaAt(picture, w, w / 2, h - 3) < 32, c.bars_top_bottom);
         // Chroma of a white and black picture is neutral.
         EXPECT_NEAR(picture[static_cast<size_t>(w) * h + 1], 128, 4);
+    }
+}
+
+size_t OpenDescriptors() {
+    size_t n = 0;
+    if (DIR* d = opendir("/proc/self/fd")) {
+        while (readdir(d) != nullptr) ++n;
+        closedir(d);
+    }
+    return n;
+}
+
+TEST(LaunchChildTest, TheReasonIsGStreamersErrorElseTheFirstLineElseHowItEnded) {
+    struct Case {
+        const char* text;  // what the child wrote on its standard error
+        int status;        // its wait status, -1 while it runs
+        const char* reason;
+    };
+    const Case cases[] = {
+        {"ERROR: from element /GstPipeline:pipeline0/GstXImageSrc:ximagesrc0: Could not open X "
+         "display for reading\nAdditional debug info:\n../sys/ximage/gstximagesrc.c(158): "
+         "gst_ximage_src_open_display (): /GstPipeline:pipeline0/GstXImageSrc:ximagesrc0:\n"
+         "ERROR: pipeline doesn't want to preroll.\n",
+         1 << 8, "Could not open X display for reading"},
+        // Xlib's last words when the X server goes away, after GStreamer's warnings.
+        {"\n  XIO:  fatal IO error 11 (Resource temporarily unavailable) on X server \":99\"\n"
+         "      after 37 requests (37 known processed) with 0 events remaining.\n",
+         1 << 8, "XIO:  fatal IO error 11 (Resource temporarily unavailable) on X server \":99\""},
+        {"WARNING: erroneous pipeline: no element \"nosuchelement\"\r\n", 1 << 8,
+         "WARNING: erroneous pipeline: no element \"nosuchelement\""},
+        {"", SIGKILL, "gst-launch-1.0 ended by signal 9"},
+        {" \n\t\n", 3 << 8, "gst-launch-1.0 exited with status 3"},
+        {"", -1, ""},
+        // An error line cut off before its message is a line like any other.
+        {"ERROR: from element /GstPipeline:pipeline0", -1,
+         "ERROR: from element /GstPipeline:pipeline0"},
+    };
+    for (const Case& c : cases) {
+        EXPECT_EQ(LaunchChild::Reason(c.text, c.status), c.reason) << c.text;
+    }
+}
+
+// The screen is captured in a child process, so that a library that ends its process (Xlib,
+// when the X server goes away) ends only the child: its frames arrive here, its death is the
+// source's end with the reason, and it leaves no process or descriptor behind.
+TEST_F(HostCaptureTest, AChildsFramesArriveAndItsDeathEndsTheSourceLeavingNothing) {
+    const std::string white =
+        "videotestsrc pattern=white is-live=true ! "
+        "video/x-raw,format=I420,width=320,height=240,framerate=30/1 ! fdsink fd=3";
+    std::vector<uint8_t> picture(320 * 240 * 3 / 2, 0);
+    std::string error;
+    size_t fds = 0;
+    for (int round = 0; round < 2; ++round) {  // the first loads GStreamer, which keeps some
+        GstSource live;
+        ASSERT_TRUE(live.startInChild(white, 320, 240, 30, &error)) << error;
+        ASSERT_TRUE(WaitFor([&] { return live.latestFrame(picture.data(), 320, 240); }));
+        EXPECT_GT(LumaAt(picture, 320, 160, 120), 200);
+        const int pid = live.childPid();
+        ASSERT_GT(pid, 0);
+        if (round == 0) {
+            live.stop();
+            EXPECT_EQ(kill(pid, 0), -1);  // killed and reaped
+            fds = OpenDescriptors();
+            continue;
+        }
+        kill(pid, SIGKILL);
+        std::string why;
+        ASSERT_TRUE(WaitFor([&] { return live.ended(&why); }));
+        EXPECT_EQ(why, "gst-launch-1.0 ended by signal 9");
+        EXPECT_EQ(live.childPid(), -1);
+    }
+    EXPECT_EQ(OpenDescriptors(), fds);
+
+    struct Case {
+        const char* child;
+        const char* error;
+    };
+    const Case cases[] = {
+        {"nosuchelement ! fdsink fd=3",
+         "WARNING: erroneous pipeline: no element \"nosuchelement\""},
+        // Sound is no picture: the child cannot link and says so.
+        {"audiotestsrc ! video/x-raw,format=I420,width=320,height=240 ! fdsink fd=3",
+         "WARNING: erroneous pipeline: could not link audiotestsrc0 to fdsink0, audiotestsrc0 "
+         "can't handle caps video/x-raw, format=(string)I420, width=(int)320, height=(int)240"},
+    };
+    for (const Case& c : cases) {
+        GstSource live;
+        EXPECT_FALSE(live.startInChild(c.child, 320, 240, 30, &error));
+        EXPECT_EQ(error, c.error);
     }
 }
 

@@ -59,7 +59,7 @@ public:
     GstPipelineSource(const GstPipelineSource&) = delete;
     GstPipelineSource& operator=(const GstPipelineSource&) = delete;
 
-    bool start(const std::string& description, std::string* error) override;
+    bool start(const std::string& description, bool wait_first, std::string* error) override;
     void stop() override;
     bool running() const override { return pipeline_ != nullptr; }
     bool ended(std::string* why) override;
@@ -77,7 +77,7 @@ private:
     uint64_t last_pts_ns_ = 0;
 };
 
-bool GstPipelineSource::start(const std::string& description, std::string* error) {
+bool GstPipelineSource::start(const std::string& description, bool wait_first, std::string* error) {
     stop();
     if (!InitOnce(error)) return false;
     GError* err = nullptr;
@@ -101,8 +101,10 @@ bool GstPipelineSource::start(const std::string& description, std::string* error
     sink_ = sink;
     bool failed = gst_element_set_state(pipeline_, GST_STATE_PLAYING) == GST_STATE_CHANGE_FAILURE;
     std::string why;
-    for (uint64_t waited = 0; waited < kFirstSampleWaitNs; waited += kPollNs) {
-        if (PopEnd(pipeline_, &why)) {
+    // A pull returns at once at the end of the stream, so the wait is measured, not counted.
+    const int64_t until_us = g_get_monotonic_time() + kFirstSampleWaitNs / 1000;
+    while (wait_first && g_get_monotonic_time() < until_us) {
+        if (ended(&why)) {
             failed = true;
             break;
         }
@@ -110,6 +112,7 @@ bool GstPipelineSource::start(const std::string& description, std::string* error
         pending_ = pull(kPollNs);
         if (pending_ != nullptr) break;
     }
+    if (failed && why.empty()) ended(&why);
     if (failed) {
         *error = why.empty() ? "the pipeline does not start" : why;
         stop();
@@ -131,7 +134,12 @@ void GstPipelineSource::stop() {
 }
 
 bool GstPipelineSource::ended(std::string* why) {
-    return pipeline_ != nullptr && PopEnd(pipeline_, why);
+    if (pipeline_ == nullptr) return false;
+    if (PopEnd(pipeline_, why)) return true;
+    // A stream that ends before the pipeline plays posts no message; the sink knows.
+    if (!gst_app_sink_is_eos(GST_APP_SINK(sink_))) return false;
+    *why = "end of stream";
+    return true;
 }
 
 GstSample* GstPipelineSource::pull(uint64_t timeout_ns) {

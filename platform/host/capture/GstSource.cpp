@@ -51,8 +51,12 @@ LiveSourceFactory LoadModule(std::string* error) {
 GstSource::GstSource() = default;
 GstSource::~GstSource() { stop(); }
 
-bool GstSource::start(const std::string& description, std::string* error) {
+bool GstSource::start(const std::string& description, std::string* error, bool wait_first) {
     stop();
+    return startPipeline(description, error, wait_first);
+}
+
+bool GstSource::startPipeline(const std::string& description, std::string* error, bool wait_first) {
     if (live_ == nullptr) {
         LiveSourceFactory create = LoadModule(error);
         if (create == nullptr) return false;
@@ -62,14 +66,47 @@ bool GstSource::start(const std::string& description, std::string* error) {
             return false;
         }
     }
-    return live_->start(description, error);
+    return live_->start(description, wait_first, error);
+}
+
+bool GstSource::startInChild(const std::string& child, int width, int height, int fps,
+                             std::string* error, bool wait_first) {
+    stop();
+    auto launched = std::make_unique<LaunchChild>();
+    if (!launched->start(child, error)) return false;
+    // fdsrc leaves the descriptor open: the child object closes it after the pipeline stops.
+    std::string reader =
+        "fdsrc fd=" + std::to_string(launched->output()) +
+        " blocksize=65536 ! rawvideoparse format=i420 width=" + std::to_string(width) +
+        " height=" + std::to_string(height) + " framerate=" + std::to_string(fps) +
+        "/1 ! appsink name=orvexsink max-buffers=2 drop=true";
+    child_ = std::move(launched);
+    if (startPipeline(reader, error, wait_first)) return true;
+    // The reader sees only the pipe's end; the child says why.
+    std::string reason = live_ != nullptr ? child_->why() : std::string();
+    if (!reason.empty()) *error = reason;
+    stop();
+    return false;
 }
 
 void GstSource::stop() {
     if (live_ != nullptr) live_->stop();
+    child_.reset();
 }
 
-bool GstSource::ended(std::string* why) { return live_ != nullptr && live_->ended(why); }
+int GstSource::childPid() const { return child_ != nullptr ? child_->pid() : -1; }
+
+bool GstSource::ended(std::string* why) {
+    if (live_ == nullptr || !live_->ended(why)) {
+        if (child_ != nullptr) child_->drainErrors();
+        return false;
+    }
+    if (child_ != nullptr) {
+        std::string reason = child_->why();
+        if (!reason.empty()) *why = reason;
+    }
+    return true;
+}
 
 bool GstSource::latestFrame(uint8_t* i420, int width, int height) {
     return live_ != nullptr && live_->latestFrame(i420, width, height);

@@ -5,6 +5,7 @@
 #include <memory>
 #include <string>
 
+#include "platform/host/capture/LaunchChild.h"
 #include "platform/host/capture/LiveSource.h"
 
 namespace platform {
@@ -23,13 +24,21 @@ public:
     GstSource(const GstSource&) = delete;
     GstSource& operator=(const GstSource&) = delete;
 
-    // Builds the pipeline and sets it playing, then waits (bounded) for its first sample or its
-    // first error. False with GStreamer's own error text when it cannot run, or with the
-    // module's name and the loader's reason when the module does not load.
-    bool start(const std::string& description, std::string* error);
+    // Builds the pipeline and sets it playing, then, when `wait_first`, waits (bounded) for its
+    // first sample or its first error. False with GStreamer's own error text when it cannot
+    // run, or with the module's name and the loader's reason when the module does not load.
+    // Without the wait, a pipeline that fails later says so through ended().
+    bool start(const std::string& description, std::string* error, bool wait_first = true);
+    // Video whose capture runs in a gst-launch-1.0 process of its own (see LaunchChild):
+    // `child` ends in "fdsink fd=3" and writes I420 frames of width x height at fps, which
+    // this process reads from the pipe. Reasons name what the child said.
+    bool startInChild(const std::string& child, int width, int height, int fps, std::string* error,
+                      bool wait_first = true);
     // Stops and frees the pipeline; nothing happens when it is not running.
     void stop();
     bool running() const { return live_ != nullptr && live_->running(); }
+    // The child's process id while one runs, else -1 (for the tests).
+    int childPid() const;
 
     // Whether the pipeline has failed or reached its end since the last call; *why then holds
     // GStreamer's text (or "end of stream"). Cheap; allocates nothing while all is well.
@@ -46,7 +55,10 @@ public:
     size_t readBytes(uint8_t* out, size_t size, int timeout_ms);
 
 private:
+    bool startPipeline(const std::string& description, std::string* error, bool wait_first);
+
     std::unique_ptr<LiveSource> live_;
+    std::unique_ptr<LaunchChild> child_;
 };
 
 }  // namespace host

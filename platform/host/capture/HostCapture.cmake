@@ -14,6 +14,7 @@ set_target_properties(orvex_host_gst PROPERTIES
 
 target_sources(orvex_platform_host PRIVATE
   ${PROJECT_SOURCE_DIR}/platform/host/capture/GstSource.cpp
+  ${PROJECT_SOURCE_DIR}/platform/host/capture/LaunchChild.cpp
   ${PROJECT_SOURCE_DIR}/platform/host/capture/HostSources.cpp)
 target_compile_definitions(orvex_platform_host PRIVATE
   ORVEX_HOST_GST_MODULE_NAME="$<TARGET_FILE_NAME:orvex_host_gst>"

@@ -107,7 +107,12 @@ SourceChoice ChooseVideoSource(bool sub) {
 
 SourceChoice ChooseAudioSource() { return Choose(kAudioProperty, "tone", &ParseAudioSource); }
 
-std::string VideoPipeline(const SourceChoice& source, int width, int height, int fps) {
+namespace {
+
+// The head of a video pipeline and its conversion to I420 of exactly width x height at fps,
+// ending in `sink`.
+std::string VideoPipelineTo(const SourceChoice& source, int width, int height, int fps,
+                            const char* sink) {
     std::string head;
     switch (source.kind) {
         case SourceChoice::kX11:
@@ -130,8 +135,20 @@ std::string VideoPipeline(const SourceChoice& source, int width, int height, int
            " ! videoconvert ! videoscale add-borders=true ! videorate ! "
            "video/x-raw,format=I420,colorimetry=bt601,width=" +
            std::to_string(width) + ",height=" + std::to_string(height) +
-           ",framerate=" + std::to_string(fps) +
-           "/1,pixel-aspect-ratio=1/1 ! appsink name=orvexsink max-buffers=2 drop=true";
+           ",framerate=" + std::to_string(fps) + "/1,pixel-aspect-ratio=1/1 ! " + sink;
+}
+
+}  // namespace
+
+std::string VideoPipeline(const SourceChoice& source, int width, int height, int fps) {
+    return VideoPipelineTo(source, width, height, fps,
+                           "appsink name=orvexsink max-buffers=2 drop=true");
+}
+
+std::string ChildVideoPipeline(const SourceChoice& source, int width, int height, int fps) {
+    // Xlib ends the process whose X server goes away.
+    if (source.kind != SourceChoice::kX11) return std::string();
+    return VideoPipelineTo(source, width, height, fps, "fdsink fd=3 sync=false");
 }
 
 std::string AudioPipeline(const SourceChoice& source) {

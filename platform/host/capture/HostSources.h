@@ -39,6 +39,10 @@ SourceChoice ChooseAudioSource();
 // width x height at fps, the picture scaled with its aspect kept (black borders), and
 // 48000 Hz stereo S16LE PCM. Empty for kinds GStreamer does not deliver.
 std::string VideoPipeline(const SourceChoice& source, int width, int height, int fps);
+// For a source whose library may end the process it runs in (the X screen), the same
+// pipeline ending in "fdsink fd=3", to run in a child process (GstSource::startInChild);
+// empty for sources that run in this process.
+std::string ChildVideoPipeline(const SourceChoice& source, int width, int height, int fps);
 std::string AudioPipeline(const SourceChoice& source);
 
 }  // namespace host

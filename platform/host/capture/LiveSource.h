@@ -13,7 +13,7 @@ namespace host {
 class LiveSource {
 public:
     virtual ~LiveSource() = default;
-    virtual bool start(const std::string& description, std::string* error) = 0;
+    virtual bool start(const std::string& description, bool wait_first, std::string* error) = 0;
     virtual void stop() = 0;
     virtual bool running() const = 0;
     virtual bool ended(std::string* why) = 0;

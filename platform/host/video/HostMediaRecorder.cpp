@@ -154,6 +154,7 @@ namespace {
 
 constexpr uint64_t kRetryFirstMs = 1000;
 constexpr uint64_t kRetryMaxMs = 10000;
+constexpr uint64_t kFirstFrameMs = 3000;
 
 }  // namespace
 
@@ -162,10 +163,11 @@ int HostMediaRecorder::openSource() {
     label_ = sub_ && source_.kind == SourceChoice::kPattern ? TestPattern::Label::kSub
                                                             : TestPattern::Label::kNone;
     live_.reset();
+    trying_ = false;
     want_live_ = source_.live();
     if (!want_live_) return 0;
     std::string error;
-    if (!startLive(&error)) {
+    if (!startLive(true, &error)) {
         // The sound goes on: this track sends "no signal" and tries again.
         HostLogf(kLogWarn,
                  "MediaRecorder: video source %s cannot start: %s; showing \"no signal\", trying "
@@ -179,11 +181,15 @@ int HostMediaRecorder::openSource() {
     return 0;
 }
 
-bool HostMediaRecorder::startLive(std::string* error) {
+bool HostMediaRecorder::startLive(bool wait_first, std::string* error) {
     // The pattern's size: the same even size the encoder is given.
-    std::string description = VideoPipeline(source_, pattern_->width(), pattern_->height(), fps_);
+    const int w = pattern_->width(), h = pattern_->height();
     auto live = std::make_unique<GstSource>();
-    if (!live->start(description, error)) return false;
+    std::string child = ChildVideoPipeline(source_, w, h, fps_);
+    bool started = child.empty()
+                       ? live->start(VideoPipeline(source_, w, h, fps_), error, wait_first)
+                       : live->startInChild(child, w, h, fps_, error, wait_first);
+    if (!started) return false;
     live_ = std::move(live);
     return true;
 }
@@ -194,25 +200,43 @@ void HostMediaRecorder::retryLater(uint64_t delay_ms) {
 }
 
 void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
+    const uint64_t now = HostClockMs();
     if (live_ != nullptr && live_->running()) {
         std::string why;
-        if (!live_->ended(&why)) {
+        bool ended = live_->ended(&why);
+        if (!ended) {
             // No new frame since the last one: the last picture is sent again.
-            live_->latestFrame(picture_.data(), pattern_->width(), pattern_->height());
-            return;
+            bool fresh = live_->latestFrame(picture_.data(), pattern_->width(), pattern_->height());
+            if (!trying_) return;
+            if (fresh) {
+                HostLogf(kLogWarn, "MediaRecorder: video source %s is back", source_.text.c_str());
+                trying_ = false;
+                label_ = TestPattern::Label::kNone;
+                return;
+            }
+            ended = now >= trying_until_ms_;  // a source that opens but never gives a frame
         }
-        HostLogf(kLogWarn,
-                 "MediaRecorder: video source %s stopped: %s; showing \"no signal\", trying "
-                 "again in 1 s",
-                 source_.text.c_str(), why.c_str());
-        live_.reset();
-        label_ = TestPattern::Label::kNoSignal;
-        retryLater(kRetryFirstMs);
-    } else if (want_live_ && live_ == nullptr && HostClockMs() >= retry_at_ms_) {
+        if (ended && trying_) {
+            // Another attempt that failed: quietly, as the first failure said it all.
+            live_.reset();
+            trying_ = false;
+            retryLater(std::min(retry_ms_ * 2, kRetryMaxMs));
+        } else if (ended) {
+            HostLogf(kLogWarn,
+                     "MediaRecorder: video source %s stopped: %s; showing \"no signal\", "
+                     "trying again in 1 s",
+                     source_.text.c_str(), why.c_str());
+            live_.reset();
+            label_ = TestPattern::Label::kNoSignal;
+            retryLater(kRetryFirstMs);
+        }
+    } else if (want_live_ && live_ == nullptr && now >= retry_at_ms_) {
+        // Started without waiting for its first frame, which would hold up this thread's
+        // pictures: the source is back when a frame comes.
         std::string error;
-        if (startLive(&error)) {
-            HostLogf(kLogWarn, "MediaRecorder: video source %s is back", source_.text.c_str());
-            label_ = TestPattern::Label::kNone;
+        if (startLive(false, &error)) {
+            trying_ = true;
+            trying_until_ms_ = now + kFirstFrameMs;
         } else {
             retryLater(std::min(retry_ms_ * 2, kRetryMaxMs));
         }

@@ -88,7 +88,7 @@ private:
     void run();
     Encoded encodeNext(uint32_t frame, uint64_t ms);
     void deliver(const Encoded& frame);
-    bool startLive(std::string* error);
+    bool startLive(bool wait_first, std::string* error);
     void retryLater(uint64_t delay_ms);
 
     State state_ = State::kIdle;
@@ -107,6 +107,9 @@ private:
     bool want_live_ = false;
     uint64_t retry_ms_ = 0;
     uint64_t retry_at_ms_ = 0;
+    // A source started again that has not yet given a frame (until trying_until_ms_).
+    bool trying_ = false;
+    uint64_t trying_until_ms_ = 0;
     TestPattern::Label label_ = TestPattern::Label::kNone;
     std::unique_ptr<TestPattern> pattern_;
     OpenH264Encoder encoder_;
