@@ -70,12 +70,21 @@ std::vector<int> NalTypes(const Bytes& b) {
     return types;
 }
 
-bool IsKeyFrame(const std::vector<int>& t) {
+// The units without the filler data (type 12) that may follow a slice to keep the bitrate
+// (split at slices, a picture's filler opens the next frame).
+std::vector<int> WithoutFiller(std::vector<int> t) {
+    t.erase(std::remove(t.begin(), t.end(), 12), t.end());
+    return t;
+}
+
+bool IsKeyFrame(const std::vector<int>& types) {
+    std::vector<int> t = WithoutFiller(types);
     return t.size() >= 3 && t[0] == 7 && t[1] == 8 &&
            std::all_of(t.begin() + 2, t.end(), [](int v) { return v == 5; });
 }
 
-bool IsPFrame(const std::vector<int>& t) {
+bool IsPFrame(const std::vector<int>& types) {
+    std::vector<int> t = WithoutFiller(types);
     return !t.empty() && std::all_of(t.begin(), t.end(), [](int v) { return v == 1; });
 }
 

@@ -99,6 +99,12 @@ bool OpenH264Encoder::Open(int width, int height, int fps, int bitrate) {
     // A screen in full motion costs more than the bitrate: with skipping, the rate control held
     // 1080p at 9 fps. Viewers want the frame rate kept; the picture gets coarser instead.
     p.bEnableFrameSkip = false;
+    // A still or simple picture costs a tenth of the bitrate; filler data keeps the stream at
+    // the rate asked for, which is what a network path sized for it expects. OpenH264 cannot
+    // pad a frame to near its raw size (it then fails every frame), so tiny pictures at a
+    // high rate go without.
+    const int64_t frame_bytes = static_cast<int64_t>(width) * height * 3 / 2;
+    p.iPaddingFlag = static_cast<int64_t>(bitrate) / 8 / (fps > 0 ? fps : 1) * 4 <= frame_bytes;
     p.iMultipleThreadIdc = 1;
     p.bEnableDenoise = false;
     p.bEnableSceneChangeDetect = false;
