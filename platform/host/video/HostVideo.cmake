@@ -1,5 +1,6 @@
 # The host's synthetic camera and its H.264 media recorder (OpenH264).
 target_sources(orvex_platform_host PRIVATE
+  ${PROJECT_SOURCE_DIR}/platform/host/video/BitBudget.cpp
   ${PROJECT_SOURCE_DIR}/platform/host/video/HostCamera.cpp
   ${PROJECT_SOURCE_DIR}/platform/host/video/HostMediaRecorder.cpp
   ${PROJECT_SOURCE_DIR}/platform/host/video/OpenH264Encoder.cpp

@@ -10,6 +10,7 @@
 
 #include "media/AnnexB.h"
 #include "platform/host/HostLog.h"
+#include "platform/host/video/BitBudget.h"
 
 namespace platform {
 namespace host {
@@ -21,6 +22,10 @@ constexpr float kEncoderMaxFps = 60.0f;
 // Restaging a unit behind 4 bytes adds one byte to it; room for this many units per frame
 // (OpenH264 writes a handful), past which further restaged units are left out.
 constexpr size_t kMaxNalsPerFrame = 256;
+
+// A filler data unit (type 12) behind its start code; 0xFF bytes and a closing 0x80 follow.
+constexpr uint8_t kFillerStart[] = {0, 0, 0, 1, 0x0C};
+constexpr size_t kFillerHeader = sizeof kFillerStart;
 
 void EncoderTrace(void*, int, const char* message) { HostLogf(kLogError, "%s", message); }
 
@@ -59,6 +64,7 @@ const OpenH264* LoadOpenH264() {
 
 }  // namespace
 
+OpenH264Encoder::OpenH264Encoder() = default;
 OpenH264Encoder::~OpenH264Encoder() { Close(); }
 
 bool OpenH264Encoder::Open(int width, int height, int fps, int bitrate) {
@@ -82,7 +88,9 @@ bool OpenH264Encoder::Open(int width, int height, int fps, int bitrate) {
     p.iPicHeight = height;
     p.iTargetBitrate = bitrate;
     p.iMaxBitrate = UNSPECIFIED_BIT_RATE;
-    p.iRCMode = RC_BITRATE_MODE;
+    // The rate is ours (BitBudget): OpenH264's own keeps the quantiser near each key frame's,
+    // and a screen in full motion overshot by 90%; with frame skipping it held 1080p at 9 fps.
+    p.iRCMode = RC_OFF_MODE;
     p.fMaxFrameRate = fps < kEncoderMaxFps ? static_cast<float>(fps) : kEncoderMaxFps;
     p.iTemporalLayerNum = 1;
     p.iSpatialLayerNum = 1;
@@ -96,15 +104,8 @@ bool OpenH264Encoder::Open(int width, int height, int fps, int bitrate) {
     p.bEnableSSEI = false;
     p.bSimulcastAVC = false;
     p.iEntropyCodingModeFlag = 0;
-    // A screen in full motion costs more than the bitrate: with skipping, the rate control held
-    // 1080p at 9 fps. Viewers want the frame rate kept; the picture gets coarser instead.
+    // Viewers want the frame rate kept; the picture gets coarser instead.
     p.bEnableFrameSkip = false;
-    // A still or simple picture costs a tenth of the bitrate; filler data keeps the stream at
-    // the rate asked for, which is what a network path sized for it expects. OpenH264 cannot
-    // pad a frame to near its raw size (it then fails every frame), so tiny pictures at a
-    // high rate go without.
-    const int64_t frame_bytes = static_cast<int64_t>(width) * height * 3 / 2;
-    p.iPaddingFlag = static_cast<int64_t>(bitrate) / 8 / (fps > 0 ? fps : 1) * 4 <= frame_bytes;
     p.iMultipleThreadIdc = 1;
     p.bEnableDenoise = false;
     p.bEnableSceneChangeDetect = false;
@@ -115,6 +116,9 @@ bool OpenH264Encoder::Open(int width, int height, int fps, int bitrate) {
     layer.iSpatialBitrate = bitrate;
     layer.iMaxSpatialBitrate = UNSPECIFIED_BIT_RATE;
     layer.uiProfileIdc = PRO_BASELINE;
+    budget_ = std::make_unique<BitBudget>(bitrate, fps);
+    qp_ = budget_->qp();
+    layer.iDLayerQp = qp_;
     layer.sSliceArgument.uiSliceMode = SM_SINGLE_SLICE;
     // Say which colours the samples mean: every host picture is BT.601 with limited range (the
     // pattern's bars, and the live sources' conversion asks GStreamer for colorimetry=bt601).
@@ -136,6 +140,12 @@ bool OpenH264Encoder::Open(int width, int height, int fps, int bitrate) {
     encoder_->SetOption(ENCODER_OPTION_DATAFORMAT, &format);
     width_ = width;
     height_ = height;
+    params_ = std::make_unique<SEncParamExt>(p);
+    // A filler unit of up to one picture's share, all 0xFF: each use writes its closing
+    // 0x80 and the next restores it.
+    filler_.assign(static_cast<size_t>(budget_->share()) + kFillerHeader + 1, 0xFF);
+    memcpy(filler_.data(), kFillerStart, kFillerHeader);
+    filler_end_ = 0;
     return true;
 }
 
@@ -149,6 +159,11 @@ void OpenH264Encoder::Close() {
 
 OpenH264Encoder::Frame OpenH264Encoder::Encode(uint8_t* i420, uint64_t ms, bool force_key) {
     if (encoder_ == nullptr) return Frame{};
+    if (budget_->qp() != qp_) {
+        qp_ = budget_->qp();
+        params_->sSpatialLayers[0].iDLayerQp = qp_;
+        encoder_->SetOption(ENCODER_OPTION_SVC_ENCODE_PARAM_EXT, params_.get());
+    }
     if (force_key) encoder_->ForceIntraFrame(true);
     SSourcePicture source;
     memset(&source, 0, sizeof source);
@@ -207,10 +222,18 @@ OpenH264Encoder::Frame OpenH264Encoder::Encode(uint8_t* i420, uint64_t ms, bool 
     }
     Frame out;
     if (nals_.empty()) return out;
+    out.key = info.eFrameType == videoFrameTypeIDR;
+    size_t filler = budget_->spend(size, out.key);
+    if (filler > kFillerHeader && filler <= filler_.size()) {
+        if (filler_end_ > 0) filler_[filler_end_] = 0xFF;
+        filler_end_ = filler - 1;
+        filler_[filler_end_] = 0x80;  // rbsp_trailing_bits
+        nals_.push_back({filler_.data(), filler});
+        size += filler;
+    }
     out.nals = nals_.data();
     out.count = nals_.size();
     out.size = size;
-    out.key = info.eFrameType == videoFrameTypeIDR;
     return out;
 }
 

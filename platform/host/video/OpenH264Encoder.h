@@ -2,12 +2,16 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <vector>
 
 class ISVCEncoder;
+struct TagEncParamExt;
 
 namespace platform {
 namespace host {
+
+class BitBudget;
 
 // The host's H.264 encoder: OpenH264, loaded at the first Open (a service fed from outside
 // never maps it), configured for live baseline video with one slice per picture.
@@ -29,7 +33,7 @@ public:
         bool skipped = false;
     };
 
-    OpenH264Encoder() = default;
+    OpenH264Encoder();
     ~OpenH264Encoder();
     OpenH264Encoder(const OpenH264Encoder&) = delete;
     OpenH264Encoder& operator=(const OpenH264Encoder&) = delete;
@@ -44,6 +48,11 @@ public:
 
 private:
     ISVCEncoder* encoder_ = nullptr;
+    std::unique_ptr<TagEncParamExt> params_;  // as opened, for changing the quantiser
+    std::unique_ptr<BitBudget> budget_;
+    int qp_ = 0;
+    std::vector<uint8_t> filler_;
+    size_t filler_end_ = 0;  // where the last filler unit closed with 0x80
     int width_ = 0;
     int height_ = 0;
     std::vector<Nal> nals_;
