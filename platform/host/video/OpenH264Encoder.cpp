@@ -16,7 +16,7 @@ namespace platform {
 namespace host {
 namespace {
 
-// OpenH264 rate-controls up to this rate; faster schedules still run, just capped in the RC.
+// OpenH264 takes frame rates up to this; faster schedules still run, told this rate.
 constexpr float kEncoderMaxFps = 60.0f;
 
 // Restaging a unit behind 4 bytes adds one byte to it; room for this many units per frame
