@@ -223,7 +223,7 @@ void Mp4a(Writer& w, const AudioConfig& a) {
     w.U24(0);             // buffer size
     w.U32(0);             // max bitrate
     w.U32(0);             // average bitrate: variable
-    w.U8(0x05);           // DecoderSpecificInfo
+    w.U8(0x05);           // decoder configuration: the ASC
     w.U8(2);
     w.Bytes(a.asc, 2);
     w.U8(0x06);  // SLConfigDescriptor

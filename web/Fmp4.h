@@ -8,7 +8,7 @@
 // segment describes the tracks once; then every sample travels as its own fragment (moof, then
 // mdat) so a viewer can join at any key frame and nothing waits for a second sample.
 // Every writer fills the caller's buffer and never writes at or past `cap`; on refusal it
-// returns 0 and what lies before `cap` is unspecified.
+// returns 0 and what lies before `cap` is garbage.
 // Thread contract: pure functions, any thread.
 namespace fmp4 {
 
@@ -22,7 +22,7 @@ struct VideoConfig {
 };
 
 struct AudioConfig {
-    uint8_t asc[2];        // AudioSpecificConfig, e.g. 0x11 0x90 = AAC-LC 48 kHz stereo
+    uint8_t asc[2];        // AAC decoder configuration (ASC), e.g. 0x11 0x90 = LC 48 kHz stereo
     uint32_t sample_rate;  // also the track's timescale; 1..65535
     uint8_t channels;
 };
