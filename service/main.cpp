@@ -12,10 +12,13 @@
 #include "capture/Livecamera.h"
 #include "capture/orvexaudiomain.h"
 #include "platform/Ports.h"
+#include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
+#include "server/skyvo_service.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
 #include "service/OrvexSystemService.h"
+#include "web/WebViewer.h"
 
 namespace {
 
@@ -123,6 +126,7 @@ int main(int argc, char** argv) {
         skyvo_rtsp_sever_close();
         return result;
     }
+    StartWebViewer(skyvo_rtsp_service()->listener());  // only when kv.orvex.http names a port
     start_orvex_system_service();
     const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
     int signal_pipe[2] = {-1, -1};
@@ -140,7 +144,9 @@ int main(int argc, char** argv) {
     }
     ReportSignal();
 
-    // Clients and send sessions go before the frame source does.
+    // Clients and send sessions go before the frame source does; web viewers hold capture
+    // through the listener, so they go first.
+    StopWebViewer();
     skyvo_rtsp_sever_close();
     close_orvex_system_service();
     timeval now{};

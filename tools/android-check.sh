@@ -10,7 +10,7 @@ ROOT="$(cd "$(dirname "${BASH_SOURCE[0]}")/.." && pwd)"
 CXX=arm-linux-gnueabihf-g++
 AOSP=/usr/include/android
 PACKAGES=(g++-arm-linux-gnueabihf android-platform-frameworks-native-headers
-          android-libutils-dev android-liblog-dev android-libcutils-dev)
+          android-libutils-dev android-liblog-dev android-libcutils-dev libmicrohttpd-dev)
 
 missing=()
 for pkg in "${PACKAGES[@]}"; do
@@ -34,13 +34,21 @@ for header in binder/Binder.h utils/String16.h log/log.h cutils/properties.h; do
     fi
 done
 
+# libmicrohttpd's one header, which the television build takes from its own copy of the
+# library: Debian's is the same release's, and a folder of its own keeps the rest of
+# /usr/include (this machine's, not ARM's) out of sight.
+mhd=$(mktemp -d)
+trap 'rm -rf "$mhd"' EXIT
+ln -s /usr/include/microhttpd.h "$mhd/microhttpd.h"
+
 # The AOSP and shim directories are system includes: their own warnings (clang pragmas,
 # libc++-style transitive includes) are not ours to fix. Our sources get the full warning set.
 FLAGS=(-std=c++17 -fsyntax-only -Wall -Wextra -Werror
        -I"$ROOT"
        -isystem "$AOSP"
        -isystem "$ROOT/tests/android_shims"
-       -I"$ROOT/platform/android/vendor")
+       -I"$ROOT/platform/android/vendor"
+       -isystem "$mhd")
 
 passed=0
 failed=0

@@ -1,7 +1,8 @@
 #!/usr/bin/env bash
 # Installs the Debian 12 packages a build needs, and only those that are missing.
 #   install-deps.sh          what building, running and testing on this machine needs
-#   install-deps.sh e2e      that, plus the clients of the end-to-end check (ffmpeg, GStreamer)
+#   install-deps.sh e2e      that, plus the clients of the end-to-end check (ffmpeg, GStreamer,
+#                            a headless chromium for the web viewer)
 #   install-deps.sh capture-e2e  that, plus a virtual screen and a sound server to capture
 #   install-deps.sh bench    that, plus the e2e clients and the peer server bench/peer_cost.sh
 #                            serves beside orvex (gst-rtsp-server through Python), and perf
@@ -12,7 +13,8 @@ packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock
           libbenchmark-dev libopenh264-dev libvo-aacenc-dev
           libgstreamer1.0-dev libgstreamer-plugins-base1.0-dev gstreamer1.0-plugins-base
           gstreamer1.0-plugins-good gstreamer1.0-alsa
-          gstreamer1.0-x gstreamer1.0-tools)  # the screen: ximagesrc, in a gst-launch child
+          gstreamer1.0-x gstreamer1.0-tools  # the screen: ximagesrc, in a gst-launch child
+          libmicrohttpd-dev)  # the web viewer's HTTP server
 if [[ "${1:-}" == ci ]]; then
   packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
 fi
@@ -24,7 +26,7 @@ if [[ "${1:-}" == bench ]]; then
 fi
 if [[ "${1:-}" == ci || "${1:-}" == e2e || "${1:-}" == capture-e2e || "${1:-}" == bench ]]; then
   packages+=(ffmpeg gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
-             gstreamer1.0-plugins-bad gstreamer1.0-libav python3)
+             gstreamer1.0-plugins-bad gstreamer1.0-libav python3 chromium)
 fi
 
 missing=()

@@ -1,0 +1,67 @@
+#pragma once
+
+#include <cstddef>
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#include "media/thread_mutex.h"
+
+// The live fMP4 stream as every web viewer gets it: one ring of fragments that the muxer
+// writes once and each viewer copies out at its own pace, so memory stays the same whatever
+// the viewers do. A viewer starts with the stream's init segment and the latest key fragment;
+// one that falls a quarter of the ring behind skips ahead to the latest key fragment, and one
+// overtaken in the middle of a fragment (it stopped reading) is ended.
+// Thread contract: one writer (Restart, Append) at a time; Read and WaitForStart from any
+// number of viewer threads; Stop from any thread.
+class FragmentRing {
+public:
+    explicit FragmentRing(size_t capacity);
+    FragmentRing(const FragmentRing&) = delete;
+    FragmentRing& operator=(const FragmentRing&) = delete;
+
+    // A new stream (first picture, or a new picture size): the init segment and the MIME type
+    // with codecs that viewers start with. Viewers of the previous stream end.
+    void Restart(const uint8_t* init, size_t len, const std::string& content_type);
+    // One fragment in two pieces (its boxes, then the sample). False, and nothing written,
+    // when it would take more than a quarter of the ring.
+    bool Append(const uint8_t* head, size_t head_len, const uint8_t* body, size_t body_len,
+                bool key);
+    // Every reader ends; later reads end at once.
+    void Stop();
+
+    struct Reader {
+        uint32_t generation = 0;   // the stream it reads; 0 before WaitForStart succeeds
+        uint64_t pos = 0;          // where its next bytes are, counted since the ring began
+        uint64_t record_left = 0;  // bytes of the fragment under way still to copy
+        size_t init_sent = 0;
+        unsigned skips = 0;  // times it fell behind and skipped to a key fragment
+    };
+    // Waits up to `wait_ms` for a stream with a key fragment and points the reader at it.
+    bool WaitForStart(Reader* reader, std::string* content_type, int wait_ms);
+    // Copies the reader's next bytes: their count, 0 when none came within `wait_ms`, -1 when
+    // the reader's stream has ended (`why` says how).
+    long Read(Reader* reader, uint8_t* out, size_t cap, int wait_ms, const char** why);
+
+    size_t capacity() const { return m_data.size(); }
+
+private:
+    static constexpr size_t kRecordHeader = 8;  // length (4 bytes) and flags (4 bytes)
+    static constexpr uint64_t kNoKey = UINT64_MAX;
+
+    void Put(uint64_t at, const uint8_t* src, size_t len) ORVEX_REQUIRES(m_lock);
+    void Get(uint64_t at, uint8_t* dst, size_t len) const ORVEX_REQUIRES(m_lock);
+    bool Overwritten(uint64_t pos) const ORVEX_REQUIRES(m_lock) {
+        return m_write_pos - pos > m_data.size();
+    }
+
+    thread_mutex m_lock;
+    thread_condition m_written;
+    std::vector<uint8_t> m_data;  // sized once
+    uint64_t m_write_pos ORVEX_GUARDED_BY(m_lock) = 0;
+    uint64_t m_last_key ORVEX_GUARDED_BY(m_lock) = kNoKey;
+    uint32_t m_generation ORVEX_GUARDED_BY(m_lock) = 0;
+    std::vector<uint8_t> m_init ORVEX_GUARDED_BY(m_lock);
+    std::string m_content_type ORVEX_GUARDED_BY(m_lock);
+    bool m_stopped ORVEX_GUARDED_BY(m_lock) = false;
+};
