@@ -39,7 +39,13 @@ if [[ $(id -u) -ne 0 ]] && ! getcap "$top/build/orvex" 2>/dev/null | grep -q cap
   echo "       sudo setcap cap_net_bind_service=+ep $top/build/orvex && $0"
   exit 1
 fi
+http_port=$(sed -n 's/^kv\.orvex\.http=\([0-9]*\)$/\1/p' "$ORVEX_PROP_FILE" | tail -n 1)
 echo "run: starting orvex; play it with"
 echo "       ffplay -rtsp_transport udp '$url'"
+if [[ -n $http_port ]]; then
+  echo "     or open the page in a browser (a phone on the same network too):"
+  login=; [[ $url == *@* ]] && login="   (the user and password of the URL above)"
+  echo "       http://$address:$http_port/$login"
+fi
 echo "     (stop with Ctrl-C or SIGTERM; ORVEX_AUTH=off $0 runs without passwords)"
 exec "$top/build/orvex" "$@"

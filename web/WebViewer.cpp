@@ -315,6 +315,10 @@ bool WebViewer::Start() {
                          m_options.port, strerror(errno));
         return false;
     }
+    if (m_options.port == 0) {  // any free port (tests): say which
+        const MHD_DaemonInfo* info = MHD_get_daemon_info(m_daemon, MHD_DAEMON_INFO_BIND_PORT);
+        if (info != nullptr) m_options.port = info->port;
+    }
     m_tapped = AddFrameSink(&m_muxer);
     OrvexLogPriority(platform::kLogInfo, kTag, "web viewer on port %u, at most %d viewers",
                      m_options.port, m_options.max_viewers);
