@@ -157,9 +157,16 @@ void LiveMuxer::FinishPicture() {
         return;
     }
     // After a pause in the pictures capture has started anew, and its sound with it.
-    if (m_pictures_seen++ == 0 || static_cast<uint32_t>(m_picture_ms - m_last_seen_ms) > 1000) {
+    const uint32_t pause = m_picture_ms - m_last_seen_ms;
+    if (m_pictures_seen++ == 0 || pause > 1000) {
         m_audio_seen = false;
         m_capture_start_ms = m_picture_ms;
+        // The stream's time goes on from where it stopped: a gap would stall the players at
+        // it, and a new stream would make every viewer connect again.
+        if (m_started && m_pictures_seen > 1) {
+            m_origin_ms += pause - m_picture_duration / 90;
+            m_audio_running = false;
+        }
     }
     m_last_seen_ms = m_picture_ms;
     const bool want_audio = AudioWanted(m_picture_ms);
@@ -251,6 +258,8 @@ void LiveMuxer::OnAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) 
     m_audio_seen = true;
     m_last_audio_ms = time_ms;
     if (!m_started || !m_stream_has_audio) return;
+    // Capture is starting again: the sound waits for the picture, which sets the time anew.
+    if (static_cast<int32_t>(time_ms - m_last_seen_ms) > 1000) return;
     const int32_t since = static_cast<int32_t>(time_ms - m_origin_ms);
     if (since < 0) return;  // from before the stream's first picture
     const uint64_t stamped = static_cast<uint64_t>(since) * (kAudioRate / 1000);

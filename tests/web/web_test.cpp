@@ -288,7 +288,11 @@ TEST(LiveMuxerTest, PicturesBecomeOneFragmentEachWithTheirTimes) {
         {'a', "21 00 aa", 1040, {{2, 40 * 48, "2100aa"}}},
         {'a', "21 01", 1061, {{2, 40 * 48 + 1024, "2101"}}},
         {'a', "21 02", 1500, {{2, 500 * 48, "2102"}}},  // a jump: the stamp again
-        {'v', P, 1066, {{1, 66 * 90, "00000004 419a0011"}}}});
+        {'v', P, 1066, {{1, 66 * 90, "00000004 419a0011"}}},
+        // Capture stops and starts again: the stream's time goes on without a gap.
+        {'a', "21 03", 2500, {}},
+        {'v', P, 3066, {{1, 99 * 90, "00000004 419a0011"}}},
+        {'a', "21 04", 3070, {{2, 103 * 48, "2104"}}}});
     Play("two slices a picture: known from the first, sent at the second after that", {
         {'v', SPS, 0, {}},
         {'v', PPS, 0, {}},
