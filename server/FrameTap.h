@@ -13,8 +13,9 @@ public:
     // the monotonic millisecond clock the video ring uses. Called on a binder pool thread (one
     // at a time: calls are serialised by the tap): copy what is needed and return, never block.
     virtual void OnVideoFrame(const uint8_t* data, size_t len, uint32_t time_ms) = 0;
-    // One raw AAC frame (no ADTS header), 1024 samples, with the producer's time stamp (the
-    // monotonic clock when the producer gave none). Called on the AAC encoder thread.
+    // One AAC frame as the encoder gives it (behind its ADTS header on both platforms), 1024
+    // samples, with the producer's time stamp (the monotonic clock when the producer gave
+    // none). Called on the AAC encoder thread.
     virtual void OnAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) = 0;
 };
 

@@ -255,6 +255,14 @@ bool LiveMuxer::StartStream(uint32_t time_ms) {
 }
 
 void LiveMuxer::OnAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) {
+    // The encoder frames its output in ADTS; MP4 carries the raw frame (browsers refuse the
+    // header), and the init segment says what the header would.
+    if (len >= 7 && data[0] == 0xFF && (data[1] & 0xF6) == 0xF0) {
+        const size_t header = (data[1] & 0x01) != 0 ? 7 : 9;  // 9: with a CRC
+        if (len <= header) return;
+        data += header;
+        len -= header;
+    }
     m_audio_seen = true;
     m_last_audio_ms = time_ms;
     if (!m_started || !m_stream_has_audio) return;

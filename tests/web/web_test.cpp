@@ -286,7 +286,8 @@ TEST(LiveMuxerTest, PicturesBecomeOneFragmentEachWithTheirTimes) {
         {'v', P, 1033, {{1, 33 * 90, "00000004 419a0011"}}},
         {'v', FILL, 1033, {}},
         {'a', "21 00 aa", 1040, {{2, 40 * 48, "2100aa"}}},
-        {'a', "21 01", 1061, {{2, 40 * 48 + 1024, "2101"}}},
+        {'a', "fff1 4c80 013f fc 21 01", 1061, {{2, 40 * 48 + 1024, "2101"}}},  // ADTS, raw out
+        {'a', "fff0 4c80 013f fc 1234 21 05", 1082, {{2, 40 * 48 + 2048, "2105"}}},  // with CRC
         {'a', "21 02", 1500, {{2, 500 * 48, "2102"}}},  // a jump: the stamp again
         {'v', P, 1066, {{1, 66 * 90, "00000004 419a0011"}}},
         // Capture stops and starts again: the stream's time goes on without a gap.
