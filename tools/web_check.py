@@ -41,7 +41,7 @@ class Browser:
         self.session = None
         self.next_id = 0
         self.pending = b""
-        self.events = []
+        self.answered = set()  # requests given the credentials
         to_browser = os.pipe()
         from_browser = os.pipe()
         # Chromium reads commands on fd 3 and writes answers on fd 4. The ends are first moved
@@ -167,8 +167,16 @@ class Browser:
         if method == "Fetch.requestPaused":
             self.send("Fetch.continueRequest", session=True, requestId=params["requestId"])
         elif method == "Fetch.authRequired":
+            # Asked again for the same request means the credentials were refused: a wrong
+            # password is given once, not until the service locks us out.
+            request = params["requestId"]
+            if request in self.answered:
+                self.send("Fetch.continueWithAuth", session=True, requestId=request,
+                          authChallengeResponse={"response": "CancelAuth"})
+                return
+            self.answered.add(request)
             user, password = self.credentials
-            self.send("Fetch.continueWithAuth", session=True, requestId=params["requestId"],
+            self.send("Fetch.continueWithAuth", session=True, requestId=request,
                       authChallengeResponse={"response": "ProvideCredentials",
                                              "username": user, "password": password})
         elif method == "Runtime.exceptionThrown":
@@ -231,13 +239,25 @@ def open_playing(url):
         raise
 
 
+def grown(before, after):
+    """How much a counter grew between two readings, when it may have restarted from 0."""
+    return after - before if after >= before else after
+
+
 def play(args):
     browser = open_playing(args.url)
     try:
-        first = browser.stats()
+        first = last = browser.stats()
+        frames = audio = 0
         start = time.monotonic()
-        browser.wait(args.seconds)
-        last = browser.stats()
+        end = start + args.seconds
+        while time.monotonic() < end:
+            browser.wait(min(0.5, end - time.monotonic()))
+            now = browser.stats()
+            # A reconnect gives the page a new media source, whose counters start at 0.
+            frames += grown(last["frames"], now["frames"])
+            audio += grown(last["audioBytes"], now["audioBytes"])
+            last = now
         elapsed = time.monotonic() - start
         if args.screenshot:
             import base64
@@ -246,16 +266,13 @@ def play(args):
                 f.write(base64.b64decode(shot["data"]))
     finally:
         browser.close()
-    # A reconnect restarts the element's counters; the frames after it are what we can count.
-    frames = last["frames"] - first["frames"] if last["reconnects"] == first["reconnects"] \
-        else last["frames"]
-    audio = -1 if last["audioBytes"] < 0 else \
-        (last["audioBytes"] - first["audioBytes"] if last["reconnects"] == first["reconnects"]
-         else last["audioBytes"])
+    if last["audioBytes"] < 0:
+        audio = -1  # a browser that does not count decoded sound
     fps = frames / elapsed
-    print("frames=%d fps=%.1f audio_bytes=%d errors=%d size=%dx%d reconnects=%d delay_ms=%d" %
-          (frames, fps, audio, len(last["errors"]), last["width"], last["height"],
-           last["reconnects"] - first["reconnects"], last["delayMs"]))
+    print("frames=%d fps=%.1f audio_bytes=%d errors=%d size=%dx%d reconnects=%d jumps=%d "
+          "delay_ms=%d" % (frames, fps, audio, len(last["errors"]), last["width"], last["height"],
+                           last["reconnects"] - first["reconnects"],
+                           last["jumps"] - first["jumps"], last["delayMs"]))
     for error in last["errors"]:
         print("web_check: page error: %s" % error, file=sys.stderr)
     failures = []
