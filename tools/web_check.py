@@ -4,9 +4,10 @@ DevTools protocol over a pipe, so nothing beyond the standard library is needed.
 
     web_check.py play URL SECONDS --fps N [--no-audio] [--screenshot PNG]
         open the page, wait until it plays, then watch it for SECONDS; one line
-        frames=.. fps=.. audio_bytes=.. errors=.. size=WxH reconnects=.. delay_ms=..
-        and exit 0 only if it decoded at least 0.9 N frames a second, decoded sound
-        (unless --no-audio) and saw no media error
+        frames=.. fps=.. audio_bytes=.. errors=.. size=WxH reconnects=.. jumps=.. delay_ms=..
+        (jumps: skips to the live edge; delay: buffered but not yet shown) and exit 0 only
+        if it decoded at least 0.9 N frames a second, decoded sound (unless --no-audio)
+        and saw no media error
     web_check.py latency URL SECONDS
         read the capture stamp the host test pattern draws in each frame the page shows
         and print the delay from capture to display, as rtsp_check.py latency does
@@ -15,6 +16,7 @@ URL is the page's (http://host:port/?width=..), with user:password@ when the ser
 for Digest: the browser is then given those credentials when challenged.
 """
 import argparse
+import base64
 import fcntl
 import json
 import os
@@ -85,7 +87,8 @@ class Browser:
         page = next((t for t in targets if t["type"] == "page"), None)
         target = page["targetId"] if page else \
             self.call("Target.createTarget", url="about:blank")["targetId"]
-        self.session = self.call("Target.attachToTarget", targetId=target, flatten=True)["sessionId"]
+        self.session = self.call("Target.attachToTarget", targetId=target,
+                                 flatten=True)["sessionId"]
         self.call("Page.enable", session=True)
         self.call("Runtime.enable", session=True)
         if self.credentials:
@@ -260,7 +263,6 @@ def play(args):
             last = now
         elapsed = time.monotonic() - start
         if args.screenshot:
-            import base64
             shot = browser.call("Page.captureScreenshot", session=True, format="png")
             with open(args.screenshot, "wb") as f:
                 f.write(base64.b64decode(shot["data"]))
