@@ -28,6 +28,7 @@ import sys
 import tempfile
 import time
 import urllib.parse
+import urllib.request
 
 START_TIMEOUT = 15     # s from opening the page until it plays
 COMMAND_TIMEOUT = 10   # s for any one DevTools command
@@ -381,6 +382,42 @@ def latency(args):
     return 0
 
 
+def gaps(args):
+    """Reads the stream itself, without a browser, and notes when each picture's fragment
+    arrives: the longest wait between two shows how long a viewer went without a picture."""
+    parts = urllib.parse.urlsplit(args.url)
+    plain = urllib.parse.urlunsplit(parts._replace(netloc=parts.hostname + (
+        ":%d" % parts.port if parts.port else "")))
+    passwords = urllib.request.HTTPPasswordMgrWithDefaultRealm()
+    if parts.username:
+        passwords.add_password(None, plain, urllib.parse.unquote(parts.username),
+                               urllib.parse.unquote(parts.password or ""))
+    opener = urllib.request.build_opener(urllib.request.HTTPDigestAuthHandler(passwords))
+    arrivals, pending = [], b""
+    end = time.monotonic() + args.seconds
+    with opener.open(plain, timeout=10) as answer:
+        while time.monotonic() < end:
+            chunk = answer.read1(65536)
+            if not chunk:
+                break
+            pending += chunk
+            while len(pending) >= 8:
+                size = int.from_bytes(pending[:4], "big")
+                if size < 8:
+                    raise RuntimeError("not an MP4 box stream")
+                if len(pending) < size:
+                    break
+                box, pending = pending[:size], pending[size:]
+                at = box.find(b"tfhd")
+                if box[4:8] == b"moof" and at > 0 and box[at + 8:at + 12] == b"\0\0\0\1":
+                    arrivals.append(time.monotonic())
+    if len(arrivals) < 2:
+        raise RuntimeError("%d pictures arrived" % len(arrivals))
+    longest = max(b - a for a, b in zip(arrivals, arrivals[1:]))
+    print("pictures=%d longest_gap_ms=%d" % (len(arrivals), longest * 1000))
+    return 0
+
+
 def main():
     parser = argparse.ArgumentParser(description=__doc__.split("\n\n")[0])
     sub = parser.add_subparsers(dest="mode", required=True)
@@ -393,9 +430,12 @@ def main():
     p = sub.add_parser("latency", help="capture-to-display delay of the host test pattern")
     p.add_argument("url")
     p.add_argument("seconds", type=float)
+    p = sub.add_parser("gaps", help="read /stream.mp4 and print the longest wait for a picture")
+    p.add_argument("url")
+    p.add_argument("seconds", type=float)
     args = parser.parse_args()
     try:
-        return play(args) if args.mode == "play" else latency(args)
+        return {"play": play, "latency": latency, "gaps": gaps}[args.mode](args)
     except RuntimeError as e:
         print("web_check: %s" % e, file=sys.stderr)
         return 2

@@ -58,6 +58,7 @@ bool FragmentRing::Append(const uint8_t* head, size_t head_len, const uint8_t* b
     Put(at + kRecordHeader, head, head_len);
     Put(at + kRecordHeader + head_len, body, body_len);
     m_write_pos = at + total;
+    m_last_write = std::chrono::steady_clock::now();
     if (key) m_last_key = at;
     m_written.notify_all();
     return true;
@@ -72,10 +73,14 @@ void FragmentRing::Stop() {
 bool FragmentRing::WaitForStart(Reader* reader, std::string* content_type, int wait_ms) {
     const auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(wait_ms);
     thread_mutex::Scoped hold(m_lock);
-    while (!m_stopped && (m_last_key == kNoKey || Overwritten(m_last_key))) {
+    auto ready = [&]() ORVEX_REQUIRES(m_lock) {
+        return m_last_key != kNoKey && !Overwritten(m_last_key) &&
+               std::chrono::steady_clock::now() - m_last_write < std::chrono::milliseconds(kLiveMs);
+    };
+    while (!m_stopped && !ready()) {
         if (!m_written.wait_until(m_lock, until)) break;
     }
-    if (m_stopped || m_last_key == kNoKey || Overwritten(m_last_key)) return false;
+    if (m_stopped || !ready()) return false;
     *reader = Reader{};
     reader->generation = m_generation;
     reader->pos = m_last_key;

@@ -69,6 +69,12 @@ TEST(FragmentRingTest, AViewerStartsAtTheLatestKeyFragmentAfterTheInitSegment) {
     EXPECT_EQ(Drain(ring, reader), Text("INIThKEY2hd1"));
     ring.Append(head.data(), 1, delta.data(), delta.size(), false);
     EXPECT_EQ(Drain(ring, reader), Text("hd1"));
+    // Capture stopped: what is left is not a stream to start on.
+    usleep(1100 * 1000);
+    EXPECT_FALSE(ring.WaitForStart(&reader, &type, 0));
+    ring.Append(head.data(), 1, key1.data(), key1.size(), true);
+    ASSERT_TRUE(ring.WaitForStart(&reader, &type, 0));
+    EXPECT_EQ(Drain(ring, reader), Text("INIThKEY1"));
 }
 
 TEST(FragmentRingTest, EndsAndSkipsAsTheWriterMovesOn) {
