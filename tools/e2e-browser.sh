@@ -47,10 +47,9 @@ gap=$(sed -n 's/.*longest_gap_ms=\([0-9]*\).*/\1/p' "$work/gaps")
 [[ -n $gap && $gap -le 2500 ]] || fail "the web viewer waited too long for its picture: $(cat "$work/gaps")"
 ok "an RTSP client came and went (capture stopped for all): $(cat "$work/gaps")"
 
-for run in 1 2 3; do
-  line=$(python3 "$top/tools/web_check.py" latency "$page" 10 2>&1) || fail "latency: $line"
-  echo "$name: glass-to-glass in chromium, run $run: $line"
-done
+# Printed, not judged: a figure of speed (bench/README.md has three runs of 30 s).
+line=$(python3 "$top/tools/web_check.py" latency "$page" 20 2>&1) || fail "latency: $line"
+echo "$name: glass-to-glass in chromium over 20 s: $line"
 
 kill -TERM "$pid"
 timeout 10 tail -s 0.1 --pid="$pid" -f /dev/null || fail "orvex still running 10 s after SIGTERM"

@@ -302,7 +302,8 @@ STAMP_READER = r"""
     const cell = Math.floor(width / 40) & ~7;
     if (cell < 8 || height < 8 * cell) return null;
     const x0 = cell, y0 = (height - 2 * cell) & ~7, half = cell >> 1, top = y0 + (cell >> 2);
-    const rows = ctx.getImageData(0, top, width, half).data;
+    // Only the stamp's rows are drawn (see onFrame): row 0 of the canvas is row `top`.
+    const rows = ctx.getImageData(0, 0, width, half).data;
     let stamp = 0;
     for (let i = 0; i < 36; i++) {
       const x = x0 + i * cell + (cell >> 2);
@@ -324,11 +325,14 @@ STAMP_READER = r"""
     const width = video.videoWidth, height = video.videoHeight;
     record.frames++;
     if (width && height) {
-      if (canvas.width !== width || canvas.height !== height) {
+      // Drawing the whole picture for a strip of it costs the page frames on a slow machine.
+      const cell = Math.floor(width / 40) & ~7, half = Math.max(1, cell >> 1);
+      const top = ((height - 2 * cell) & ~7) + (cell >> 2);
+      if (canvas.width !== width || canvas.height !== half) {
         canvas.width = width;
-        canvas.height = height;
+        canvas.height = half;
       }
-      ctx.drawImage(video, 0, 0, width, height);
+      ctx.drawImage(video, 0, top, width, half, 0, 0, width, half);
       const stamp = readStamp(width, height);
       if (stamp !== null) record.stamps.push([stamp, shown]);
     }

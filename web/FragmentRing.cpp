@@ -59,7 +59,10 @@ bool FragmentRing::Append(const uint8_t* head, size_t head_len, const uint8_t* b
     Put(at + kRecordHeader + head_len, body, body_len);
     m_write_pos = at + total;
     m_last_write = std::chrono::steady_clock::now();
-    if (key) m_last_key = at;
+    if (key) {
+        m_last_key = at;
+        m_last_key_write = m_last_write;
+    }
     m_written.notify_all();
     return true;
 }
@@ -71,14 +74,19 @@ void FragmentRing::Stop() {
 }
 
 bool FragmentRing::WaitForStart(Reader* reader, std::string* content_type, int wait_ms) {
-    const auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(wait_ms);
+    using std::chrono::milliseconds;
+    const auto begin = std::chrono::steady_clock::now();
+    const auto until = begin + milliseconds(wait_ms);
     thread_mutex::Scoped hold(m_lock);
     auto ready = [&]() ORVEX_REQUIRES(m_lock) {
+        const auto now = std::chrono::steady_clock::now();
         return m_last_key != kNoKey && !Overwritten(m_last_key) &&
-               std::chrono::steady_clock::now() - m_last_write < std::chrono::milliseconds(kLiveMs);
+               now - m_last_write < milliseconds(kLiveMs) &&
+               (now - m_last_key_write < milliseconds(kFreshKeyMs) ||
+                now - begin >= milliseconds(kFreshWaitMs));
     };
-    while (!m_stopped && !ready()) {
-        if (!m_written.wait_until(m_lock, until)) break;
+    while (!m_stopped && !ready() && std::chrono::steady_clock::now() < until) {
+        m_written.wait_until(m_lock, std::min(until, begin + milliseconds(kFreshWaitMs)));
     }
     if (m_stopped || !ready()) return false;
     *reader = Reader{};

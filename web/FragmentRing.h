@@ -41,6 +41,9 @@ public:
     // Waits up to `wait_ms` for a live stream (a fragment written within kLiveMs) with a key
     // fragment and points the reader at it. What is left of a stream whose capture stopped is
     // not served: the next capture may have another size, and its time goes on after a gap.
+    // A key fragment older than kFreshKeyMs is taken only after kFreshWaitMs without a newer
+    // one: a viewer that starts far behind the live edge must decode its way forward at once,
+    // which stalls a browser's playback just as it begins.
     bool WaitForStart(Reader* reader, std::string* content_type, int wait_ms);
     // Copies the reader's next bytes: their count, 0 when none came within `wait_ms`, -1 when
     // the reader's stream has ended (`why` says how).
@@ -52,6 +55,8 @@ private:
     static constexpr size_t kRecordHeader = 8;  // length (4 bytes) and flags (4 bytes)
     static constexpr uint64_t kNoKey = UINT64_MAX;
     static constexpr int kLiveMs = 1000;
+    static constexpr int kFreshKeyMs = 300;
+    static constexpr int kFreshWaitMs = 3000;
 
     void Put(uint64_t at, const uint8_t* src, size_t len) ORVEX_REQUIRES(m_lock);
     void Get(uint64_t at, uint8_t* dst, size_t len) const ORVEX_REQUIRES(m_lock);
@@ -65,6 +70,7 @@ private:
     uint64_t m_write_pos ORVEX_GUARDED_BY(m_lock) = 0;
     uint64_t m_last_key ORVEX_GUARDED_BY(m_lock) = kNoKey;
     std::chrono::steady_clock::time_point m_last_write ORVEX_GUARDED_BY(m_lock);
+    std::chrono::steady_clock::time_point m_last_key_write ORVEX_GUARDED_BY(m_lock);
     uint32_t m_generation ORVEX_GUARDED_BY(m_lock) = 0;
     std::vector<uint8_t> m_init ORVEX_GUARDED_BY(m_lock);
     std::string m_content_type ORVEX_GUARDED_BY(m_lock);

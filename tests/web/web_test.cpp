@@ -75,6 +75,13 @@ TEST(FragmentRingTest, AViewerStartsAtTheLatestKeyFragmentAfterTheInitSegment) {
     ring.Append(head.data(), 1, key1.data(), key1.size(), true);
     ASSERT_TRUE(ring.WaitForStart(&reader, &type, 0));
     EXPECT_EQ(Drain(ring, reader), Text("INIThKEY1"));
+    // A live stream whose key fragment is old: a newer one is waited for.
+    usleep(400 * 1000);
+    ring.Append(head.data(), 1, delta.data(), delta.size(), false);
+    EXPECT_FALSE(ring.WaitForStart(&reader, &type, 0));
+    ring.Append(head.data(), 1, key2.data(), key2.size(), true);
+    ASSERT_TRUE(ring.WaitForStart(&reader, &type, 0));
+    EXPECT_EQ(Drain(ring, reader), Text("INIThKEY2"));
 }
 
 TEST(FragmentRingTest, EndsAndSkipsAsTheWriterMovesOn) {
