@@ -13,34 +13,14 @@
 #include <string>
 #include <vector>
 
+#include "tests/web/HexBytes.h"
 #include "tools/AccessUnitSplitter.h"
 
 namespace {
 
-using Bytes = std::vector<uint8_t>;
-
-// "0000 6d6f" -> bytes; blanks are for the reader only.
-Bytes Unhex(const std::string& hex) {
-    Bytes out;
-    std::string digits;
-    for (char c : hex) {
-        if (c != ' ') digits += c;
-    }
-    for (size_t i = 0; i + 1 < digits.size(); i += 2) {
-        out.push_back(static_cast<uint8_t>(std::stoul(digits.substr(i, 2), nullptr, 16)));
-    }
-    return out;
-}
-
-std::string Hex(const Bytes& b) {
-    std::string s;
-    char buf[3];
-    for (uint8_t v : b) {
-        snprintf(buf, sizeof buf, "%02x", v);
-        s += buf;
-    }
-    return s;
-}
+using hexbytes::Bytes;
+using hexbytes::Hex;
+using hexbytes::Unhex;
 
 uint32_t U32(const uint8_t* p) {
     return uint32_t(p[0]) << 24 | uint32_t(p[1]) << 16 | uint32_t(p[2]) << 8 | p[3];

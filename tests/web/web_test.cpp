@@ -16,25 +16,16 @@
 #include "auth/Digest.h"
 #include "platform/fake/FakePlatform.h"
 #include "server/FrameTap.h"
+#include "tests/web/HexBytes.h"
 #include "web/FragmentRing.h"
 #include "web/LiveMuxer.h"
 #include "web/WebViewer.h"
 
 namespace {
 
-using Bytes = std::vector<uint8_t>;
-
-Bytes Unhex(const std::string& hex) {
-    Bytes out;
-    std::string digits;
-    for (char c : hex) {
-        if (isxdigit(static_cast<unsigned char>(c))) digits += c;
-    }
-    for (size_t i = 0; i + 1 < digits.size(); i += 2) {
-        out.push_back(static_cast<uint8_t>(std::stoul(digits.substr(i, 2), nullptr, 16)));
-    }
-    return out;
-}
+using hexbytes::Bytes;
+using hexbytes::Hex;
+using hexbytes::Unhex;
 
 Bytes Text(const std::string& s) { return Bytes(s.begin(), s.end()); }
 
@@ -186,16 +177,6 @@ std::ostream& operator<<(std::ostream& os, const Fragment& f) {
 }
 
 uint32_t Be32(const uint8_t* p) { return uint32_t{p[0]} << 24 | p[1] << 16 | p[2] << 8 | p[3]; }
-
-std::string Hex(const uint8_t* p, size_t n) {
-    std::string out;
-    char b[3];
-    for (size_t i = 0; i < n; ++i) {
-        snprintf(b, sizeof b, "%02x", p[i]);
-        out += b;
-    }
-    return out;
-}
 
 // Box offset of `type` inside [p, p + n), searched in the nesting moof/traf.
 const uint8_t* FindBox(const uint8_t* p, size_t n, const char* type) {
