@@ -248,9 +248,15 @@ def grown(before, after):
     return after - before if after >= before else after
 
 
+SETTLE_SECONDS = 2.0
+
+
 def play(args):
     browser = open_playing(args.url)
     try:
+        # The first moments go to reaching the live edge (the page may jump there once): the
+        # rate is taken from then on.
+        browser.wait(SETTLE_SECONDS)
         first = last = browser.stats()
         frames = audio = 0
         start = time.monotonic()
