@@ -190,6 +190,9 @@ void Publisher::Stop() {
 
 void Publisher::OnVideoFrame(const uint8_t* data, size_t len, uint32_t time_ms) {
     ForEachNalUnit(data, len, [&](const uint8_t* nal, size_t n) { OnNal(nal, n, time_ms); });
+    // A picture with as many slices as the last one is complete: it goes now rather than when
+    // the next one begins. Judged per call, as a call may carry several slices.
+    if (m_send_early && m_slices_per_unit > 0 && m_unit_slices >= m_slices_per_unit) FinishUnit();
 }
 
 void Publisher::OnNal(const uint8_t* nal, size_t len, uint32_t time_ms) {
@@ -198,9 +201,13 @@ void Publisher::OnNal(const uint8_t* nal, size_t len, uint32_t time_ms) {
     if (m_unit_slices > 0 && BeginsNextAccessUnit(nal, len)) FinishUnit();
     const bool slice = type == 1 || type == 5;
     if (slice && m_unit_slices == 0 && !BeginsNextAccessUnit(nal, len)) {
-        // The rest of a picture that went early (or began before the tap did): wait for
-        // picture ends from now on, and leave it out; its picture is gone.
-        m_slices_per_unit = 0;
+        // The rest of a picture that went early (its slices grew in number), or one that began
+        // before the tap did. What depends on it is dropped, and from now on a picture goes
+        // when the next one begins.
+        if (m_slices_per_unit > 0) {
+            m_send_early = false;
+            for (auto& server : m_servers) server->queue.DropToKeyFrame();
+        }
         return;
     }
     if (m_unit.empty()) m_unit_ms = time_ms;
@@ -214,7 +221,6 @@ void Publisher::OnNal(const uint8_t* nal, size_t len, uint32_t time_ms) {
     if (!slice) return;
     ++m_unit_slices;
     if (type == 5) m_unit_key = true;
-    if (m_slices_per_unit > 0 && m_unit_slices >= m_slices_per_unit) FinishUnit();
 }
 
 void Publisher::FinishUnit() {

@@ -63,8 +63,10 @@ private:
     bool m_unit_key = false;
     bool m_unit_too_large = false;
     // Slices the previous picture had: a picture that reaches as many goes at once instead of
-    // when the next one begins, which saves a frame's time (0: unknown).
+    // when the next one begins, which saves a frame's time (0: unknown). Off for good once
+    // the slices of a picture outnumbered the last one's.
     int m_slices_per_unit = 0;
+    bool m_send_early = true;
 };
 
 // The back-off after a failed connection: `first_ms` after the first, then doubling up to

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <atomic>
+#include <chrono>
 #include <condition_variable>
 #include <cstdint>
 #include <mutex>
@@ -48,6 +50,7 @@ public:
     int attempts_locked() const { return attempts_; }
     size_t writes_locked() const { return writes_.size(); }
     int sessions_locked() const { return static_cast<int>(opened_.size()); }
+    int64_t last_pts_locked() const { return writes_.empty() ? -1 : writes_.back().pts_ms; }
 
 private:
     friend class FakePublishSession;
