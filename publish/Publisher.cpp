@@ -59,6 +59,7 @@ struct Publisher::Server {
     // The server's thread only.
     std::unique_ptr<platform::PublishSession> session;
     std::vector<uint8_t> sps, pps;
+    std::vector<uint8_t> session_sps, session_pps;  // what the session's header carries
     uint32_t origin_ms = 0;
     int backoff_ms = 0;
     int64_t retry_at_ms = 0;
@@ -91,6 +92,14 @@ void Publisher::Server::Run() {
                     (type == 7 ? sps : pps).assign(nal, nal + n);
             });
             if (frame.key && dropped == 0) drop_told = false;
+            // Capture restarted with another size (an RTSP client chose it): the stream's
+            // header no longer describes the pictures, so the server gets a new stream.
+            if (session != nullptr && frame.key && (sps != session_sps || pps != session_pps)) {
+                OrvexLogPriority(platform::kLogInfo, kTag,
+                                 "publish %s: new SPS/PPS; starting the stream anew",
+                                 url.url.c_str());
+                session.reset();
+            }
         }
         if (session == nullptr) {
             if (!video || !frame.key || sps.empty() || pps.empty()) continue;
@@ -126,6 +135,8 @@ bool Publisher::Server::Connect(uint32_t time_ms) {
         return false;
     }
     origin_ms = time_ms;
+    session_sps = sps;
+    session_pps = pps;
     backoff_ms = 0;
     drop_told = false;
     if (outage) {

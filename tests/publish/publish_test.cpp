@@ -222,11 +222,20 @@ TEST_F(PublisherTest, SessionGetsAccessUnitsAndTimesFromTheFirstKeyPicture) {
     Video(publisher, AnnexB({Unhex("0910"), kSps}), 1100);  // AUD: the last picture is done
     KeyPicture(publisher, 1100);
     Video(publisher, AnnexB({kP}), 1133);  // a later picture ends the key picture
-    const auto writes = WaitForWrites(5);
+    // Capture restarts at another size: a new stream, its times from its own first picture.
+    const Bytes other_sps = Unhex("6742c01e8c8d40501e");
+    Video(publisher, AnnexB({other_sps, kPps, kIdr}), 1200);
+    Video(publisher, AnnexB({kP}), 1233);
+    ASSERT_TRUE(server.WaitFor(5000, [](FakePublish& s) { return s.sessions_locked() == 2; }));
+    const auto writes = WaitForWrites(7);
     publisher.Stop();
 
     const auto opened = server.opened();
-    ASSERT_EQ(opened.size(), 1u);
+    ASSERT_EQ(opened.size(), 2u);
+    EXPECT_EQ(opened[1].sps, other_sps);
+    EXPECT_EQ(writes[6].session, 2);
+    EXPECT_EQ(writes[6].pts_ms, 0);
+    EXPECT_TRUE(writes[6].key);
     EXPECT_EQ(opened[0].url, "rtmp://127.0.0.1/live/tv");
     EXPECT_EQ(opened[0].container, "flv");
     EXPECT_EQ(opened[0].sps, kSps);
