@@ -83,6 +83,14 @@ public:
     void close(void*) override {}
 };
 
+class NullPublish final : public PublishPort {
+public:
+    std::unique_ptr<PublishSession> Open(const PublishTarget&, std::string* error) override {
+        if (error != nullptr) *error = "publishing is not available on this platform";
+        return nullptr;
+    }
+};
+
 NullLog g_null_log;
 NullProperties g_null_properties;
 NullPipManager g_null_pip;
@@ -94,6 +102,7 @@ NullTvManager g_null_tv;
 NullPxAudioOut g_null_px;
 NullAudioRecords g_null_records;
 NullAacLibrary g_null_aac;
+NullPublish g_null_publish;
 
 std::atomic<LogPort*> g_log{&g_null_log};
 std::atomic<PropertyPort*> g_properties{&g_null_properties};
@@ -106,6 +115,7 @@ std::atomic<TvManagerPort*> g_tv{&g_null_tv};
 std::atomic<PxAudioOutPort*> g_px{&g_null_px};
 std::atomic<AudioRecordPort*> g_records{&g_null_records};
 std::atomic<AacLibraryPort*> g_aac{&g_null_aac};
+std::atomic<PublishPort*> g_publish{&g_null_publish};
 
 template <typename T, typename Null>
 void Set(std::atomic<T*>& slot, T* port, Null& fallback) {
@@ -126,6 +136,7 @@ void Install(const Ports& ports) {
     Set<PxAudioOutPort>(g_px, ports.px_audio_out, g_null_px);
     Set<AudioRecordPort>(g_records, ports.audio_record, g_null_records);
     Set<AacLibraryPort>(g_aac, ports.aac_library, g_null_aac);
+    Set<PublishPort>(g_publish, ports.publish, g_null_publish);
 }
 
 Ports Installed() {
@@ -141,6 +152,7 @@ Ports Installed() {
     p.px_audio_out = g_px.load(std::memory_order_acquire);
     p.audio_record = g_records.load(std::memory_order_acquire);
     p.aac_library = g_aac.load(std::memory_order_acquire);
+    p.publish = g_publish.load(std::memory_order_acquire);
     return p;
 }
 
@@ -155,5 +167,6 @@ TvManagerPort& TvManager() { return *g_tv.load(std::memory_order_acquire); }
 PxAudioOutPort& PxAudioOut() { return *g_px.load(std::memory_order_acquire); }
 AudioRecordPort& AudioRecords() { return *g_records.load(std::memory_order_acquire); }
 AacLibraryPort& AacLibrary() { return *g_aac.load(std::memory_order_acquire); }
+PublishPort& Publish() { return *g_publish.load(std::memory_order_acquire); }
 
 }  // namespace platform

@@ -7,6 +7,7 @@
 #include "platform/LogPort.h"
 #include "platform/PipManagerPort.h"
 #include "platform/PropertyPort.h"
+#include "platform/PublishPort.h"
 
 // The installed platform implementation: one object per port, reached by the layers above.
 // Thread contract: Install before any other thread uses a port (start-up, or a test's set-up);
@@ -27,6 +28,7 @@ struct Ports {
     PxAudioOutPort* px_audio_out = nullptr;
     AudioRecordPort* audio_record = nullptr;
     AacLibraryPort* aac_library = nullptr;
+    PublishPort* publish = nullptr;
 };
 
 // Null members install the null implementation of that port. Ports are not owned.
@@ -44,6 +46,7 @@ TvManagerPort& TvManager();
 PxAudioOutPort& PxAudioOut();
 AudioRecordPort& AudioRecords();
 AacLibraryPort& AacLibrary();
+PublishPort& Publish();
 
 // Defined by the platform library the executable links (host or android), never by fakes.
 void InstallDefaultPorts();

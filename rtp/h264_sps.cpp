@@ -211,3 +211,22 @@ uint32_t h264_parse_sps(const uint8_t* data, unsigned size, uint32_t previous_ti
     }
     return sps->timing_info_present_flag ? sps->time_scale : previous_time_scale;
 }
+
+bool h264_picture_size(const uint8_t* sps, size_t size, uint16_t* width, uint16_t* height) {
+    if (sps == nullptr || size < 4) return false;
+    h264_sps_t parsed{};
+    h264_parse_sps(sps + 1, static_cast<unsigned>(size - 1), 0, &parsed);
+    const uint32_t frame_height_factor = 2 - (parsed.frame_mbs_only_flag & 1);
+    const uint64_t w = (uint64_t{parsed.pic_width_in_mbs_minus1} + 1) * 16;
+    const uint64_t h =
+        (uint64_t{parsed.pic_height_in_map_units_minus1} + 1) * 16 * frame_height_factor;
+    const uint64_t crop_w =
+        2 * (uint64_t{parsed.frame_crop_left_offset} + parsed.frame_crop_right_offset);
+    const uint64_t crop_h =
+        2 * frame_height_factor *
+        (uint64_t{parsed.frame_crop_top_offset} + parsed.frame_crop_bottom_offset);
+    if (w > 16384 || h > 16384 || crop_w >= w || crop_h >= h) return false;
+    *width = static_cast<uint16_t>(w - crop_w);
+    *height = static_cast<uint16_t>(h - crop_h);
+    return true;
+}

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstddef>
 #include <cstdint>
 
 // H.264 sequence parameter set parsing (ITU-T H.264 7.3.2.1.1 with the VUI of E.1.1 and the
@@ -111,3 +112,7 @@ void h264_decode_hrd_parameters(bs_s* s, h264_hrd_t* hrd);
 // and do not stop the caller.
 uint32_t h264_parse_sps(const uint8_t* data, unsigned size, uint32_t previous_time_scale,
                         h264_sps_t* sps);
+
+// The picture's displayed size from an SPS given with its NAL header byte (4:2:0 cropping).
+// False when the SPS is too short or gives a size over 16384 or cropped to nothing.
+bool h264_picture_size(const uint8_t* sps, size_t size, uint16_t* width, uint16_t* height);

@@ -1,5 +1,7 @@
 #include "rtsp/CaptureQuery.h"
 
+#include <cctype>
+
 #include "capture/LivecameraResolution.h"
 #include "rtsp/KeyWordValue.h"
 #include "rtsp/RequestFields.h"
@@ -47,4 +49,30 @@ CaptureQueryResult ApplyCaptureQuery(const std::string& query) {
         Number(values[4]), Number(values[5]), Number(values[6]),
         values[7] == "followmain" ? 1u : 0u, Number(values[8]));
     return refused != 0 ? CaptureQueryResult::kRefused : CaptureQueryResult::kApplied;
+}
+
+std::string CaptureQueryFor(const std::string& query) {
+    static const char* const kKeys[][2] = {
+        {"width", "1280"},  {"height", "720"},  {"cameraid", "hd0"}, {"win", "main"},
+        {"sub", "0"},       {"dumpvideo", "0"}, {"dumpaudio", "0"},  {"specialcase", "none"},
+        {"framerate", "30"}};
+    std::string out = "?";
+    for (const auto& key : kKeys) {
+        std::string value = key[1];
+        const std::string name = std::string(key[0]) + "=";
+        for (size_t at = query.find(name); at != std::string::npos; at = query.find(name, at + 1)) {
+            if (at != 0 && query[at - 1] != '?' && query[at - 1] != '&') continue;
+            size_t end = at + name.size();
+            while (end < query.size() && end - at - name.size() < 16 &&
+                   (isalnum(static_cast<unsigned char>(query[end])) || query[end] == '_')) {
+                ++end;
+            }
+            if (end > at + name.size())
+                value = query.substr(at + name.size(), end - at - name.size());
+            break;
+        }
+        if (out.size() > 1) out += "&";
+        out += name + value;
+    }
+    return out;
 }

@@ -12,3 +12,8 @@ enum class CaptureQueryResult {
 };
 
 CaptureQueryResult ApplyCaptureQuery(const std::string& query);
+
+// The capture a consumer beside RTSP (a web viewer, the publisher) asks for, as a query from
+// its '?' on: the capture keys `query` gives (a value of letters, digits and '_' only), the
+// rest as tools/run.sh's URL has them. Any thread: a pure function.
+std::string CaptureQueryFor(const std::string& query);

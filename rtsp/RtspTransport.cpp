@@ -266,6 +266,9 @@ void RtspTransport::ServeCaptureHolders() {
     std::string query;
     {
         thread_mutex::Scoped hold(m_hold_lock);
+        // A connected RTSP client may still choose the capture: the hold's choice waits until
+        // nobody is connected, rather than being lost and capture started with none at all.
+        if (m_hold_query_pending && !nobody) return;
         if (m_hold_query_pending) query.swap(m_hold_query);
         m_hold_query_pending = false;
     }

@@ -12,6 +12,7 @@
 #include "capture/Livecamera.h"
 #include "capture/orvexaudiomain.h"
 #include "platform/Ports.h"
+#include "publish/Publisher.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
@@ -126,7 +127,8 @@ int main(int argc, char** argv) {
         skyvo_rtsp_sever_close();
         return result;
     }
-    StartWebViewer(skyvo_rtsp_service()->listener());  // only when kv.orvex.http names a port
+    StartWebViewer(skyvo_rtsp_service()->listener());   // only when kv.orvex.http names a port
+    StartPublishing(skyvo_rtsp_service()->listener());  // only when kv.orvex.publish names servers
     start_orvex_system_service();
     const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
     int signal_pipe[2] = {-1, -1};
@@ -144,8 +146,9 @@ int main(int argc, char** argv) {
     }
     ReportSignal();
 
-    // Clients and send sessions go before the frame source does; web viewers hold capture
-    // through the listener, so they go first.
+    // Clients and send sessions go before the frame source does; web viewers and the publisher
+    // hold capture through the listener, so they go first.
+    StopPublishing();
     StopWebViewer();
     skyvo_rtsp_sever_close();
     close_orvex_system_service();

@@ -2,7 +2,8 @@
 # Installs the Debian 12 packages a build needs, and only those that are missing.
 #   install-deps.sh          what building, running and testing on this machine needs
 #   install-deps.sh e2e      that, plus the clients of the end-to-end check (ffmpeg, GStreamer,
-#                            a headless chromium for the web viewer)
+#                            a headless chromium for the web viewer, nginx with its RTMP module
+#                            and the SRT tools to publish to)
 #   install-deps.sh capture-e2e  that, plus a virtual screen and a sound server to capture
 #   install-deps.sh bench    that, plus the e2e clients and the peer server bench/peer_cost.sh
 #                            serves beside orvex (gst-rtsp-server through Python), and perf
@@ -14,7 +15,8 @@ packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock
           libgstreamer1.0-dev libgstreamer-plugins-base1.0-dev gstreamer1.0-plugins-base
           gstreamer1.0-plugins-good gstreamer1.0-alsa
           gstreamer1.0-x gstreamer1.0-tools  # the screen: ximagesrc, in a gst-launch child
-          libmicrohttpd-dev)  # the web viewer's HTTP server
+          libmicrohttpd-dev  # the web viewer's HTTP server
+          libavformat-dev libavcodec-dev libavutil-dev)  # publishing to media servers
 if [[ "${1:-}" == ci ]]; then
   packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
 fi
@@ -26,7 +28,8 @@ if [[ "${1:-}" == bench ]]; then
 fi
 if [[ "${1:-}" == ci || "${1:-}" == e2e || "${1:-}" == capture-e2e || "${1:-}" == bench ]]; then
   packages+=(ffmpeg gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
-             gstreamer1.0-plugins-bad gstreamer1.0-libav python3 chromium)
+             gstreamer1.0-plugins-bad gstreamer1.0-libav python3 chromium
+             nginx libnginx-mod-rtmp srt-tools)  # a media server to publish to
 fi
 
 missing=()

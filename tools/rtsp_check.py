@@ -8,6 +8,7 @@
     rtsp_check.py split URL [SECONDS]     the same delay cut in two: capture to the frame's last
                                           packet here, and that packet to the decoded frame
     rtsp_check.py stamps URL [SECONDS]    the audio RTP time stamp steps (one AAC frame each)
+    (measure and latency also read what a media server gives: rtmp://, an HLS playlist, a file)
     rtsp_check.py guess URL SOURCE        wrong passwords from SOURCE until the connection ends,
                                           then the URL's right one from there
 
@@ -173,12 +174,16 @@ def audio_payload_types(url):
 
 
 def measure(url, seconds):
-    announced, carried = audio_payload_types(url)
-    time.sleep(1)  # the service stops capture when that client leaves
     session = sdp_file = None
-    if carried == announced:
-        source = ["-rtsp_transport", "udp", "-t", str(seconds), "-i", url]
+    if not url.startswith("rtsp://"):  # a media server's stream (RTMP, HLS, SRT): as it is
+        announced = carried = 0
+        source = ["-t", str(seconds), "-i", url]
     else:
+        announced, carried = audio_payload_types(url)
+        time.sleep(1)  # the service stops capture when that client leaves
+    if url.startswith("rtsp://") and carried == announced:
+        source = ["-rtsp_transport", "udp", "-t", str(seconds), "-i", url]
+    elif url.startswith("rtsp://"):
         video, audio = udp_pair(), udp_pair()
         ports = [video.getsockname()[1], audio.getsockname()[1]]
         video.close()
@@ -261,9 +266,11 @@ def latency(url, seconds):
     CLOCK_MONOTONIC, and a frame counts as displayed when its last byte leaves the decoder."""
     width = int((re.search(r"[?&]width=(\d+)", url) or [0, 1280])[1])
     height = int((re.search(r"[?&]height=(\d+)", url) or [0, 720])[1])
+    # RTSP announces its tracks; a media server's stream (RTMP) is probed as ffmpeg likes.
+    rtsp = ["-probesize", "32", "-analyzeduration", "0", "-rtsp_transport", "udp"]
     cmd = ["ffmpeg", "-hide_banner", "-loglevel", "error", "-fflags", "nobuffer",
-           "-flags", "low_delay", "-probesize", "32", "-analyzeduration", "0",
-           "-rtsp_transport", "udp", "-t", str(seconds), "-i", url, "-map", "0:v",
+           "-flags", "low_delay"] + (rtsp if url.startswith("rtsp://") else []) + [
+           "-t", str(seconds), "-i", url, "-map", "0:v",
            "-vsync", "passthrough", "-pix_fmt", "gray", "-f", "rawvideo", "-"]
     size = width * height
     delays, frames = [], 0

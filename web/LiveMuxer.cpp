@@ -31,26 +31,6 @@ enum NalType : uint8_t {
     kFiller = 12
 };
 
-// The picture's displayed size from its SPS (NAL header byte included), 4:2:0 cropping.
-bool PictureSize(const std::vector<uint8_t>& sps, uint16_t* width, uint16_t* height) {
-    if (sps.size() < 4) return false;
-    h264_sps_t parsed{};
-    h264_parse_sps(sps.data() + 1, static_cast<unsigned>(sps.size() - 1), 0, &parsed);
-    const uint32_t frame_height_factor = 2 - (parsed.frame_mbs_only_flag & 1);
-    const uint64_t w = (uint64_t{parsed.pic_width_in_mbs_minus1} + 1) * 16;
-    const uint64_t h =
-        (uint64_t{parsed.pic_height_in_map_units_minus1} + 1) * 16 * frame_height_factor;
-    const uint64_t crop_w =
-        2 * (uint64_t{parsed.frame_crop_left_offset} + parsed.frame_crop_right_offset);
-    const uint64_t crop_h =
-        2 * frame_height_factor *
-        (uint64_t{parsed.frame_crop_top_offset} + parsed.frame_crop_bottom_offset);
-    if (w > 16384 || h > 16384 || crop_w >= w || crop_h >= h) return false;
-    *width = static_cast<uint16_t>(w - crop_w);
-    *height = static_cast<uint16_t>(h - crop_h);
-    return true;
-}
-
 }  // namespace
 
 LiveMuxer::LiveMuxer(FragmentRing* ring) : m_ring(ring) {
@@ -59,19 +39,7 @@ LiveMuxer::LiveMuxer(FragmentRing* ring) : m_ring(ring) {
 }
 
 void LiveMuxer::OnVideoFrame(const uint8_t* data, size_t len, uint32_t time_ms) {
-    size_t pos = FindStartCode(data, len, 0);
-    if (pos == len) {  // a bare NAL unit
-        OnNal(data, len, time_ms);
-        return;
-    }
-    while (pos < len) {
-        const size_t start = pos + 3;
-        const size_t next = FindStartCode(data, len, start);
-        size_t end = next;
-        while (end > start && data[end - 1] == 0) --end;  // the next start code's leading zero
-        if (end > start) OnNal(data + start, end - start, time_ms);
-        pos = next;
-    }
+    ForEachNalUnit(data, len, [&](const uint8_t* nal, size_t n) { OnNal(nal, n, time_ms); });
 }
 
 void LiveMuxer::OnNal(const uint8_t* nal, size_t len, uint32_t time_ms) {
@@ -209,7 +177,8 @@ bool LiveMuxer::AudioWanted(uint32_t now_ms) const {
 
 bool LiveMuxer::StartStream(uint32_t time_ms) {
     fmp4::VideoConfig video{};
-    if (m_sps.empty() || m_pps.empty() || !PictureSize(m_sps, &video.width, &video.height)) {
+    if (m_sps.empty() || m_pps.empty() ||
+        !h264_picture_size(m_sps.data(), m_sps.size(), &video.width, &video.height)) {
         OrvexLogPriority(platform::kLogWarn, kTag,
                          "a key frame without a usable SPS and PPS: the web viewers wait for the "
                          "next");
@@ -257,12 +226,7 @@ bool LiveMuxer::StartStream(uint32_t time_ms) {
 void LiveMuxer::OnAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) {
     // The encoder frames its output in ADTS; MP4 carries the raw frame (browsers refuse the
     // header), and the init segment says what the header would.
-    if (len >= 7 && data[0] == 0xFF && (data[1] & 0xF6) == 0xF0) {
-        const size_t header = (data[1] & 0x01) != 0 ? 7 : 9;  // 9: with a CRC
-        if (len <= header) return;
-        data += header;
-        len -= header;
-    }
+    if (!StripAdtsHeader(&data, &len)) return;
     m_audio_seen = true;
     m_last_audio_ms = time_ms;
     if (!m_started || !m_stream_has_audio) return;

@@ -15,6 +15,7 @@
 #include "auth/DigestGate.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
+#include "rtsp/CaptureQuery.h"
 #include "rtsp/RtspTransport.h"
 #include "service/Clocks.h"
 #include "service/OrvexLog.h"
@@ -56,34 +57,6 @@ MHD_Result Reply(MHD_Connection* connection, unsigned status, const char* text,
     MHD_Result result = MHD_queue_response(connection, status, response);
     MHD_destroy_response(response);
     return result;
-}
-
-// The capture a viewer asks for: the keys of an RTSP URL's query that it gives (a value of
-// letters, digits and '_' only), the rest as tools/run.sh's URL has them.
-std::string CaptureQueryFor(const std::string& query) {
-    static const char* const kKeys[][2] = {
-        {"width", "1280"},  {"height", "720"},  {"cameraid", "hd0"}, {"win", "main"},
-        {"sub", "0"},       {"dumpvideo", "0"}, {"dumpaudio", "0"},  {"specialcase", "none"},
-        {"framerate", "30"}};
-    std::string out = "?";
-    for (const auto& key : kKeys) {
-        std::string value = key[1];
-        const std::string name = std::string(key[0]) + "=";
-        for (size_t at = query.find(name); at != std::string::npos; at = query.find(name, at + 1)) {
-            if (at != 0 && query[at - 1] != '?' && query[at - 1] != '&') continue;
-            size_t end = at + name.size();
-            while (end < query.size() && end - at - name.size() < 16 &&
-                   (isalnum(static_cast<unsigned char>(query[end])) || query[end] == '_')) {
-                ++end;
-            }
-            if (end > at + name.size())
-                value = query.substr(at + name.size(), end - at - name.size());
-            break;
-        }
-        if (out.size() > 1) out += "&";
-        out += name + value;
-    }
-    return out;
 }
 
 // What a request carries between libmicrohttpd's callbacks: its target as the client sent it

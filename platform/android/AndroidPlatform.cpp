@@ -7,6 +7,7 @@
 #include "platform/android/AndroidManagers.h"
 #include "platform/android/AndroidMediaRecorder.h"
 #include "platform/android/AndroidProperties.h"
+#include "platform/android/AndroidPublish.h"
 #include "platform/android/AndroidPxAudioOut.h"
 
 namespace platform {
@@ -27,6 +28,7 @@ void InstallDefaultPorts() {
         p.px_audio_out = new android_port::AndroidPxAudioOut();
         p.audio_record = new android_port::AndroidAudioRecordPort();
         p.aac_library = new android_port::AndroidAacLibrary();
+        p.publish = new android_port::AndroidPublish();
         return p;
     }();
     Install(ports);

@@ -16,6 +16,7 @@ FakePlatform::FakePlatform() : previous_(Installed()) {
     ports.px_audio_out = &px_audio_out;
     ports.audio_record = &audio_record;
     ports.aac_library = &aac_library;
+    ports.publish = &publish;
     Install(ports);
 }
 

@@ -6,6 +6,7 @@
 #include "platform/fake/FakeLog.h"
 #include "platform/fake/FakeManagers.h"
 #include "platform/fake/FakeProperties.h"
+#include "platform/fake/FakePublish.h"
 
 namespace platform {
 namespace fake {
@@ -33,6 +34,7 @@ public:
     FakePxAudioOut px_audio_out{journal, results};
     FakeAudioRecordPort audio_record{journal, results};
     FakeAacLibrary aac_library{journal};
+    FakePublish publish;
 
 private:
     Ports previous_;

@@ -10,6 +10,7 @@
 #include "platform/host/HostManagers.h"
 #include "platform/host/HostProperties.h"
 #include "platform/host/KnownProperties.h"
+#include "platform/host/publish/HostPublish.h"
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
 
@@ -39,6 +40,7 @@ void InstallDefaultPorts() {
         p.px_audio_out = new host::HostPxAudioOut();
         p.audio_record = new host::HostAudioRecordPort();
         p.aac_library = new host::HostAacLibrary();
+        p.publish = new host::HostPublish();
         return p;
     }();
     Install(ports);
