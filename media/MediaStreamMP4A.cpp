@@ -32,15 +32,20 @@ int MediaStreamMP4A::FrequencyIndex(int rate) {
     return 15;
 }
 
-std::string MediaStreamMP4A::ConfigString(int sample_rate, int channels) {
-    static const char kHex[] = "0123456789abcdef";
+void MediaStreamMP4A::Config(int sample_rate, int channels, uint8_t out[2]) {
     int index = FrequencyIndex(sample_rate);
     // 5 bits object type (2, AAC LC), 4 bits frequency index, 4 bits channels, 3 bits zero.
+    out[0] = static_cast<uint8_t>(0x10 | ((index >> 1) & 0xF));
+    out[1] = static_cast<uint8_t>(((((index & 1) * 8 + (channels >> 1)) & 0xF) << 4) |
+                                  (((channels & 1) * 8) & 0xF));
+}
+
+std::string MediaStreamMP4A::ConfigString(int sample_rate, int channels) {
+    static const char kHex[] = "0123456789abcdef";
+    uint8_t config[2];
+    Config(sample_rate, channels, config);
     std::string s(4, '0');
-    s[0] = '1';
-    s[1] = kHex[(index >> 1) & 0xF];
-    s[2] = kHex[((index & 1) * 8 + (channels >> 1)) & 0xF];
-    s[3] = kHex[((channels & 1) * 8) & 0xF];
+    for (int i = 0; i < 4; ++i) s[i] = kHex[(config[i / 2] >> (i % 2 == 0 ? 4 : 0)) & 0xF];
     return s;
 }
 

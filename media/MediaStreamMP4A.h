@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <string>
 
 #include "media/Buffer.h"
@@ -19,7 +20,9 @@ public:
 
     // MPEG-4 sampling frequency index for a rate (ISO/IEC 14496-3 table 1.18, by threshold).
     static int FrequencyIndex(int sample_rate);
-    // AudioSpecificConfig of AAC LC in four hex digits ("1190" for 48000 Hz stereo).
+    // AudioSpecificConfig of AAC LC: its two bytes (0x11 0x90 for 48000 Hz stereo), and the
+    // same in four hex digits ("1190").
+    static void Config(int sample_rate, int channels, uint8_t out[2]);
     static std::string ConfigString(int sample_rate, int channels);
 
     int object() const { return m_object; }

@@ -5,6 +5,7 @@
 #include <thread>
 
 #include "media/AnnexB.h"
+#include "media/MediaStreamMP4A.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "publish/PublishQueue.h"
@@ -18,11 +19,8 @@ namespace {
 
 constexpr const char* kTag = "orvex:::publish";
 constexpr size_t kMaxUnit = 4u << 20;  // far above what the recorder's bit rates give
-constexpr size_t kMaxParameterSet = 1024;
-constexpr int kPopWaitMs = 200;  // how often an idle server's thread looks at its clock
+constexpr int kPopWaitMs = 200;        // how often an idle server's thread looks at its clock
 constexpr size_t kMaxServers = 4;
-// AudioSpecificConfig: AAC-LC (2), 48 kHz (index 3), 2 channels; what both platforms encode.
-constexpr uint8_t kAudioConfig[2] = {0x11, 0x90};
 
 int64_t SteadyMs() {
     return std::chrono::duration_cast<std::chrono::milliseconds>(
@@ -88,7 +86,7 @@ void Publisher::Server::Run() {
         if (video) {
             ForEachNalUnit(data, frame.len, [&](const uint8_t* nal, size_t n) {
                 const uint8_t type = nal[0] & 0x1F;
-                if ((type == 7 || type == 8) && n <= kMaxParameterSet)
+                if ((type == 7 || type == 8) && n <= AccessUnitGatherer::kMaxParameterSet)
                     (type == 7 ? sps : pps).assign(nal, nal + n);
             });
             if (frame.key && dropped == 0) drop_told = false;
@@ -126,7 +124,9 @@ bool Publisher::Server::Connect(uint32_t time_ms) {
         target.width = width;
         target.height = height;
     }
-    target.audio_config.assign(kAudioConfig, kAudioConfig + sizeof kAudioConfig);
+    uint8_t config[2];
+    MediaStreamMP4A::Config(target.audio_rate, target.audio_channels, config);
+    target.audio_config.assign(config, config + sizeof config);
     target.stop = &stop;
     std::string error;
     session = platform::Publish().Open(target, &error);
@@ -164,9 +164,10 @@ void Publisher::Server::Lost(const char* what) {
 }
 
 Publisher::Publisher(RtspTransport* transport, std::vector<PublishUrl> urls, Options options)
-    : m_transport(transport), m_options(std::move(options)) {
+    : m_transport(transport),
+      m_options(std::move(options)),
+      m_gatherer(this, AccessUnitGatherer::Prefix::kStartCode, true, kMaxUnit) {
     for (PublishUrl& url : urls) m_servers.push_back(std::make_unique<Server>(url, m_options));
-    m_unit.reserve(1u << 20);
 }
 
 Publisher::~Publisher() { Stop(); }
@@ -200,58 +201,24 @@ void Publisher::Stop() {
 }
 
 void Publisher::OnVideoFrame(const uint8_t* data, size_t len, uint32_t time_ms) {
-    ForEachNalUnit(data, len, [&](const uint8_t* nal, size_t n) { OnNal(nal, n, time_ms); });
-    // A picture with as many slices as the last one is complete: it goes now rather than when
-    // the next one begins. Judged per call, as a call may carry several slices.
-    if (m_send_early && m_slices_per_unit > 0 && m_unit_slices >= m_slices_per_unit) FinishUnit();
+    m_gatherer.Add(data, len, time_ms);
 }
 
-void Publisher::OnNal(const uint8_t* nal, size_t len, uint32_t time_ms) {
-    const uint8_t type = nal[0] & 0x1F;
-    if (type == 12) return;  // filler: bit-rate padding
-    if (m_unit_slices > 0 && BeginsNextAccessUnit(nal, len)) FinishUnit();
-    const bool slice = type == 1 || type == 5;
-    if (slice && m_unit_slices == 0 && !BeginsNextAccessUnit(nal, len)) {
-        // The rest of a picture that went early (its slices grew in number), or one that began
-        // before the tap did. What depends on it is dropped, and from now on a picture goes
-        // when the next one begins.
-        if (m_slices_per_unit > 0) {
-            m_send_early = false;
-            for (auto& server : m_servers) server->queue.DropToKeyFrame();
-        }
-        return;
+void Publisher::OnPicture(const AccessUnitGatherer::Picture& picture) {
+    for (auto& server : m_servers) {
+        server->queue.Push(PublishQueue::Kind::kVideo, picture.key, picture.time_ms, picture.data,
+                           picture.len);
     }
-    if (m_unit.empty()) m_unit_ms = time_ms;
-    if (m_unit_too_large || m_unit.size() + 4 + len > kMaxUnit) {
-        m_unit_too_large = true;
-    } else {
-        static const uint8_t kStart[4] = {0, 0, 0, 1};
-        m_unit.insert(m_unit.end(), kStart, kStart + 4);
-        m_unit.insert(m_unit.end(), nal, nal + len);
-    }
-    if (!slice) return;
-    ++m_unit_slices;
-    if (type == 5) m_unit_key = true;
 }
 
-void Publisher::FinishUnit() {
-    m_slices_per_unit = m_unit_slices;
-    if (!m_unit_too_large) {
-        for (auto& server : m_servers) {
-            server->queue.Push(PublishQueue::Kind::kVideo, m_unit_key, m_unit_ms, m_unit.data(),
-                               m_unit.size());
-        }
-    } else {
-        // The pictures after it cannot be decoded without it.
+void Publisher::OnPictureLost(AccessUnitGatherer::Loss loss) {
+    if (loss == AccessUnitGatherer::Loss::kTooLarge) {
         OrvexLogPriority(platform::kLogWarn, kTag,
                          "publish: a picture over %zu bytes; skipping to the next key frame",
                          kMaxUnit);
-        for (auto& server : m_servers) server->queue.DropToKeyFrame();
     }
-    m_unit.clear();
-    m_unit_slices = 0;
-    m_unit_key = false;
-    m_unit_too_large = false;
+    // The pictures after it cannot be decoded without it.
+    for (auto& server : m_servers) server->queue.DropToKeyFrame();
 }
 
 void Publisher::OnAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) {

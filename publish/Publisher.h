@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "media/AccessUnitGatherer.h"
 #include "publish/PublishUrl.h"
 #include "server/FrameTap.h"
 
@@ -22,7 +23,7 @@ class RtspTransport;
 // thread connects at a key frame with its SPS and PPS, and after a failure tries again after
 // 1 s, then 2, 4 ... up to 30 s.
 // Thread contract: Start and Stop from the controlling thread; the frame calls from the tap.
-class Publisher : public EncodedFrameSink {
+class Publisher : public EncodedFrameSink, private AccessUnitGatherer::Sink {
 public:
     struct Options {
         size_t queue_bytes = 4u << 20;
@@ -47,26 +48,16 @@ public:
 private:
     struct Server;
 
-    void OnNal(const uint8_t* nal, size_t len, uint32_t time_ms);
-    void FinishUnit();
+    void OnPicture(const AccessUnitGatherer::Picture& picture) override;
+    void OnPictureLost(AccessUnitGatherer::Loss loss) override;
 
     RtspTransport* m_transport;
     Options m_options;
     std::vector<std::unique_ptr<Server>> m_servers;
     bool m_started = false;
 
-    // The access unit being gathered (tap thread only): Annex B with 4-byte start codes, its
-    // capacity kept between units.
-    std::vector<uint8_t> m_unit;
-    uint32_t m_unit_ms = 0;
-    int m_unit_slices = 0;
-    bool m_unit_key = false;
-    bool m_unit_too_large = false;
-    // Slices the previous picture had: a picture that reaches as many goes at once instead of
-    // when the next one begins, which saves a frame's time (0: unknown). Off for good once
-    // the slices of a picture outnumbered the last one's.
-    int m_slices_per_unit = 0;
-    bool m_send_early = true;
+    // Pictures as Annex B access units, parameter sets and delimiters kept (tap thread only).
+    AccessUnitGatherer m_gatherer;
 };
 
 // The back-off after a failed connection: `first_ms` after the first, then doubling up to

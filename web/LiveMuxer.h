@@ -4,16 +4,17 @@
 #include <cstdint>
 #include <vector>
 
+#include "media/AccessUnitGatherer.h"
 #include "server/FrameTap.h"
 #include "web/FragmentRing.h"
 
 // Turns the encoded frames into the live fMP4 stream of the web viewers: NAL units are
-// gathered into access units (length-prefixed, as MP4 wants them), each picture and each AAC
+// gathered into pictures (length-prefixed, as MP4 wants them), each picture and each AAC
 // frame becomes one fragment, and a new init segment starts the stream at the first key frame
 // and whenever the SPS or PPS change.
 // Thread contract: the frame tap calls OnVideoFrame and OnAudioFrame one at a time (it
 // serialises its sinks), so the muxer's own state needs no lock; the ring has its own.
-class LiveMuxer : public EncodedFrameSink {
+class LiveMuxer : public EncodedFrameSink, private AccessUnitGatherer::Sink {
 public:
     static constexpr uint32_t kAudioRate = 48000;  // what both platforms' AAC encoders give
     static constexpr uint8_t kAudioChannels = 2;
@@ -28,31 +29,21 @@ public:
     unsigned restarts() const { return m_restarts; }
 
 private:
-    void OnNal(const uint8_t* nal, size_t len, uint32_t time_ms);
-    void AddToPicture(const uint8_t* nal, size_t len);
-    void FinishPicture();
+    void OnPicture(const AccessUnitGatherer::Picture& picture) override;
+    void OnPictureLost(AccessUnitGatherer::Loss loss) override;
     bool StartStream(uint32_t time_ms);
     bool AudioWanted(uint32_t now_ms) const;
 
     FragmentRing* m_ring;
     uint32_t m_sequence = 0;
 
-    // Parameter sets as last seen, and those of the running stream's init segment.
-    std::vector<uint8_t> m_sps, m_pps, m_stream_sps, m_stream_pps;
+    AccessUnitGatherer m_gatherer;
+    // The parameter sets of the running stream's init segment.
+    std::vector<uint8_t> m_stream_sps, m_stream_pps;
     bool m_started = false;
     bool m_stream_has_audio = false;
     uint32_t m_origin_ms = 0;  // time 0 of both tracks
 
-    // The picture being gathered.
-    std::vector<uint8_t> m_picture;  // length-prefixed NAL units; capacity kept between pictures
-    uint32_t m_picture_ms = 0;
-    int m_picture_slices = 0;
-    bool m_picture_key = false;
-    bool m_picture_too_large = false;
-    // Slices the previous picture had: a picture that reaches as many is sent at once instead
-    // of when the next one begins (0: unknown, wait for the next picture).
-    int m_slices_per_picture = 0;
-    bool m_sent_early = false;  // the picture just sent went before its end was seen
     uint32_t m_last_picture_ms = 0;
     uint32_t m_picture_duration = 3000;  // in 90 kHz ticks, from the last two pictures
     uint64_t m_last_decode_time = 0;

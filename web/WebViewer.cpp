@@ -7,8 +7,6 @@
 #include <stdarg.h>
 #include <string.h>
 
-#include <algorithm>
-#include <cctype>
 #include <cstdio>
 #include <cstdlib>
 
