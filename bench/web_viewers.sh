@@ -9,11 +9,7 @@ top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
 seconds=${2:-30}
 viewers=${3:-8}
-if [[ -z "${ORVEX_BENCH_NETNS:-}" ]]; then
-  "$top/tools/install-deps.sh" e2e
-  exec env ORVEX_BENCH_NETNS=1 unshare -n bash -c 'ip link set lo up && exec "$0" "$@"' \
-    "$0" "$build" "$seconds" "$viewers"
-fi
+source "$top/tools/e2e-netns.sh" e2e "$build" "$seconds" "$viewers"
 work=$(mktemp -d)
 pids=()
 trap 'kill ${pids[*]} 2>/dev/null || true; kill -9 $orvex 2>/dev/null || true; rm -rf "$work"' EXIT

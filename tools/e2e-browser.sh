@@ -9,10 +9,7 @@ set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
 name=e2e-browser
-if [[ -z "${ORVEX_E2E_NETNS:-}" ]]; then
-  "$top/tools/install-deps.sh" e2e
-  exec env ORVEX_E2E_NETNS=1 unshare -n bash -c 'ip link set lo up && exec "$0" "$@"' "$0" "$build"
-fi
+source "$top/tools/e2e-netns.sh" e2e "$build"
 source "$top/tools/e2e-lib.sh"
 password=$(ORVEX_USERS="$work/users" "$top/tools/orvex-passwd" --random orvex)
 { cat "$top/platform/host/orvex.prop"; echo "kv.orvex.auth=$work/users"; } >"$work/web.prop"

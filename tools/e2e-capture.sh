@@ -11,11 +11,7 @@ top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
 mode=${2:-check}
 
-if [[ -z "${ORVEX_E2E_NETNS:-}" ]]; then
-  "$top/tools/install-deps.sh" capture-e2e
-  exec env ORVEX_E2E_NETNS=1 unshare -n bash -c 'ip link set lo up && exec "$0" "$@"' \
-    "$0" "$build" "$mode"
-fi
+source "$top/tools/e2e-netns.sh" capture-e2e "$build" "$mode"
 
 colour=30a050     # the screen's colour, RGB
 tone_hz=660       # the tone the machine plays
