@@ -114,10 +114,15 @@ bool FailureLockout::RecordFailure(uint32_t address, uint64_t now_ms) {
 }
 
 bool FailureLockout::IsLocked(uint32_t address, uint64_t now_ms) const {
+    return LockedForMs(address, now_ms) > 0;
+}
+
+uint64_t FailureLockout::LockedForMs(uint32_t address, uint64_t now_ms) const {
     for (const Entry& e : m_entries) {
-        if (e.used && e.address == address) return e.locked_until > now_ms;
+        if (e.used && e.address == address)
+            return e.locked_until > now_ms ? e.locked_until - now_ms : 0;
     }
-    return false;
+    return 0;
 }
 
 }  // namespace auth

@@ -45,6 +45,8 @@ public:
     // True when this failure locks the address (once per lock: the caller logs it).
     bool RecordFailure(uint32_t address, uint64_t now_ms);
     bool IsLocked(uint32_t address, uint64_t now_ms) const;
+    // How long the address stays locked; 0 when it is not.
+    uint64_t LockedForMs(uint32_t address, uint64_t now_ms) const;
 
 private:
     struct Entry {

@@ -25,7 +25,7 @@ constexpr const char* kTag = "orvex:::RtspSession";
 }  // namespace
 
 RtspSession::RtspSession(int fd, sockaddr_in first, sockaddr_in second, MediaSessionList* list,
-                         RtspAccess* access)
+                         auth::AccessGate* access)
     : m_fd(fd),
       m_response(std::make_unique<RtspResponse>(fd, first, second)),
       m_list(list),
@@ -95,21 +95,26 @@ int RtspSession::RtspSessionThread(int& type) {
 bool RtspSession::Refused(int* type, int* result) {
     if (m_access == nullptr || !m_access->authenticating()) return false;
     sockaddr_in peer = m_response->GetConnectAddr();
-    RtspAccess::Decision d = m_access->Judge(m_response->request_lines(), *type,
-                                             ntohl(peer.sin_addr.s_addr), DottedAddress(peer));
-    if (d.answer == RtspAccess::Answer::kServe) {
+    auth::AccessDecision d = JudgeRtspRequest(*m_access, m_response->request_lines(), *type,
+                                              ntohl(peer.sin_addr.s_addr), DottedAddress(peer));
+    if (d.answer == auth::AccessAnswer::kServe) {
         if (*type != kRtspOptions) m_admitted = true;
         return false;
     }
     m_refusal = d.reason;
     *type = 0;  // nothing was done: no PLAY may start capture
     switch (d.answer) {
-        case RtspAccess::Answer::kChallenge:
-            m_response->AddField(d.header);
+        case auth::AccessAnswer::kChallenge:
+            m_response->AddField("WWW-Authenticate: " + d.challenge);
             m_response->ResponseError("RTSP/1.0 401 Unauthorized");
             break;
-        case RtspAccess::Answer::kBadRequest:
+        case auth::AccessAnswer::kBadRequest:
             m_response->ResponseError("RTSP/1.0 400 Bad Request");
+            break;
+        case auth::AccessAnswer::kLockedOut:
+            // A status players print ("403 Forbidden") rather than a reset they cannot explain.
+            m_response->AddField("Retry-After: " + std::to_string(d.retry_after_s));
+            m_response->ResponseError("RTSP/1.0 403 Forbidden");
             break;
         default:
             m_response->ResponseError("RTSP/1.0 503 Service Unavailable");

@@ -21,7 +21,7 @@ class RtspSession {
 public:
     // `access`, when given, judges every request before it is served.
     RtspSession(int fd, sockaddr_in first, sockaddr_in second, MediaSessionList* list,
-                RtspAccess* access = nullptr);
+                auth::AccessGate* access = nullptr);
     virtual ~RtspSession();
     RtspSession(const RtspSession&) = delete;
     RtspSession& operator=(const RtspSession&) = delete;
@@ -56,7 +56,7 @@ private:
     std::string m_session_name;
     std::string m_rtp_info;
     int m_last_activity = 0;
-    RtspAccess* m_access;
+    auth::AccessGate* m_access;
     std::string m_refusal;  // why the last refused request was refused
     bool m_admitted = false;
 };

@@ -49,7 +49,7 @@ public:
     int listen_port() const;
 
     // Who may watch; configure it before Open starts the listener.
-    RtspAccess& access() { return m_access; }
+    auth::AccessGate& access() { return m_access; }
 
     // The listener's select wait, two seconds in service. Tests shorten it.
     static void SetSelectWaitMs(int ms);
@@ -86,7 +86,7 @@ private:
     unsigned m_port = 0;
     unsigned m_extra = 0;
     platform::UniqueFd m_listen_fd;
-    RtspAccess m_access;
+    auth::AccessGate m_access;
     sockaddr_in m_listen_addr{};
     int m_opened = 0;
     std::map<int, std::unique_ptr<RtspSession>> m_sessions;

@@ -127,7 +127,8 @@ int main(int argc, char** argv) {
         skyvo_rtsp_sever_close();
         return result;
     }
-    StartWebViewer(skyvo_rtsp_service()->listener());   // only when kv.orvex.http names a port
+    // only when kv.orvex.http names a port; one gate judges RTSP and HTTP alike
+    StartWebViewer(skyvo_rtsp_service()->listener(), &skyvo_rtsp_service()->listener()->access());
     StartPublishing(skyvo_rtsp_service()->listener());  // only when kv.orvex.publish names servers
     start_orvex_system_service();
     const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();

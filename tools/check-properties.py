@@ -10,7 +10,7 @@ key = re.compile(r'"((?:kv\.orvex|orvex\.host|ro\.board|kelvo\.build)\.[A-Za-z0-
 listed_file = top / "platform/host/KnownProperties.cpp"
 listed = set(key.findall(listed_file.read_text()))
 read = set()
-for folder in ("capture", "media", "platform", "publish", "rtp", "rtsp", "server", "service",
+for folder in ("auth", "capture", "media", "platform", "publish", "rtp", "rtsp", "server", "service",
                "web"):
     for path in (top / folder).rglob("*.[ch]*"):
         if path != listed_file and path.suffix in (".cpp", ".h"):

@@ -44,18 +44,26 @@ const sockaddr* PeerOf(MHD_Connection* connection) {
     return info == nullptr ? nullptr : info->client_addr;
 }
 
-MHD_Result Reply(MHD_Connection* connection, unsigned status, const char* text,
-                 const char* header = nullptr, const char* value = nullptr) {
-    MHD_Response* response = MHD_create_response_from_buffer(strlen(text), const_cast<char*>(text),
-                                                             MHD_RESPMEM_PERSISTENT);
+// A plain-text answer; `close` ends the connection after it.
+MHD_Result Reply(MHD_Connection* connection, unsigned status, const std::string& text,
+                 const char* header = nullptr, const char* value = nullptr, bool close = false) {
+    MHD_Response* response = MHD_create_response_from_buffer(
+        text.size(), const_cast<char*>(text.data()), MHD_RESPMEM_MUST_COPY);
     if (response == nullptr) return MHD_NO;
     MHD_add_response_header(response, MHD_HTTP_HEADER_CONTENT_TYPE, "text/plain; charset=utf-8");
     MHD_add_response_header(response, MHD_HTTP_HEADER_CACHE_CONTROL, "no-store");
     if (header != nullptr) MHD_add_response_header(response, header, value);
+    if (close) MHD_add_response_header(response, MHD_HTTP_HEADER_CONNECTION, "close");
     MHD_Result result = MHD_queue_response(connection, status, response);
     MHD_destroy_response(response);
     return result;
 }
+
+// What a browser shows when its password prompt is cancelled: where the password is.
+constexpr const char* kUnauthorizedText =
+    "401 Unauthorized: this stream needs a user name and password.\n"
+    "On the machine that runs orvex, the URL with them is in ~/.config/orvex/play-url;\n"
+    "tools/orvex-passwd USER adds a user or changes a password.\n";
 
 // What a request carries between libmicrohttpd's callbacks: its target as the client sent it
 // (the Digest answer names it so, query included).
@@ -79,9 +87,8 @@ struct WebViewerCalls {
     static MHD_Result Accept(void* cls, const sockaddr* addr, socklen_t) {
         auto* self = static_cast<WebViewer*>(cls);
         if (self->m_stopping.load()) return MHD_NO;
-        thread_mutex::Scoped hold(self->m_access_lock);
-        return self->m_access.AdmitConnection(HostOrderAddress(addr), AddressText(addr)) ? MHD_YES
-                                                                                         : MHD_NO;
+        return self->m_gate->AdmitConnection(HostOrderAddress(addr), AddressText(addr)) ? MHD_YES
+                                                                                        : MHD_NO;
     }
 
     static void* Uri(void*, const char* uri, MHD_Connection*) {
@@ -125,37 +132,43 @@ struct WebViewerCalls {
         const sockaddr* peer = PeerOf(connection);
         const std::string peer_text = AddressText(peer);
 
-        // Who may watch, judged as for an RTSP request.
-        std::vector<std::string> lines{std::string(method) + " " + uri + " HTTP/1.1"};
+        // Who may watch: the gate the RTSP side asks too.
         const char* authorization =
             MHD_lookup_connection_value(connection, MHD_HEADER_KIND, MHD_HTTP_HEADER_AUTHORIZATION);
-        if (authorization != nullptr)
-            lines.push_back(std::string("Authorization: ") + authorization);
-        RtspAccess::Decision decision;
-        {
-            thread_mutex::Scoped hold(self->m_access_lock);
-            decision = self->m_access.Judge(lines, -1, HostOrderAddress(peer), peer_text);
-        }
-        if (!decision.reason.empty() &&
+        const std::string authorization_text = authorization != nullptr ? authorization : "";
+        auth::AccessRequest request;
+        request.method = method;
+        request.uri = uri;
+        request.authorization = authorization != nullptr ? &authorization_text : nullptr;
+        request.address = HostOrderAddress(peer);
+        request.address_text = peer_text;
+        const auth::AccessDecision decision = self->m_gate->Judge(request);
+        if (decision.answer != auth::AccessAnswer::kServe &&
             decision.reason != auth::VerdictText(auth::DigestVerdict::kMissing)) {
-            OrvexLogPriority(platform::kLogWarn, kTag, "web client %s refused: %s",
-                             peer_text.c_str(), decision.reason.c_str());
+            OrvexLogPriority(decision.answer == auth::AccessAnswer::kLockedOut ? platform::kLogDebug
+                                                                               : platform::kLogWarn,
+                             kTag, "web client %s refused: %s", peer_text.c_str(),
+                             decision.reason.c_str());
         }
         switch (decision.answer) {
-            case RtspAccess::Answer::kServe:
+            case auth::AccessAnswer::kServe:
                 break;
-            case RtspAccess::Answer::kChallenge: {
-                constexpr const char kPrefix[] = "WWW-Authenticate: ";
-                std::string value = decision.header;
-                if (value.compare(0, sizeof kPrefix - 1, kPrefix) == 0)
-                    value.erase(0, sizeof kPrefix - 1);
-                return Reply(connection, 401, "401 Unauthorized\n",
-                             MHD_HTTP_HEADER_WWW_AUTHENTICATE, value.c_str());
+            case auth::AccessAnswer::kChallenge:
+                return Reply(connection, 401, kUnauthorizedText, MHD_HTTP_HEADER_WWW_AUTHENTICATE,
+                             decision.challenge.c_str(), decision.close);
+            case auth::AccessAnswer::kBadRequest:
+                return Reply(connection, 400, "400 Bad Request\n", nullptr, nullptr,
+                             decision.close);
+            case auth::AccessAnswer::kLockedOut: {
+                const std::string seconds = std::to_string(decision.retry_after_s);
+                const std::string text =
+                    "Too many wrong answers from this address; try again in " + seconds + " s.\n";
+                return Reply(connection, 429, text, MHD_HTTP_HEADER_RETRY_AFTER, seconds.c_str(),
+                             true);
             }
-            case RtspAccess::Answer::kBadRequest:
-                return Reply(connection, 400, "400 Bad Request\n");
-            case RtspAccess::Answer::kUnavailable:
-                return Reply(connection, 503, "503 Service Unavailable\n");
+            case auth::AccessAnswer::kUnavailable:
+                return Reply(connection, 503, "503 Service Unavailable\n", nullptr, nullptr,
+                             decision.close);
         }
 
         const size_t mark = uri.find('?');
@@ -244,16 +257,18 @@ struct WebViewerCalls {
     }
 };
 
-WebViewer::WebViewer(RtspTransport* transport, Options options)
-    : m_transport(transport), m_options(options), m_ring(options.ring_bytes), m_muxer(&m_ring) {}
+WebViewer::WebViewer(RtspTransport* transport, auth::AccessGate* gate, Options options)
+    : m_transport(transport),
+      m_options(options),
+      m_ring(options.ring_bytes),
+      m_muxer(&m_ring),
+      m_own_gate(gate == nullptr ? std::make_unique<auth::AccessGate>() : nullptr),
+      m_gate(gate != nullptr ? gate : m_own_gate.get()) {}
 
 WebViewer::~WebViewer() { Stop(); }
 
 bool WebViewer::Start() {
-    {
-        thread_mutex::Scoped hold(m_access_lock);
-        m_access.Load();
-    }
+    if (m_own_gate != nullptr) m_own_gate->Load();
     sockaddr_in bind{};
     bind.sin_family = AF_INET;
     bind.sin_port = htons(static_cast<uint16_t>(m_options.port));
@@ -310,7 +325,7 @@ namespace {
 std::unique_ptr<WebViewer> g_web_viewer;
 }
 
-void StartWebViewer(RtspTransport* transport) {
+void StartWebViewer(RtspTransport* transport, auth::AccessGate* gate) {
     char value[platform::kPropertyValueMax] = {};
     platform::Properties().Get("kv.orvex.http", value, "");
     if (value[0] == '\0') return;  // the television's default: no web viewer, no port
@@ -333,7 +348,7 @@ void StartWebViewer(RtspTransport* transport) {
     options.max_viewers = static_cast<int>(max);
     platform::Properties().Get("kv.orvex.bind", value, "");
     options.bind = value;
-    auto viewer = std::make_unique<WebViewer>(transport, options);
+    auto viewer = std::make_unique<WebViewer>(transport, gate, options);
     if (viewer->Start()) g_web_viewer = std::move(viewer);
 }
 

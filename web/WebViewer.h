@@ -4,8 +4,8 @@
 #include <memory>
 #include <string>
 
+#include "auth/AccessGate.h"
 #include "media/thread_mutex.h"
-#include "rtsp/RtspAccess.h"
 #include "web/FragmentRing.h"
 #include "web/LiveMuxer.h"
 
@@ -18,7 +18,8 @@ struct MHD_Connection;
 // beside the RTSP clients. Each viewer holds capture as a playing RTSP client does; they all
 // read one ring of fragments that the muxer fills from the frame tap, so a viewer that reads
 // slowly skips ahead or is dropped without slowing capture or anyone else.
-// Who may watch is judged as for RTSP: the same address rules, lockout and Digest users.
+// Who may watch is judged by the RTSP listener's gate: one set of address rules, one lockout,
+// the same Digest users.
 // Thread contract: Start and Stop from the controlling thread; the rest runs on the server's
 // threads.
 class WebViewer {
@@ -32,17 +33,18 @@ public:
         unsigned idle_timeout_s = 10;  // a connection that moves nothing for this long ends
     };
 
-    WebViewer(RtspTransport* transport, Options options);
+    // `gate`: who may watch, shared with the RTSP side; null makes the viewer a gate of its own,
+    // read from the properties at Start.
+    WebViewer(RtspTransport* transport, auth::AccessGate* gate, Options options);
     ~WebViewer();
     WebViewer(const WebViewer&) = delete;
     WebViewer& operator=(const WebViewer&) = delete;
 
-    // Reads who may watch (kv.orvex.allow, kv.orvex.auth), listens and taps the frames; false
+    // Listens and taps the frames; false
     // (one log line, nothing left open) when the port cannot be had.
     bool Start();
     void Stop();
 
-    RtspAccess& access() { return m_access; }
     int viewers() const { return m_viewers.load(std::memory_order_relaxed); }
     unsigned port() const { return m_options.port; }
 
@@ -55,13 +57,13 @@ private:
     LiveMuxer m_muxer;
     MHD_Daemon* m_daemon = nullptr;
     bool m_tapped = false;
-    thread_mutex m_access_lock;  // RtspAccess is not thread safe; connections come in parallel
-    RtspAccess m_access ORVEX_GUARDED_BY(m_access_lock);
+    std::unique_ptr<auth::AccessGate> m_own_gate;  // only without a shared one
+    auth::AccessGate* m_gate;
     std::atomic<int> m_viewers{0};
     std::atomic<bool> m_stopping{false};
 };
 
 // The service's web viewer, started when kv.orvex.http names a port (unset: none, no port is
 // opened). kv.orvex.http.max: viewers at once (default 16). Main thread.
-void StartWebViewer(RtspTransport* transport);
+void StartWebViewer(RtspTransport* transport, auth::AccessGate* gate);
 void StopWebViewer();

@@ -144,7 +144,9 @@ TEST(HtdigestTest, LinesAreUserRealmAndLowercaseHex) {
 class DigestGateTest : public ::testing::Test {
 protected:
     // orvex:orvex:pw
-    DigestGateTest() : gate({{"orvex", "orvex", "2f5dc0319c3279451ae1c1d7fd646060"}}, "s3cret") {}
+    DigestGateTest()
+        : gate({{"orvex", "orvex", "2f5dc0319c3279451ae1c1d7fd646060"}}, "s3cret",
+               {{"orvex", "orvex", "1b7a6d0b4b1d0a2e4c37f2a1e9a2b3c4"}}) {}
 
     static std::string Header(const std::string& user, const std::string& realm,
                               const std::string& nonce, const std::string& uri,
@@ -152,81 +154,141 @@ protected:
         return "Digest username=\"" + user + "\", realm=\"" + realm + "\", nonce=\"" + nonce +
                "\", uri=\"" + uri + "\", response=\"" + response + "\"" + rest;
     }
-    DigestVerdict Check(const std::string& header, const char* method = "DESCRIBE",
-                        uint64_t now = kIssued + 1000) {
-        return gate.Check(&header, method, kUri, now, nullptr);
-    }
 
     static constexpr uint64_t kIssued = 1000000;
-    static constexpr const char* kNonce = "00000000000f4240cc31c2f6bc099823c931fd3f7cc3310b";
+    static constexpr uint32_t kHere = 0x7f000001;  // 127.0.0.1, whom the nonce was given to
+    // "00000000000f4240" + HMAC-MD5("s3cret", "00000000000f4240/7f000001"), from Python's hmac.
+    static constexpr const char* kNonce = "00000000000f42404e1adb9f17dfa435cbc3513ebe487133";
     static constexpr const char* kUri = "rtsp://127.0.0.1/skyvo.0";
-    static constexpr const char* kResponse = "2a850fdf8f71e14be9bd37ffd9df344b";
+    static constexpr const char* kResponse = "5f3ba233d45b5ceb3e0c24c5d890b4b5";
+    static constexpr const char* kQopResponse = "b1e47ab389c04f06a6c9f3325d476e25";
     auth::DigestGate gate;
 };
 
-TEST_F(DigestGateTest, NoncesCarryTheirTimeAndAnHmac) {
-    EXPECT_EQ(gate.MakeNonce(kIssued), kNonce);
-    EXPECT_EQ(gate.Challenge(kIssued, false),
-              std::string("WWW-Authenticate: Digest realm=\"orvex\", nonce=\"") + kNonce + "\"");
-    EXPECT_EQ(gate.Challenge(kIssued, true),
-              std::string("WWW-Authenticate: Digest realm=\"orvex\", nonce=\"") + kNonce +
-                  "\", stale=TRUE");
+TEST_F(DigestGateTest, NoncesCarryTheirTimeAndAnHmacOfTimeAndAddress) {
+    EXPECT_EQ(gate.MakeNonce(kIssued, kHere), kNonce);
+    EXPECT_NE(gate.MakeNonce(kIssued, kHere + 1), kNonce);
+    EXPECT_EQ(gate.Challenge(kIssued, kHere, false),
+              std::string("Digest realm=\"orvex\", nonce=\"") + kNonce + "\", qop=\"auth\"");
+    EXPECT_EQ(
+        gate.Challenge(kIssued, kHere, true),
+        std::string("Digest realm=\"orvex\", nonce=\"") + kNonce + "\", qop=\"auth\", stale=TRUE");
 }
 
 TEST_F(DigestGateTest, VerdictsOnAnswers) {
-    const std::string other_run = auth::DigestGate({}, "another secret").MakeNonce(kIssued);
+    const std::string other_secret =
+        auth::DigestGate({}, "another secret").MakeNonce(kIssued, kHere);
     std::string forged = kNonce;
     forged[0] = '1';  // a later time under the old HMAC
+    std::string shouting = kNonce;
+    shouting[20] = 'E';
+    const std::string qop = ", qop=auth, nc=00000001, cnonce=\"abcdef\"";
+    const std::string setup_uri = std::string(kUri) + "/trackID=1";
+    // An answer with the password before its change.
+    auth::DigestFields before{"orvex", "orvex", kNonce, kUri, "", "", "", "", "", ""};
+    const std::string retired =
+        auth::DigestExpectedResponse("1b7a6d0b4b1d0a2e4c37f2a1e9a2b3c4", "DESCRIBE", before);
     const struct {
         std::string header;
         const char* method;
+        std::string uri;
         uint64_t now;
+        uint32_t from;
         DigestVerdict verdict;
     } cases[] = {
-        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kIssued,
+        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,
          DigestVerdict::kOk},
-        // Replayed within the nonce's life: accepted, as no table of nonces is kept.
-        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kIssued + 299999,
-         DigestVerdict::kOk},
-        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kIssued + 300000,
+        // Without qop nothing counts the answers: the same one is good while the nonce lives,
+        // but only from the address the nonce was given to.
+        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kUri, kIssued + 299999,
+         kHere, DigestVerdict::kOk},
+        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kUri, kIssued, 0x0a000005,
          DigestVerdict::kStale},
-        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kIssued - 1,
-         DigestVerdict::kForeignNonce},
-        // The method enters the hash.
-        {Header("orvex", "orvex", kNonce, kUri, kResponse), "PLAY", kIssued,
-         DigestVerdict::kWrongResponse},
-        {Header("orvex", "orvex", kNonce, kUri, "2a850fdf8f71e14be9bd37ffd9df344c"), "DESCRIBE",
-         kIssued, DigestVerdict::kWrongResponse},
-        {Header("orvex", "orvex", kNonce, kUri, ""), "DESCRIBE", kIssued,
-         DigestVerdict::kWrongResponse},
-        {Header("lion", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kIssued,
-         DigestVerdict::kUnknownUser},
-        {Header("orvex", "Orvex", kNonce, kUri, kResponse), "DESCRIBE", kIssued,
-         DigestVerdict::kWrongRealm},
-        {Header("orvex", "orvex", kNonce, "rtsp://127.0.0.1/skyvo.1", kResponse), "DESCRIBE",
-         kIssued, DigestVerdict::kWrongUri},
-        {Header("orvex", "orvex", other_run, kUri, kResponse), "DESCRIBE", kIssued,
-         DigestVerdict::kForeignNonce},
-        {Header("orvex", "orvex", forged, kUri, kResponse), "DESCRIBE", kIssued,
+        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kUri, kIssued + 300000,
+         kHere, DigestVerdict::kStale},
+        // Issued "later" than now: the clock began again, as after a reboot.
+        {Header("orvex", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kUri, kIssued - 1, kHere,
+         DigestVerdict::kStale},
+        {Header("orvex", "orvex", other_secret, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,
+         DigestVerdict::kStale},
+        {Header("orvex", "orvex", forged, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,
+         DigestVerdict::kStale},
+        {Header("orvex", "orvex", shouting, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,
          DigestVerdict::kForeignNonce},
         {Header("orvex", "orvex", "dcd98b7102dd2f0e8b11d0f600bfb0c093", kUri, kResponse),
-         "DESCRIBE", kIssued, DigestVerdict::kForeignNonce},
-        {"Basic b3J2ZXg6cHc=", "DESCRIBE", kIssued, DigestVerdict::kNotDigest},
-        {"Digest username=\"orvex\"", "DESCRIBE", kIssued, DigestVerdict::kMalformed},
-        // qop=auth as a client sends it after a challenge that offered it.
-        {Header("orvex", "orvex", kNonce, std::string(kUri) + "/trackID=1",
-                "b00077f8457f27af82d31de6d55c3e5f", ", qop=auth, nc=00000001, cnonce=\"abcdef\""),
-         "SETUP", kIssued, DigestVerdict::kWrongUri},
+         "DESCRIBE", kUri, kIssued, kHere, DigestVerdict::kForeignNonce},
+        // The method enters the hash.
+        {Header("orvex", "orvex", kNonce, kUri, kResponse), "PLAY", kUri, kIssued, kHere,
+         DigestVerdict::kWrongResponse},
+        {Header("orvex", "orvex", kNonce, kUri, "5f3ba233d45b5ceb3e0c24c5d890b4b6"), "DESCRIBE",
+         kUri, kIssued, kHere, DigestVerdict::kWrongResponse},
+        {Header("orvex", "orvex", kNonce, kUri, ""), "DESCRIBE", kUri, kIssued, kHere,
+         DigestVerdict::kWrongResponse},
+        {Header("orvex", "orvex", kNonce, kUri, retired), "DESCRIBE", kUri, kIssued, kHere,
+         DigestVerdict::kRetiredPassword},
+        {Header("lion", "orvex", kNonce, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,
+         DigestVerdict::kUnknownUser},
+        {Header("orvex", "Orvex", kNonce, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,
+         DigestVerdict::kWrongRealm},
+        {Header("orvex", "orvex", kNonce, "rtsp://127.0.0.1/skyvo.1", kResponse), "DESCRIBE", kUri,
+         kIssued, kHere, DigestVerdict::kWrongUri},
+        {"Basic b3J2ZXg6cHc=", "DESCRIBE", kUri, kIssued, kHere, DigestVerdict::kNotDigest},
+        {"Digest username=\"orvex\"", "DESCRIBE", kUri, kIssued, kHere, DigestVerdict::kMalformed},
+        // qop=auth as a client sends it after our challenge, and nonce counts that are not
+        // eight hex digits or are zero.
+        {Header("orvex", "orvex", kNonce, setup_uri, kQopResponse, qop), "SETUP", setup_uri,
+         kIssued, kHere, DigestVerdict::kOk},
+        {Header("orvex", "orvex", kNonce, setup_uri, kQopResponse, qop), "SETUP", kUri, kIssued,
+         kHere, DigestVerdict::kWrongUri},
+        {Header("orvex", "orvex", kNonce, setup_uri, kQopResponse,
+                ", qop=auth, nc=1, cnonce=\"abcdef\""),
+         "SETUP", setup_uri, kIssued, kHere, DigestVerdict::kMalformed},
+        {Header("orvex", "orvex", kNonce, setup_uri, kQopResponse,
+                ", qop=auth, nc=00000000, cnonce=\"abcdef\""),
+         "SETUP", setup_uri, kIssued, kHere, DigestVerdict::kMalformed},
+        {Header("orvex", "orvex", kNonce, setup_uri, kQopResponse,
+                ", qop=auth, nc=0000000g, cnonce=\"abcdef\""),
+         "SETUP", setup_uri, kIssued, kHere, DigestVerdict::kMalformed},
     };
     for (const auto& c : cases) {
-        EXPECT_EQ(Check(c.header, c.method, c.now), c.verdict) << c.header << " at " << c.now;
+        auth::DigestAnswer answer;
+        EXPECT_EQ(gate.Check(&c.header, c.method, c.uri, c.now, c.from, &answer), c.verdict)
+            << c.header << " at " << c.now;
     }
-    EXPECT_EQ(gate.Check(nullptr, "DESCRIBE", kUri, kIssued, nullptr), DigestVerdict::kMissing);
-    const std::string setup =
-        Header("orvex", "orvex", kNonce, std::string(kUri) + "/trackID=1",
-               "b00077f8457f27af82d31de6d55c3e5f", ", qop=auth, nc=00000001, cnonce=\"abcdef\"");
-    EXPECT_EQ(gate.Check(&setup, "SETUP", std::string(kUri) + "/trackID=1", kIssued, nullptr),
+    EXPECT_EQ(gate.Check(nullptr, "DESCRIBE", kUri, kIssued, kHere, nullptr),
+              DigestVerdict::kMissing);
+    const std::string counted = Header("orvex", "orvex", kNonce, setup_uri, kQopResponse, qop);
+    auth::DigestAnswer answer;
+    ASSERT_EQ(gate.Check(&counted, "SETUP", setup_uri, kIssued, kHere, &answer),
               DigestVerdict::kOk);
+    EXPECT_EQ(answer.user, "orvex");
+    EXPECT_EQ(answer.nonce, kNonce);
+    EXPECT_EQ(answer.nc, 1u);
+}
+
+TEST(NonceCountsTest, EachCountOnceWithinAWindowBelowTheHighest) {
+    auth::NonceCounts counts;
+    const struct {
+        const char* nonce;
+        uint32_t nc;
+        bool taken;
+    } steps[] = {
+        {"a", 1, true},   {"a", 1, false},  // the same answer again: a replay
+        {"a", 3, true},   {"a", 2, true},   // a browser's parallel requests, out of order
+        {"a", 2, false},  {"a", 3, false},  {"b", 1, true},  // counts are per nonce
+        {"a", 100, true}, {"a", 37, true},  // 63 below the highest: still in the window
+        {"a", 36, false},                   // 64 below: too old to tell, refused
+        {"a", 37, false}, {"a", 101, true},
+    };
+    for (const auto& s : steps) {
+        EXPECT_EQ(counts.Take(s.nonce, s.nc), s.taken) << s.nonce << " " << s.nc;
+    }
+    // The book is bounded: the least recently used nonce makes room, the busy one stays.
+    for (int i = 0; i < auth::NonceCounts::kTracked; ++i) {
+        EXPECT_TRUE(counts.Take("n" + std::to_string(i), 1));
+        EXPECT_FALSE(counts.Take("a", 101));
+    }
+    EXPECT_TRUE(counts.Take("b", 1)) << "evicted: its client starts a new entry";
 }
 
 }  // namespace

@@ -586,6 +586,7 @@ protected:
     void TearDown() override {
         ServerTest::TearDown();
         unlink(users.c_str());
+        unlink((users + ".nonce-key").c_str());
     }
     // The nonce of a 401 answer, checking the answer's shape on the way (a Session line comes
     // between CSeq and the challenge once the client has one).
@@ -599,7 +600,7 @@ protected:
             return "";
         }
         at += challenge.size();
-        EXPECT_EQ(answer.substr(at + 48), "\"\r\n\r\n") << answer;
+        EXPECT_EQ(answer.substr(at + 48), "\", qop=\"auth\"\r\n\r\n") << answer;
         return answer.substr(at, 48);
     }
     static std::string Authorization(const std::string& method, const std::string& uri,
@@ -662,17 +663,24 @@ TEST_F(AccessTest, TenWrongAnswersLockOneAddressAndTheListKeepsOthersOut) {
         RtspClient guesser("127.0.0.2", port);
         const std::string nonce =
             NonceOf(guesser.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n"), "1");
-        for (int i = 2; i <= 11; ++i) {
+        for (int i = 2; i <= 10; ++i) {
             const std::string n = std::to_string(i);
             NonceOf(guesser.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: " + n + "\r\n" +
                                      Authorization("DESCRIBE", url, nonce, n.c_str()) + "\r\n"),
                     n);
         }
-        EXPECT_TRUE(guesser.ClosedWithoutAnswer());  // the tenth failure ends the connection
+        // The tenth failure is told it is locked out, not challenged again, and the
+        // connection ends.
+        EXPECT_EQ(guesser.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 11\r\n" +
+                                   Authorization("DESCRIBE", url, nonce, "11") + "\r\n"),
+                  "RTSP/1.0 403 Forbidden\r\nCSeq: 11\r\nRetry-After: 60\r\n\r\n");
+        EXPECT_TRUE(guesser.ClosedWithoutAnswer());
     }
     // Locked out, even with the right password; another address is not.
     RtspClient locked("127.0.0.2", port);
-    EXPECT_TRUE(locked.ClosedWithoutAnswer());
+    const std::string answer = locked.Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n");
+    const std::string told = "RTSP/1.0 403 Forbidden\r\nCSeq: 1\r\nRetry-After: ";
+    EXPECT_EQ(answer.compare(0, told.size(), told), 0) << answer;
     RtspClient neighbour("127.0.0.3", port);
     const std::string nonce =
         NonceOf(neighbour.Exchange("DESCRIBE " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n"), "1");

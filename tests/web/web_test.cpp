@@ -13,8 +13,11 @@
 #include <string>
 #include <vector>
 
+#include "auth/AccessGate.h"
 #include "auth/Digest.h"
 #include "platform/fake/FakePlatform.h"
+#include "rtsp/RtspAccess.h"
+#include "rtsp/RtspResponse.h"
 #include "server/FrameTap.h"
 #include "tests/web/HexBytes.h"
 #include "web/FragmentRing.h"
@@ -383,13 +386,13 @@ std::string Header(const std::string& answer, const std::string& name) {
 
 class WebViewerTest : public ::testing::Test {
 protected:
-    void StartViewer(int max_viewers = 16) {
+    void StartViewer(int max_viewers = 16, auth::AccessGate* gate = nullptr) {
         WebViewer::Options options;
         options.port = 0;
         options.max_viewers = max_viewers;
         options.start_wait_ms = 300;
         options.ring_bytes = 1 << 20;
-        viewer_ = std::make_unique<WebViewer>(nullptr, options);
+        viewer_ = std::make_unique<WebViewer>(nullptr, gate, options);
         ASSERT_TRUE(viewer_->Start());
     }
     void FeedPictures(int count) {
@@ -516,6 +519,75 @@ TEST_F(WebViewerTest, WithUsersEveryPathNeedsADigestAnswer) {
         EXPECT_EQ(answer.compare(0, 12, c.status), 0) << answer.substr(0, 80);
     }
     unlink(path);
+    unlink((std::string(path) + ".nonce-key").c_str());
+}
+
+// An HTTP request with a Digest answer for `password` to the nonce of `challenge`.
+std::string AnsweredGet(const std::string& challenge, const char* password) {
+    const std::string www = Header(challenge, "WWW-Authenticate");
+    const size_t n = www.find("nonce=\"");
+    auth::DigestFields fields;
+    fields.username = "orvex";
+    fields.realm = "orvex";
+    fields.nonce = n == std::string::npos ? "" : www.substr(n + 7, 48);
+    fields.uri = "/";
+    const std::string response =
+        auth::DigestExpectedResponse(auth::DigestHa1("orvex", "orvex", password), "GET", fields);
+    return "GET / HTTP/1.1\r\nHost: t\r\nConnection: close\r\nAuthorization: Digest "
+           "username=\"orvex\", realm=\"orvex\", nonce=\"" +
+           fields.nonce + "\", uri=\"/\", response=\"" + response + "\"\r\n\r\n";
+}
+
+TEST_F(WebViewerTest, OneLockoutForRtspAndHttpAnsweredWithRetryAfter) {
+    char path[] = "/tmp/orvex-web-users-XXXXXX";
+    int fd = mkstemp(path);
+    ASSERT_GE(fd, 0);
+    const std::string line = "orvex:orvex:" + auth::DigestHa1("orvex", "orvex", "secret") + "\n";
+    ASSERT_EQ(write(fd, line.data(), line.size()), static_cast<ssize_t>(line.size()));
+    close(fd);
+    const uint32_t loopback = 0x7f000001;
+    const std::string bare = "GET / HTTP/1.1\r\nHost: t\r\nConnection: close\r\n\r\n";
+    for (bool rtsp_first : {true, false}) {
+        SCOPED_TRACE(rtsp_first ? "RTSP guesses, then HTTP" : "HTTP guesses, then RTSP");
+        auth::AccessGate gate;  // the listener's, shared with the web viewer
+        gate.Configure("", path);
+        StartViewer(16, &gate);
+        const std::string challenge = Ask(viewer_->port(), bare);
+        ASSERT_EQ(challenge.compare(0, 12, "HTTP/1.1 401"), 0) << challenge.substr(0, 80);
+        EXPECT_NE(challenge.find("~/.config/orvex/play-url"), std::string::npos)
+            << "the 401 page says where the password is";
+        const std::vector<std::string> wrong_rtsp = {
+            "DESCRIBE rtsp://127.0.0.1/skyvo.0 RTSP/1.0", "CSeq: 2",
+            "Authorization: Digest username=\"orvex\", realm=\"orvex\", nonce=\"" +
+                gate.Judge({"DESCRIBE", "x", nullptr, false, false, loopback, "127.0.0.1"})
+                    .challenge.substr(29, 48) +
+                "\", uri=\"rtsp://127.0.0.1/skyvo.0\", "
+                "response=\"0123456789abcdef0123456789abcdef\""};
+        for (int i = 0; i < 10; ++i) {
+            if (rtsp_first) {
+                JudgeRtspRequest(gate, wrong_rtsp, kRtspDescribe, loopback, "127.0.0.1");
+            } else {
+                const std::string answer = Ask(viewer_->port(), AnsweredGet(challenge, "guess"));
+                EXPECT_EQ(answer.compare(0, 12, i < 9 ? "HTTP/1.1 401" : "HTTP/1.1 429"), 0)
+                    << i << answer.substr(0, 80);
+            }
+        }
+        if (rtsp_first) {
+            // Even the right password gets the same answer while the lock lasts.
+            const std::string answer = Ask(viewer_->port(), AnsweredGet(challenge, "secret"));
+            ASSERT_EQ(answer.compare(0, 12, "HTTP/1.1 429"), 0) << answer.substr(0, 80);
+            EXPECT_EQ(Header(answer, "Retry-After"), "60");
+            EXPECT_EQ(Header(answer, "WWW-Authenticate"), "");
+        } else {
+            const auth::AccessDecision d =
+                JudgeRtspRequest(gate, wrong_rtsp, kRtspOptions, loopback, "127.0.0.1");
+            EXPECT_EQ(d.answer, auth::AccessAnswer::kLockedOut);
+            EXPECT_EQ(d.retry_after_s, 60u);
+        }
+        viewer_.reset();
+    }
+    unlink(path);
+    unlink((std::string(path) + ".nonce-key").c_str());
 }
 
 }  // namespace
