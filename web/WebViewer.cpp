@@ -11,9 +11,12 @@
 #include <cstdlib>
 
 #include "auth/DigestGate.h"
+#include "capture/LivecameraResolution.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
+#include "platform/PropertyPort.h"
 #include "rtsp/CaptureQuery.h"
+#include "rtsp/KeyWordValue.h"
 #include "rtsp/RtspTransport.h"
 #include "service/Clocks.h"
 #include "service/OrvexLog.h"
@@ -64,6 +67,22 @@ constexpr const char* kUnauthorizedText =
     "401 Unauthorized: this stream needs a user name and password.\n"
     "On the machine that runs orvex, the URL with them is in ~/.config/orvex/play-url;\n"
     "tools/orvex-passwd USER adds a user or changes a password.\n";
+
+// Why the capture would refuse the size a query asks for, in words for the viewer; empty when
+// it takes it. Without this the viewer would wait for pictures that never come.
+std::string RefusedSize(const std::string& query) {
+    const std::string chosen = CaptureQueryFor(query);
+    const unsigned width =
+        static_cast<unsigned>(strtoul(getKeyWordValue("width=", chosen).c_str(), nullptr, 10));
+    const unsigned height =
+        static_cast<unsigned>(strtoul(getKeyWordValue("height=", chosen).c_str(), nullptr, 10));
+    char board[platform::kPropertyValueMax] = {};
+    platform::Properties().Get("ro.board.platform", board, "android");
+    if (ResolutionCode(width, height, board) >= 0) return "";
+    return "The capture does not take " + std::to_string(width) + "x" + std::to_string(height) +
+           "; accepted sizes (width= and height= in the address): " + AcceptedSizesText(board) +
+           ".\n";
+}
 
 // What a request carries between libmicrohttpd's callbacks: its target as the client sent it
 // (the Digest answer names it so, query included).
@@ -198,6 +217,13 @@ struct WebViewerCalls {
                              peer.c_str(), max);
             return Reply(connection, 503, "Too many viewers; try again later.\n");
         }
+        const std::string refused = RefusedSize(query);
+        if (!refused.empty()) {
+            self->m_viewers.fetch_sub(1);
+            OrvexLogPriority(platform::kLogWarn, kTag, "web viewer %s refused: %.*s", peer.c_str(),
+                             static_cast<int>(refused.size() - 1), refused.c_str());
+            return Reply(connection, 400, refused);
+        }
         if (self->m_transport != nullptr) self->m_transport->HoldCapture(CaptureQueryFor(query));
         auto* viewer = new StreamViewer{self, peer, {}, GetTimeStampMillsec()};
         std::string type;
@@ -207,7 +233,11 @@ struct WebViewerCalls {
                              peer.c_str(), self->m_options.start_wait_ms);
             viewer->end_reason = nullptr;
             End(viewer);
-            return Reply(connection, 503, "No picture yet; try again.\n");
+            return Reply(connection, 503,
+                         "No picture within " +
+                             std::to_string(self->m_options.start_wait_ms / 1000) +
+                             " s: the picture source is not running; the service's log says "
+                             "why.\n");
         }
         MHD_Response* response =
             MHD_create_response_from_callback(MHD_SIZE_UNKNOWN, kBlockBytes, Read, viewer, End);

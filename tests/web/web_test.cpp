@@ -420,6 +420,7 @@ TEST_F(WebViewerTest, AnswersByPathAndMethod) {
         const char* request;
         const char* status;
         const char* content_type;
+        const char* says = "";
     } cases[] = {
         {"GET / HTTP/1.1\r\nHost: t\r\n\r\n", "HTTP/1.1 200", "text/html; charset=utf-8"},
         {"GET /index.html?x=1 HTTP/1.1\r\nHost: t\r\n\r\n", "HTTP/1.1 200",
@@ -428,8 +429,14 @@ TEST_F(WebViewerTest, AnswersByPathAndMethod) {
         {"GET /nope HTTP/1.1\r\nHost: t\r\n\r\n", "HTTP/1.1 404", "text/plain; charset=utf-8"},
         {"POST / HTTP/1.1\r\nHost: t\r\nContent-Length: 3\r\n\r\nabc", "HTTP/1.1 405",
          "text/plain; charset=utf-8"},
-        {"GET /stream.mp4 HTTP/1.1\r\nHost: t\r\n\r\n", "HTTP/1.1 503",
-         "text/plain; charset=utf-8"},
+        {"GET /stream.mp4 HTTP/1.1\r\nHost: t\r\n\r\n", "HTTP/1.1 503", "text/plain; charset=utf-8",
+         "No picture within 0 s"},
+        // A size the capture refuses is named at once, with the sizes it takes.
+        {"GET /stream.mp4?width=1000&height=700 HTTP/1.1\r\nHost: t\r\n\r\n", "HTTP/1.1 400",
+         "text/plain; charset=utf-8",
+         "The capture does not take 1000x700; accepted sizes (width= and height= in the "
+         "address): 640x480, 720x576, 320x240, 480x320, 1280x720, 720x480, 720x400, 320x176, "
+         "640x368, 1920x1080.\n"},
         {"GARBAGE\r\n\r\n", nullptr, nullptr},  // 400, or just the connection closed
     };
     for (const Case& c : cases) {
@@ -443,13 +450,14 @@ TEST_F(WebViewerTest, AnswersByPathAndMethod) {
         if (c.content_type != nullptr) {
             EXPECT_EQ(Header(answer, "Content-Type"), c.content_type);
         }
+        EXPECT_NE(answer.find(c.says), std::string::npos) << answer;
     }
 }
 
 TEST_F(WebViewerTest, StreamsTheInitSegmentThenFragmentsAndRefusesOneViewerTooMany) {
     StartViewer(1);
     FeedPictures(3);
-    const std::string request = "GET /stream.mp4?width=640 HTTP/1.1\r\nHost: t\r\n\r\n";
+    const std::string request = "GET /stream.mp4?width=640&height=480 HTTP/1.1\r\nHost: t\r\n\r\n";
     std::string first = Ask(viewer_->port(), request, 500);
     ASSERT_EQ(first.compare(0, 12, "HTTP/1.1 200"), 0) << first.substr(0, 80);
     EXPECT_EQ(Header(first, "Content-Type"), "video/mp4; codecs=\"avc1.42c01e,mp4a.40.2\"");
