@@ -10,9 +10,11 @@ query="skyvo.0?width=1280&height=720&cameraid=hd0&win=main&sub=0&dumpvideo=0&dum
 address=$( (ip -4 route get 192.0.2.1 2>/dev/null || true) | sed -n 's/.* src \([0-9.]*\).*/\1/p')
 address=${address:-127.0.0.1}
 url="rtsp://$address/$query"
-if [[ -z ${ORVEX_PROP_FILE:-} && ${ORVEX_AUTH:-on} != off ]]; then
+export ORVEX_PROP_FILE="${ORVEX_PROP_FILE:-$top/platform/host/orvex.prop}"
+if [[ $ORVEX_PROP_FILE == "$top/platform/host/orvex.prop" && ${ORVEX_AUTH:-on} != off ]]; then
   # Who may watch: a user "orvex" with a random password, made at the first start. The shipped
-  # properties are copied at every start with kv.orvex.auth pointing at the credentials.
+  # properties are read as they are (edits take effect while the service runs), with a small
+  # file of this script's laid over them that points kv.orvex.auth at the credentials.
   conf=${XDG_CONFIG_HOME:-$HOME/.config}/orvex
   users=$conf/users.htdigest
   mkdir -p "$conf"
@@ -21,17 +23,20 @@ if [[ -z ${ORVEX_PROP_FILE:-} && ${ORVEX_AUTH:-on} != off ]]; then
     (umask 077 && echo "rtsp://orvex:$password@$address/$query" >"$conf/play-url")
     echo "run: made $users with the user \"orvex\" (change the password: tools/orvex-passwd orvex)"
   fi
-  { echo "# Made by tools/run.sh at every start from $top/platform/host/orvex.prop: edit that one."
-    cat "$top/platform/host/orvex.prop"
-    echo "kv.orvex.auth=$users"; } >"$conf/orvex.prop"
-  export ORVEX_PROP_FILE=$conf/orvex.prop
+  { echo "# Made by tools/run.sh at every start: who may watch. Other settings belong in"
+    echo "# $top/platform/host/orvex.prop, which is read as it is."
+    echo "kv.orvex.auth=$users"; } >"$conf/run.prop"
+  # Earlier versions of this script ran a copy of the shipped file from here.
+  if head -n 1 "$conf/orvex.prop" 2>/dev/null | grep -q '^# Made by tools/run.sh'; then
+    rm -f "$conf/orvex.prop"
+  fi
+  export ORVEX_PROP_FILE=$ORVEX_PROP_FILE:$conf/run.prop
   if [[ -s $conf/play-url ]]; then
     url=$(sed "s|@[^/]*/|@$address/|" "$conf/play-url")
   else
     url="rtsp://USER:PASSWORD@$address/$query"
   fi
 fi
-export ORVEX_PROP_FILE="${ORVEX_PROP_FILE:-$top/platform/host/orvex.prop}"
 if [[ $(id -u) -ne 0 ]] && ! getcap "$top/build/orvex" 2>/dev/null | grep -q cap_net_bind_service; then
   echo "run: orvex listens on port 554, which needs privileges on Linux. Either run as root:"
   echo "       sudo ORVEX_PROP_FILE=$ORVEX_PROP_FILE $top/build/orvex"
@@ -39,7 +44,13 @@ if [[ $(id -u) -ne 0 ]] && ! getcap "$top/build/orvex" 2>/dev/null | grep -q cap
   echo "       sudo setcap cap_net_bind_service=+ep $top/build/orvex && $0"
   exit 1
 fi
-http_port=$(sed -n 's/^kv\.orvex\.http=\([0-9]*\)$/\1/p' "$ORVEX_PROP_FILE" | tail -n 1)
+# The web port as the service will read it: the last file of the list that sets it.
+http_port=
+IFS=: read -r -a prop_files <<<"$ORVEX_PROP_FILE"
+for f in "${prop_files[@]}"; do
+  p=$(sed -n 's/^[[:space:]]*kv\.orvex\.http[[:space:]]*=[[:space:]]*\([0-9]*\)[[:space:]]*$/\1/p' "$f" 2>/dev/null | tail -n 1)
+  [[ -n $p ]] && http_port=$p
+done
 echo "run: starting orvex; play it with"
 echo "       ffplay -rtsp_transport udp '$url'"
 if [[ -n $http_port ]]; then

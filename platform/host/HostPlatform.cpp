@@ -46,12 +46,11 @@ void InstallDefaultPorts() {
     Install(ports);
     // Once, with the log in place: keys that nothing reads are most likely misspelt.
     static const bool checked = [] {
-        std::ifstream in(properties->path());
-        std::ostringstream text;
-        text << in.rdbuf();
-        if (in) {
-            host::WarnUnknownPropertyKeys(host::HostProperties::Parse(text.str()),
-                                          properties->path());
+        for (const std::string& path : properties->paths()) {
+            std::ifstream in(path);
+            std::ostringstream text;
+            text << in.rdbuf();
+            if (in) host::WarnUnknownPropertyKeys(host::HostProperties::Parse(text.str()), path);
         }
         return true;
     }();

@@ -33,7 +33,22 @@ std::string PropertyFilePath() {
     return env != nullptr && env[0] != '\0' ? env : "/etc/orvex/orvex.prop";
 }
 
-HostProperties::HostProperties(std::string path) : path_(std::move(path)) {}
+HostProperties::HostProperties(const std::string& paths) {
+    size_t from = 0;
+    for (;;) {
+        const size_t colon = paths.find(':', from);
+        std::string path = paths.substr(from, colon == std::string::npos ? colon : colon - from);
+        if (!path.empty()) files_.push_back(File{path, {}, false, {}, -1});
+        if (colon == std::string::npos) break;
+        from = colon + 1;
+    }
+}
+
+std::vector<std::string> HostProperties::paths() const {
+    std::vector<std::string> out;
+    for (const File& f : files_) out.push_back(f.path);
+    return out;
+}
 
 std::map<std::string, std::string> HostProperties::Parse(const std::string& text) {
     std::map<std::string, std::string> out;
@@ -51,41 +66,49 @@ std::map<std::string, std::string> HostProperties::Parse(const std::string& text
     return out;
 }
 
-void HostProperties::ReloadIfChanged() {
+void HostProperties::ReloadIfChanged(File* file) {
     struct stat st {};
-    if (stat(path_.c_str(), &st) != 0) {
-        values_.clear();
-        loaded_ = false;
+    if (stat(file->path.c_str(), &st) != 0) {
+        file->values.clear();
+        file->loaded = false;
         return;
     }
-    if (loaded_ && st.st_size == size_ && st.st_mtim.tv_sec == mtime_.tv_sec &&
-        st.st_mtim.tv_nsec == mtime_.tv_nsec) {
+    if (file->loaded && st.st_size == file->size && st.st_mtim.tv_sec == file->mtime.tv_sec &&
+        st.st_mtim.tv_nsec == file->mtime.tv_nsec) {
         return;
     }
-    std::ifstream f(path_);
+    std::ifstream f(file->path);
     std::stringstream text;
     text << f.rdbuf();
-    values_ = Parse(text.str());
-    loaded_ = true;
-    mtime_ = st.st_mtim;
-    size_ = st.st_size;
+    file->values = Parse(text.str());
+    file->loaded = true;
+    file->mtime = st.st_mtim;
+    file->size = st.st_size;
+}
+
+const std::string* HostProperties::Find(const std::string& key) {
+    const std::string* found = nullptr;
+    for (File& file : files_) {
+        ReloadIfChanged(&file);
+        auto it = file.values.find(key);
+        if (it != file.values.end()) found = &it->second;
+    }
+    return found;
 }
 
 bool HostProperties::Lookup(const std::string& key, std::string* value) {
     std::lock_guard<std::mutex> hold(mutex_);
-    ReloadIfChanged();
-    auto it = values_.find(key);
-    if (it == values_.end() || it->second.empty()) return false;
-    *value = it->second;
+    const std::string* found = Find(key);
+    if (found == nullptr || found->empty()) return false;
+    *value = *found;
     return true;
 }
 
 int HostProperties::Get(const char* key, char* value, const char* default_value) {
     std::lock_guard<std::mutex> hold(mutex_);
-    ReloadIfChanged();
-    auto it = key != nullptr ? values_.find(key) : values_.end();
+    const std::string* found = key != nullptr ? Find(key) : nullptr;
     // As on the television, an empty value reads as unset.
-    if (it != values_.end() && !it->second.empty()) return CopyOut(it->second.c_str(), value);
+    if (found != nullptr && !found->empty()) return CopyOut(found->c_str(), value);
     return CopyOut(default_value != nullptr ? default_value : "", value);
 }
 

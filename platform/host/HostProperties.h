@@ -6,40 +6,50 @@
 #include <map>
 #include <mutex>
 #include <string>
+#include <vector>
 
 #include "platform/PropertyPort.h"
 
 namespace platform {
 namespace host {
 
-// System properties on Linux, from a build.prop-style file: "key=value" lines, blanks around
-// key and value ignored, "#" comment lines. The file is read again when it changes, so edits
-// take effect at the next lookup, as setprop would. A missing file means no property is set.
+// System properties on Linux, from build.prop-style files: "key=value" lines, blanks around
+// key and value ignored, "#" comment lines. `paths` names one file or several separated by ':';
+// a key in a later file wins (tools/run.sh lays its own settings over the shipped file this
+// way, so the file people edit is the file that is read). Each file is read again when it
+// changes, so edits take effect at the next lookup, as setprop would. A missing file sets
+// nothing.
 // Thread contract: Get from any thread.
 class HostProperties final : public PropertyPort {
 public:
-    explicit HostProperties(std::string path);
+    explicit HostProperties(const std::string& paths);
 
     int Get(const char* key, char* value, const char* default_value) override;
     // The whole value of `key` (Get stops at kPropertyValueMax); false when unset or empty.
     bool Lookup(const std::string& key, std::string* value);
-    const std::string& path() const { return path_; }
+    std::vector<std::string> paths() const;
 
     // Parses file text into its key/value pairs (later lines win).
     static std::map<std::string, std::string> Parse(const std::string& text);
 
 private:
-    void ReloadIfChanged();
+    struct File {
+        std::string path;
+        std::map<std::string, std::string> values;
+        bool loaded = false;
+        timespec mtime{};
+        off_t size = -1;
+    };
+    static void ReloadIfChanged(File* file);
+    // The value of `key` in the last file that sets it, null when none does.
+    const std::string* Find(const std::string& key);
 
     std::mutex mutex_;
-    std::string path_;
-    std::map<std::string, std::string> values_;
-    bool loaded_ = false;
-    timespec mtime_{};
-    off_t size_ = -1;
+    std::vector<File> files_;
 };
 
-// Where the host looks for its properties: $ORVEX_PROP_FILE, else /etc/orvex/orvex.prop.
+// Where the host looks for its properties: $ORVEX_PROP_FILE (one path, or several separated by
+// ':'), else /etc/orvex/orvex.prop.
 std::string PropertyFilePath();
 
 }  // namespace host

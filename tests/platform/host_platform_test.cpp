@@ -82,6 +82,32 @@ TEST(HostPropertiesTest, EditsTakeEffectAtTheNextLookup) {
     EXPECT_STREQ(value, "gone");
 }
 
+TEST(HostPropertiesTest, ALaterFileWinsAndEachIsReadAgainWhenEdited) {
+    const std::string shipped = TempPath("props_shipped"), own = TempPath("props_own");
+    WriteFile(shipped, "orvex.host.video=pattern\nkv.orvex.http=8080\nkv.orvex.auth=\n");
+    WriteFile(own, "kv.orvex.auth=/home/u/users\nkv.orvex.http=\n");
+    HostProperties props(shipped + ":" + own + ":" + own + ".absent");
+    EXPECT_EQ(props.paths(), (std::vector<std::string>{shipped, own, own + ".absent"}));
+    const struct {
+        const char* key;
+        const char* value;
+    } before[] = {
+        {"orvex.host.video", "pattern"},     // only in the first
+        {"kv.orvex.auth", "/home/u/users"},  // set by the second
+        {"kv.orvex.http", "none"},           // emptied by the second: unset
+    };
+    char value[platform::kPropertyValueMax];
+    for (const auto& c : before) {
+        props.Get(c.key, value, "none");
+        EXPECT_STREQ(value, c.value) << c.key;
+    }
+    WriteFile(shipped, "orvex.host.video=x11::1\n");  // the file people edit, while it runs
+    props.Get("orvex.host.video", value, "");
+    EXPECT_STREQ(value, "x11::1");
+    unlink(shipped.c_str());
+    unlink(own.c_str());
+}
+
 TEST(HostPropertiesTest, LongValuesAreCutToThePropertyLimit) {
     std::string path = TempPath("props_long");
     WriteFile(path, "k=" + std::string(200, 'v') + "\n");
