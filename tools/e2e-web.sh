@@ -1,8 +1,9 @@
 #!/usr/bin/env bash
 # The web viewer's HTTP side under abuse, end to end: orvex with the shipped host properties
 # and kv.orvex.http=8080 (16 viewers at most). curl and ffprobe get the page and a stream;
-# hostile requests, a flood from 127.0.0.2 and a slow trickle from 127.0.0.3 are refused or
-# timed out while 127.0.0.1 still loads the page and watches at full rate; 100 stream and 100
+# hostile requests, a flood from 127.0.0.2, a slow trickle from 127.0.0.3 and crowds of idle and
+# trickling connections from 40 and 50 addresses are refused or timed out while 127.0.0.1 still
+# loads the page within a second and watches at full rate; 100 stream and 100
 # bare connect/close cycles; a 17th viewer gets 503. Afterwards orvex has as many descriptors
 # and threads as before, is still up and stops on SIGTERM within 2 s. Runs in its own network
 # namespace (ports 554 and 8080 are its own; every address is loopback).
@@ -86,7 +87,8 @@ grep -q "^accepted=$((max + 4)) closed_by_service=$((200 - max - 4)) " <<<"$out"
 drain 5 || fail "$(connections) connections still open 5 s after the flood closed"
 ok "200 connections from 127.0.0.2: $out; all closed afterwards"
 
-# 4. A slow trickle from one address: a byte every 2 s keeps each one under the idle timeout.
+# 4. A slow trickle from one address: a byte every 2 s keeps each one under the idle timeout,
+# but none finishes its request within 5 s, so the service ends each one then.
 # Meanwhile 127.0.0.1 loads the page and watches at full rate. A viewer holds capture from the
 # start so that the measured one joins running pictures.
 check 60 trickle "$port" 127.0.0.3 40 25 >"$work/trickle" 2>&1 &
@@ -109,6 +111,17 @@ kill "$first" 2>/dev/null || true
 wait "$trickle" || fail "trickle: $(cat "$work/trickle")"
 ok "40 trickling connections from 127.0.0.3: $(cat "$work/trickle"); meanwhile GET / 200 and" \
   "ffmpeg decoded $frames frames of 5 s ($((frames / 5)) fps) in $took ms"
+
+# 4b. Crowds from many addresses: idle connections, then trickling ones, more than the server
+# lets wait at once; the oldest of the busiest address give way to newcomers, and a trickler
+# is closed 5 s after it began a request it never finishes. 127.0.0.1 gets the page within a
+# second and the stream from its next key frame throughout.
+drain 15 || fail "$(connections) connections still open before the crowds"
+out=$(check 40 crowd "$port" 40 6 idle "$query") || fail "idle crowd: $out"
+ok "$out"
+drain 15 || fail "$(connections) connections still open after the idle crowd"
+out=$(check 40 crowd "$port" 50 1 trickling "$query") || fail "trickling crowd: $out"
+ok "$out"
 
 # 5. Connect/disconnect cycles: every viewer that came also leaves (its capture hold with it).
 # The service sees that a viewer went only when it next writes to it, so a socket reset by the

@@ -13,6 +13,13 @@
     http_check.py cycles PORT COUNT QUERY    COUNT times: open the stream, read 8 KB, close;
                                              then COUNT connections closed without a request
     http_check.py viewers PORT COUNT QUERY   COUNT stream readers at once, each reading for 2 s
+    http_check.py crowd PORT ADDRESSES EACH KIND QUERY
+                                             EACH connections from each of ADDRESSES addresses
+                                             (127.0.0.10 on), KIND idle or trickling a header
+                                             byte a second; meanwhile, every 2 s for 10 s, how
+                                             long 127.0.0.1 waits for the page and for the
+                                             stream's first bytes (within 1 s and 3 s: the
+                                             stream starts at a key frame)
 
 Every wait is bounded; the exit status is 0 when every answer was within its bound and of the
 kind the mode expects, 1 otherwise (the lines say which).
@@ -300,6 +307,59 @@ def viewers(port, count, query):
     return 0
 
 
+def first_bytes(port, path, source=None):
+    """Seconds until the first bytes of a 200 answer to GET `path`; None when none came in
+    time or the answer was not 200."""
+    began = time.monotonic()
+    try:
+        s = connect(port, source, timeout=5)
+        s.sendall(("GET %s HTTP/1.1\r\nHost: %s\r\nConnection: close\r\n\r\n" %
+                   (path, HOST)).encode())
+        status = answer(s, began + 5)
+        s.close()
+    except OSError:
+        return None
+    return time.monotonic() - began if status == 200 else None
+
+
+def crowd(port, addresses, each, kind, query):
+    socks = []
+    stop = threading.Event()
+    for a in range(addresses):
+        for _ in range(each):
+            try:
+                socks.append(connect(port, "127.0.0.%d" % (10 + a), timeout=5))
+            except OSError:
+                pass
+
+    def trickle_bytes():
+        request = b"GET / HTTP/1.1\r\nHost: 127.0.0.1\r\nX-Slow: " + b"s" * 100
+        sent = 0
+        while not stop.wait(1.0):
+            for s in socks:
+                try:
+                    s.send(request[sent:sent + 1])
+                except OSError:
+                    pass
+            sent += 1
+
+    if kind == "trickling":
+        threading.Thread(target=trickle_bytes, daemon=True).start()
+    page, stream = [], []
+    for _ in range(5):
+        time.sleep(2)
+        page.append(first_bytes(port, "/"))
+        stream.append(first_bytes(port, "/stream.mp4?" + query))
+    stop.set()
+    for s in socks:
+        s.close()
+    worst = lambda xs: "never" if None in xs else "%d ms" % (1000 * max(xs))
+    print("%s=%d from %d addresses: page worst %s, stream start worst %s (5 tries each)"
+          % (kind, len(socks), addresses, worst(page), worst(stream)))
+    # The stream starts at a key frame, up to one key frame interval (2 s) away.
+    return 0 if None not in page + stream and max(page) < 1.0 and max(stream) < 3.0 else 1
+
+
 def main():
     mode, port = sys.argv[1], int(sys.argv[2])
     args = sys.argv[3:]
@@ -313,6 +373,8 @@ def main():
         sys.exit(cycles(port, int(args[0]), args[1]))
     if mode == "viewers":
         sys.exit(viewers(port, int(args[0]), args[1]))
+    if mode == "crowd":
+        sys.exit(crowd(port, int(args[0]), int(args[1]), args[2], args[3]))
     sys.exit(__doc__)
 
 

@@ -7,6 +7,9 @@
 #include <stdarg.h>
 #include <string.h>
 
+#include <sys/socket.h>
+
+#include <chrono>
 #include <cstdio>
 #include <cstdlib>
 
@@ -39,6 +42,12 @@ std::string AddressText(const sockaddr* addr) {
 uint32_t HostOrderAddress(const sockaddr* addr) {
     if (addr == nullptr || addr->sa_family != AF_INET) return 0;
     return ntohl(reinterpret_cast<const sockaddr_in*>(addr)->sin_addr.s_addr);
+}
+
+uint64_t SteadyMs() {
+    return static_cast<uint64_t>(std::chrono::duration_cast<std::chrono::milliseconds>(
+                                     std::chrono::steady_clock::now().time_since_epoch())
+                                     .count());
 }
 
 const sockaddr* PeerOf(MHD_Connection* connection) {
@@ -110,11 +119,41 @@ struct WebViewerCalls {
                                                                                         : MHD_NO;
     }
 
+    static void Connection(void* cls, MHD_Connection* connection, void**,
+                           MHD_ConnectionNotificationCode code) {
+        auto* self = static_cast<WebViewer*>(cls);
+        if (code == MHD_CONNECTION_NOTIFY_CLOSED) {
+            self->m_warden.Closed(connection);
+            return;
+        }
+        const MHD_ConnectionInfo* fd =
+            MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CONNECTION_FD);
+        if (fd == nullptr) return;
+        const sockaddr* peer = PeerOf(connection);
+        if (self->m_warden.Opened(connection, fd->connect_fd, HostOrderAddress(peer), SteadyMs())) {
+            LogCrowd(self, "the oldest waiting connection of the busiest address was closed");
+        }
+    }
+
+    // One warning per ten seconds while connections crowd in.
+    static void LogCrowd(WebViewer* self, const char* what) {
+        const uint32_t now = GetTimeStampMillsec();
+        uint32_t last = self->m_crowd_logged_ms.load();
+        if (last != 0 && now - last < 10000) return;
+        if (!self->m_crowd_logged_ms.compare_exchange_strong(last, now == 0 ? 1 : now)) return;
+        OrvexLogPriority(platform::kLogWarn, kTag,
+                         "web: more than %d connections wait for a request, or one took over "
+                         "%u ms to send it: %s",
+                         self->m_options.waiting_max, self->m_options.request_deadline_ms, what);
+    }
+
     static void* Uri(void*, const char* uri, MHD_Connection*) {
         return new Request{uri != nullptr ? uri : ""};
     }
 
-    static void Completed(void*, MHD_Connection*, void** request, MHD_RequestTerminationCode) {
+    static void Completed(void* cls, MHD_Connection* connection, void** request,
+                          MHD_RequestTerminationCode) {
+        static_cast<WebViewer*>(cls)->m_warden.Answered(connection, SteadyMs());
         delete static_cast<Request*>(*request);
         *request = nullptr;
     }
@@ -131,6 +170,7 @@ struct WebViewerCalls {
                              const char* method, const char*, const char*, size_t* upload_size,
                              void** context) {
         auto* self = static_cast<WebViewer*>(cls);
+        self->m_warden.Answering(connection);
         if (*upload_size != 0) {  // a body nobody asked for: read and dropped
             *upload_size = 0;
             return MHD_YES;
@@ -293,7 +333,10 @@ WebViewer::WebViewer(RtspTransport* transport, auth::AccessGate* gate, Options o
       m_ring(options.ring_bytes),
       m_muxer(&m_ring),
       m_own_gate(gate == nullptr ? std::make_unique<auth::AccessGate>() : nullptr),
-      m_gate(gate != nullptr ? gate : m_own_gate.get()) {}
+      m_gate(gate != nullptr ? gate : m_own_gate.get()),
+      m_warden({options.waiting_max, options.request_deadline_ms},
+               // The connection's own thread sees its socket end and closes it.
+               [](int fd) { shutdown(fd, SHUT_RDWR); }) {}
 
 WebViewer::~WebViewer() { Stop(); }
 
@@ -317,10 +360,13 @@ bool WebViewer::Start() {
         static_cast<uint16_t>(m_options.port), WebViewerCalls::Accept, this, WebViewerCalls::Handle,
         this, MHD_OPTION_EXTERNAL_LOGGER, WebViewerCalls::Logger, this, MHD_OPTION_SOCK_ADDR,
         reinterpret_cast<sockaddr*>(&bind), MHD_OPTION_URI_LOG_CALLBACK, WebViewerCalls::Uri, this,
-        MHD_OPTION_NOTIFY_COMPLETED, WebViewerCalls::Completed, this,
-        // Viewers, page loads and a margin; one address cannot take every connection.
-        MHD_OPTION_CONNECTION_LIMIT, 2 * viewers + 8, MHD_OPTION_PER_IP_CONNECTION_LIMIT,
-        viewers + 4, MHD_OPTION_CONNECTION_TIMEOUT, m_options.idle_timeout_s,
+        MHD_OPTION_NOTIFY_COMPLETED, WebViewerCalls::Completed, this, MHD_OPTION_NOTIFY_CONNECTION,
+        WebViewerCalls::Connection, this,
+        // Viewers, connections waiting for their request (the warden keeps those from taking
+        // more) and a margin; one address cannot take every connection.
+        MHD_OPTION_CONNECTION_LIMIT, viewers + static_cast<unsigned>(m_options.waiting_max) + 8,
+        MHD_OPTION_PER_IP_CONNECTION_LIMIT, viewers + 4, MHD_OPTION_CONNECTION_TIMEOUT,
+        m_options.idle_timeout_s,
         // Bounds a request's headers as well as the buffers of its answer.
         MHD_OPTION_CONNECTION_MEMORY_LIMIT, static_cast<size_t>(64 * 1024),
         MHD_OPTION_THREAD_STACK_SIZE, static_cast<size_t>(256 * 1024), MHD_OPTION_END);
@@ -336,6 +382,14 @@ bool WebViewer::Start() {
         if (info != nullptr) m_options.port = info->port;
     }
     m_tapped = AddFrameSink(&m_muxer);
+    m_sweeper = std::thread([this] {
+        thread_mutex::Scoped hold(m_sweep_lock);
+        while (!m_stopping.load()) {
+            if (m_warden.Sweep(SteadyMs()) > 0)
+                WebViewerCalls::LogCrowd(this, "connections past the deadline were closed");
+            m_sweep_wake.wait_for(m_sweep_lock, std::chrono::milliseconds(250));
+        }
+    });
     OrvexLogPriority(platform::kLogInfo, kTag, "web viewer on port %u, at most %d viewers",
                      m_options.port, m_options.max_viewers);
     return true;
@@ -343,7 +397,12 @@ bool WebViewer::Start() {
 
 void WebViewer::Stop() {
     if (m_daemon == nullptr) return;
-    m_stopping.store(true);
+    {
+        thread_mutex::Scoped hold(m_sweep_lock);
+        m_stopping.store(true);
+        m_sweep_wake.notify_all();
+    }
+    if (m_sweeper.joinable()) m_sweeper.join();
     m_ring.Stop();
     if (m_tapped) RemoveFrameSink(&m_muxer);
     m_tapped = false;

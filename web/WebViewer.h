@@ -3,9 +3,11 @@
 #include <atomic>
 #include <memory>
 #include <string>
+#include <thread>
 
 #include "auth/AccessGate.h"
 #include "media/thread_mutex.h"
+#include "web/ConnectionWarden.h"
 #include "web/FragmentRing.h"
 #include "web/LiveMuxer.h"
 
@@ -31,6 +33,9 @@ public:
         size_t ring_bytes = 8u << 20;
         int start_wait_ms = 8000;      // how long a new viewer waits for the first key frame
         unsigned idle_timeout_s = 10;  // a connection that moves nothing for this long ends
+        // Connections waiting for a request at once, and how long each may take to send it.
+        int waiting_max = 32;
+        unsigned request_deadline_ms = 5000;
     };
 
     // `gate`: who may watch, shared with the RTSP side; null makes the viewer a gate of its own,
@@ -61,6 +66,11 @@ private:
     auth::AccessGate* m_gate;
     std::atomic<int> m_viewers{0};
     std::atomic<bool> m_stopping{false};
+    ConnectionWarden m_warden;
+    std::thread m_sweeper;  // closes connections that did not send their request in time
+    thread_mutex m_sweep_lock;
+    thread_condition m_sweep_wake;
+    std::atomic<uint32_t> m_crowd_logged_ms{0};  // one line per episode, not per connection
 };
 
 // The service's web viewer, started when kv.orvex.http names a port (unset: none, no port is

@@ -20,6 +20,7 @@
 #include "rtsp/RtspResponse.h"
 #include "server/FrameTap.h"
 #include "tests/web/HexBytes.h"
+#include "web/ConnectionWarden.h"
 #include "web/FragmentRing.h"
 #include "web/LiveMuxer.h"
 #include "web/WebViewer.h"
@@ -384,10 +385,63 @@ std::string Header(const std::string& answer, const std::string& name) {
     return answer.substr(from, answer.find("\r\n", from) - from);
 }
 
+// Which connections the warden closes, step by step: ids are the fds, addresses one digit.
+TEST(ConnectionWardenTest, TheCrowdGivesWayAndLateRequestsEnd) {
+    std::vector<int> closed;
+    ConnectionWarden warden({3, 1000}, [&closed](int fd) { closed.push_back(fd); });
+    auto id = [](int fd) { return reinterpret_cast<const void*>(static_cast<intptr_t>(fd)); };
+    enum Op { kOpen, kAnswering, kAnswered, kClose, kSweep };
+    const struct {
+        Op op;
+        int fd;
+        uint32_t address;
+        uint64_t now;
+        std::vector<int> closes;  // what this step closes
+    } steps[] = {
+        {kOpen, 10, 1, 0, {}},
+        {kOpen, 11, 2, 100, {}},
+        {kOpen, 12, 2, 200, {}},
+        {kAnswering, 10, 0, 0, {}},  // a viewer being answered is out of reach
+        {kOpen, 13, 3, 300, {}},
+        // One too many waiting: the busiest address (2) loses its oldest.
+        {kOpen, 14, 3, 400, {11}},
+        {kOpen, 15, 4, 500, {13}},  // now address 3 has the most
+        {kClose, 11, 0, 0, {}},
+        {kClose, 12, 0, 0, {}},
+        {kSweep, 0, 0, 1299, {}},
+        // Waited a second for a request: 14 goes (13 is already closing); the viewer stays.
+        {kSweep, 0, 0, 1400, {14}},
+        {kAnswered, 10, 0, 1400, {}},  // keep-alive: waits for its next request from now
+        {kSweep, 0, 0, 2399, {15}},
+        {kSweep, 0, 0, 2400, {10}},
+    };
+    for (const auto& s : steps) {
+        closed.clear();
+        switch (s.op) {
+            case kOpen:
+                EXPECT_EQ(warden.Opened(id(s.fd), s.fd, s.address, s.now), !s.closes.empty());
+                break;
+            case kAnswering:
+                warden.Answering(id(s.fd));
+                break;
+            case kAnswered:
+                warden.Answered(id(s.fd), s.now);
+                break;
+            case kClose:
+                warden.Closed(id(s.fd));
+                break;
+            case kSweep:
+                EXPECT_EQ(warden.Sweep(s.now), static_cast<int>(s.closes.size()));
+                break;
+        }
+        EXPECT_EQ(closed, s.closes) << "step with fd " << s.fd << " at " << s.now;
+    }
+}
+
 class WebViewerTest : public ::testing::Test {
 protected:
-    void StartViewer(int max_viewers = 16, auth::AccessGate* gate = nullptr) {
-        WebViewer::Options options;
+    void StartViewer(int max_viewers = 16, auth::AccessGate* gate = nullptr,
+                     WebViewer::Options options = {}) {
         options.port = 0;
         options.max_viewers = max_viewers;
         options.start_wait_ms = 300;
@@ -528,6 +582,57 @@ TEST_F(WebViewerTest, WithUsersEveryPathNeedsADigestAnswer) {
     }
     unlink(path);
     unlink((std::string(path) + ".nonce-key").c_str());
+}
+
+// A connection from `source` (a loopback address) to the viewer, or -1.
+int ConnectFrom(const char* source, unsigned port) {
+    int fd = socket(AF_INET, SOCK_STREAM, 0);
+    sockaddr_in from{};
+    from.sin_family = AF_INET;
+    inet_pton(AF_INET, source, &from.sin_addr);
+    sockaddr_in to{};
+    to.sin_family = AF_INET;
+    to.sin_port = htons(static_cast<uint16_t>(port));
+    to.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    if (bind(fd, reinterpret_cast<sockaddr*>(&from), sizeof from) != 0 ||
+        connect(fd, reinterpret_cast<sockaddr*>(&to), sizeof to) != 0) {
+        close(fd);
+        return -1;
+    }
+    return fd;
+}
+
+TEST_F(WebViewerTest, IdleAndTricklingConnectionsGiveWayToAViewer) {
+    WebViewer::Options options;
+    options.waiting_max = 4;
+    options.request_deadline_ms = 400;
+    StartViewer(16, nullptr, options);
+    std::vector<int> crowd;
+    for (const char* source : {"127.0.0.2", "127.0.0.3", "127.0.0.4", "127.0.0.5"}) {
+        for (int i = 0; i < 3; ++i) crowd.push_back(ConnectFrom(source, viewer_->port()));
+    }
+    const int trickler = ConnectFrom("127.0.0.6", viewer_->port());
+    ASSERT_GE(trickler, 0);
+    const auto began = std::chrono::steady_clock::now();
+    std::string answer =
+        Ask(viewer_->port(), "GET / HTTP/1.1\r\nHost: t\r\nConnection: close\r\n\r\n", 1000);
+    EXPECT_EQ(answer.compare(0, 12, "HTTP/1.1 200"), 0)
+        << "a crowd of idle connections kept the page away";
+    // A byte every 50 ms keeps it under any idle timeout, never finishing its request.
+    const char slow[] = "GET / HTTP/1.1\r\nHost: t\r\nX-Slow: ssssssssssssssssssssssssssssss";
+    bool ended = false;
+    for (size_t i = 0; i < sizeof slow - 1 && !ended; ++i) {
+        ended = send(trickler, slow + i, 1, MSG_NOSIGNAL) != 1;
+        pollfd p{trickler, POLLIN, 0};
+        char byte;
+        if (!ended && poll(&p, 1, 50) == 1) ended = recv(trickler, &byte, 1, 0) <= 0;
+    }
+    const auto took = std::chrono::duration_cast<std::chrono::milliseconds>(
+        std::chrono::steady_clock::now() - began);
+    EXPECT_TRUE(ended) << "a request trickled in for " << took.count() << " ms";
+    EXPECT_LT(took.count(), 1500);
+    close(trickler);
+    for (int fd : crowd) close(fd);
 }
 
 // An HTTP request with a Digest answer for `password` to the nonce of `challenge`.
