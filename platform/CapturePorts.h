@@ -59,6 +59,10 @@ public:
     virtual ~MediaRecorderPort() = default;
     // MediaRecorder(String16(package)): null when it cannot be created.
     virtual std::shared_ptr<MediaRecorder> create(const std::string& package) = 0;
+    // Asks the recorder that is recording for a key frame as soon as it can, so that a viewer
+    // who just joined need not wait for the next one. False where the platform's recorder
+    // cannot be asked (the television's keeps its own interval).
+    virtual bool RequestKeyFrame() { return false; }
 };
 
 class TvManagerClient {

@@ -14,6 +14,7 @@
 #include "rtsp/RtspTransport.h"
 #include "service/OrvexLog.h"
 #include "service/ThreadName.h"
+#include "stream/KeyFrames.h"
 
 namespace {
 
@@ -60,6 +61,7 @@ struct Publisher::Server {
     std::vector<uint8_t> session_sps, session_pps;  // what the session's header carries
     uint32_t origin_ms = 0;
     int backoff_ms = 0;
+    bool key_asked = false;  // for the connection being made
     int64_t retry_at_ms = 0;
     bool outage = false;  // a failure was logged; the next success says so
     int64_t outage_since_ms = 0;
@@ -100,6 +102,9 @@ void Publisher::Server::Run() {
             }
         }
         if (session == nullptr) {
+            // A server (re)connects at a key frame: ask for one rather than wait out the
+            // encoder's interval.
+            if (!key_asked && SteadyMs() >= retry_at_ms) key_asked = stream::AskForKeyFrame();
             if (!video || !frame.key || sps.empty() || pps.empty()) continue;
             if (SteadyMs() < retry_at_ms) continue;
             if (!Connect(frame.time_ms)) continue;
@@ -153,6 +158,7 @@ bool Publisher::Server::Connect(uint32_t time_ms) {
 
 void Publisher::Server::Lost(const char* what) {
     session.reset();
+    key_asked = false;
     backoff_ms = NextBackoffMs(backoff_ms, first_backoff_ms, max_backoff_ms);
     retry_at_ms = SteadyMs() + backoff_ms;
     if (outage) return;  // said once per outage; the attempts go on quietly

@@ -4,8 +4,26 @@
 
 void DestSocketTable::Add(void* key, int port, const std::string& ip) {
     TLock::Scoped hold(lock_);
-    map_[key] = std::make_unique<DestSocketInfo>(DestSocketInfo{port, ip});
+    auto it = map_.find(key);
+    const bool waiting = it != map_.end() ? it->second->waiting : join_at_key_;
+    map_[key] = std::make_unique<DestSocketInfo>(DestSocketInfo{port, ip, waiting});
     changed_ = true;
+}
+
+void DestSocketTable::SetJoinAtKey(bool on) {
+    TLock::Scoped hold(lock_);
+    join_at_key_ = on;
+}
+
+bool DestSocketTable::AdmitWaiting() {
+    TLock::Scoped hold(lock_);
+    bool any = false;
+    for (auto& entry : map_) {
+        any = any || entry.second->waiting;
+        entry.second->waiting = false;
+    }
+    if (any) changed_ = true;
+    return any;
 }
 
 void DestSocketTable::Del(void* key) {
@@ -34,6 +52,7 @@ void DestSocketTable::Refresh() {
     if (!changed_) return;
     targets_.clear();
     for (const auto& entry : map_) {
+        if (entry.second->waiting) continue;
         sockaddr_in to{};
         to.sin_family = AF_INET;
         to.sin_port = htons(static_cast<uint16_t>(entry.second->port));

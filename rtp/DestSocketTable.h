@@ -13,6 +13,7 @@
 struct DestSocketInfo {
     int port;        // host order
     std::string ip;  // dotted IPv4, as the RTSP layer gave it
+    bool waiting;    // added while the table admits new ones at a key picture only
 };
 
 // The destinations of a send session, keyed by the requesting RTSP session, and the send
@@ -23,8 +24,12 @@ class DestSocketTable {
 public:
     explicit DestSocketTable(TLock& lock) : lock_(lock) {}
 
-    // A key already present gets the new value.
+    // A key already present gets the new value. A new key waits for AdmitWaiting while
+    // SetJoinAtKey is on: it is left out of targets() until then.
     void Add(void* key, int port, const std::string& ip);
+    void SetJoinAtKey(bool on);
+    // Lets the waiting destinations in (at a key picture); false when none was waiting.
+    bool AdmitWaiting();
     void Del(void* key);
     // Forgets every destination; the send thread's copy stays as it is.
     void Clear();
@@ -38,5 +43,6 @@ private:
     TLock& lock_;
     std::map<void*, std::unique_ptr<DestSocketInfo>> map_;
     bool changed_ = true;
+    bool join_at_key_ = false;
     std::vector<sockaddr_in> targets_;  // send thread only
 };

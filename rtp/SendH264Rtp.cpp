@@ -65,6 +65,17 @@ void H264RtpTransportSession::InspectParameterSets(const Buffer_Item& item) {
     }
 }
 
+bool H264RtpTransportSession::StartsKeyPicture(const Buffer_Item& item) {
+    if (item.length < 5) return false;
+    const unsigned type = item.data[4] & 0x1F;
+    const unsigned before = m_last_nal_type;
+    m_last_nal_type = type;
+    // Its SPS, or the first IDR slice of a stream that sends no parameter sets in front (after
+    // an SPS, PPS, SEI, delimiter or slice of the same picture it would be a later part).
+    return type == 7 ||
+           (type == 5 && before != 5 && before != 6 && before != 7 && before != 8 && before != 9);
+}
+
 void H264RtpTransportSession::ReportLatency(unsigned ring_wait_ms, Clock::time_point send_start,
                                             FrameLatency* latency) {
     auto send_us = std::chrono::duration_cast<std::chrono::microseconds>(Clock::now() - send_start);
@@ -92,6 +103,8 @@ void H264RtpTransportSession::procH264Thread() {
     uint16_t sequence = 0;
 
     const bool report_latency = config->report_latency();
+    config->read_join_mode();
+    m_dests.SetJoinAtKey(config->join_at_key());
     FrameLatency latency;
 
     bool recompute = true;
@@ -124,6 +137,8 @@ void H264RtpTransportSession::procH264Thread() {
             continue;
         }
         InspectParameterSets(*item);
+        // Clients that joined since the last key picture start with this one.
+        if (StartsKeyPicture(*item) && m_dests.AdmitWaiting()) m_dests.Refresh();
         if (m_dests.targets().empty()) {
             Idle(kIdleSleepUs);
             continue;

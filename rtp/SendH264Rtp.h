@@ -27,8 +27,11 @@ private:
     void ReportLatency(unsigned ring_wait_ms, Clock::time_point send_start, FrameLatency* latency);
     // Dormant parameter-set inspection: kept so a cleared flag inspects the next SPS/PPS.
     void InspectParameterSets(const Buffer_Item& item);
+    // Whether `item` begins a key picture, a point a new client can start decoding from.
+    bool StartsKeyPicture(const Buffer_Item& item);
 
     bool m_sps_seen = false;
+    unsigned m_last_nal_type = 0;  // send thread only
     bool m_pps_seen = false;
     uint32_t m_time_scale = 1;
     std::string m_sps_base64;

@@ -15,6 +15,7 @@
 #include "rtsp/RequestFields.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
+#include "stream/KeyFrames.h"
 
 std::atomic<unsigned char> g_url_check_switch{0};
 
@@ -80,6 +81,7 @@ int RtspSession::RtspSessionThread(int& type) {
         case kRtspPlay:
             if (TransportPlay()) {
                 m_response->ResponsePlay(m_rtp_info.c_str());
+                stream::AskForKeyFrame();  // the client decodes from its first picture
                 usleep(10000);
             }
             return 0;

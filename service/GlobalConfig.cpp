@@ -75,6 +75,11 @@ void Global_Config::read_wake_mode() {
                           std::memory_order_relaxed);
 }
 
+void Global_Config::read_join_mode() {
+    m_join_at_key.store(ReadSwitch("kv.orvex.join", "now", "key", "clients join at once"),
+                        std::memory_order_relaxed);
+}
+
 void Global_Config::read_latency_report() {
     m_report_latency.store(ReadSwitch("kv.orvex.latency", "0", "1", "no latency report"),
                            std::memory_order_relaxed);

@@ -49,6 +49,11 @@ public:
     // server opens; threads read it when they start.
     void read_wake_mode();
     bool wake_on_write() const { return m_wake_on_write.load(std::memory_order_relaxed); }
+    // Takes when a new RTSP client gets its first picture from kv.orvex.join: "now" (the
+    // default: whatever the encoder sends next, as the television does) or "key" (from the next
+    // key picture, so that its decoder never starts on a picture it cannot decode).
+    void read_join_mode();
+    bool join_at_key() const { return m_join_at_key.load(std::memory_order_relaxed); }
     // Takes the property kv.orvex.latency: "1" makes the video sender log, every 300 frames,
     // how long frames waited in the ring and took to send; unset or "0" does not. Anything else
     // is logged and leaves it off. Called once, when the server opens.
@@ -104,6 +109,7 @@ private:
     std::atomic<bool> m_flag_run_pause{false};
     std::atomic<bool> m_flag_sub{false};
     std::atomic<bool> m_wake_on_write{false};
+    std::atomic<bool> m_join_at_key{false};
     std::atomic<bool> m_report_latency{false};
     std::atomic<bool> m_audio_clock_samples{false};
     TLock m_timestamp_lock;

@@ -1,4 +1,5 @@
 #include "web/WebViewer.h"
+#include "stream/KeyFrames.h"
 
 #include <arpa/inet.h>
 #include <errno.h>
@@ -265,6 +266,7 @@ struct WebViewerCalls {
             return Reply(connection, 400, refused);
         }
         if (self->m_transport != nullptr) self->m_transport->HoldCapture(CaptureQueryFor(query));
+        stream::AskForKeyFrame();  // a fresh key frame to start from, not the encoder's next
         auto* viewer = new StreamViewer{self, peer, {}, GetTimeStampMillsec()};
         std::string type;
         if (!self->m_ring.WaitForStart(&viewer->reader, &type, self->m_options.start_wait_ms)) {

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <atomic>
+
 #include <map>
 #include <memory>
 #include <mutex>
@@ -48,6 +50,12 @@ public:
     FakeMediaRecorderPort(CallJournal& journal, FakeResults& results)
         : journal_(journal), results_(results) {}
     std::shared_ptr<MediaRecorder> create(const std::string& package) override;
+    // Counted, not journaled: the call sequences the tests compare stay those of the television.
+    bool RequestKeyFrame() override {
+        key_frame_requests.fetch_add(1);
+        return true;
+    }
+    std::atomic<int> key_frame_requests{0};
 
 private:
     CallJournal& journal_;

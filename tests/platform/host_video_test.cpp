@@ -254,6 +254,27 @@ TEST_F(HostVideoRecorderTest, KeyFramesAreNeverMoreThanTwoSecondsApart) {
     }
 }
 
+TEST_F(HostVideoRecorderTest, AKeyFrameAskedForIsTheNextPicture) {
+    HostCamera camera;
+    HostMediaRecorder r;
+    ASSERT_EQ(Configure(r, camera, 160, 96, 30), 0);
+    ASSERT_EQ(r.prepare(), 0);
+    HostMediaRecorderPort port;
+    std::vector<uint32_t> keys;
+    for (uint32_t n = 0; n < 30; ++n) {
+        if (n == 10 || n == 20) {
+            EXPECT_TRUE(port.RequestKeyFrame());
+        }
+        if (n == 10) {
+            EXPECT_TRUE(port.RequestKeyFrame());
+        }
+        HostMediaRecorder::Encoded e = r.encodeFrame(n, 1000 + n * 33);
+        if (e.size > 0 && e.key) keys.push_back(n);
+    }
+    // Two requests before one picture make one key frame.
+    EXPECT_EQ(keys, (std::vector<uint32_t>{0, 10, 20}));
+}
+
 TEST_F(HostVideoRecorderTest, FfprobeReadsTheStreamAsBaselineH264) {
     if (system("command -v ffprobe >/dev/null 2>&1") != 0) GTEST_SKIP() << "no ffprobe";
     std::vector<Bytes> frames = Record(400);

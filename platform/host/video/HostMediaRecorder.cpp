@@ -21,7 +21,11 @@
 
 namespace platform {
 namespace host {
+
 namespace {
+
+// Set by a viewer that joined; taken by whichever recorder encodes the next picture.
+std::atomic<bool> g_key_frame_wanted{false};
 
 // The same clock HostClockMs reads, in nanoseconds, so frame times land on its milliseconds.
 uint64_t MonotonicNs() {
@@ -297,7 +301,8 @@ HostMediaRecorder::Encoded HostMediaRecorder::encodeNext(uint32_t frame, uint64_
     // Force a key frame when waiting for the next frame would stretch the gap past the
     // interval (1 ms of slack absorbs the truncation of frame times to milliseconds).
     uint64_t since = ms - last_key_ms_;
-    bool force_key = !key_seen_ || since * fps_ + 1000 > (kKeyIntervalMs + 1) * fps_;
+    bool force_key = !key_seen_ || since * fps_ + 1000 > (kKeyIntervalMs + 1) * fps_ ||
+                     g_key_frame_wanted.exchange(false, std::memory_order_relaxed);
     Encoded out = encoder_.Encode(picture_.data(), ms, force_key);
     if (out.skipped) skipped_.fetch_add(1, std::memory_order_relaxed);
     if (out.count == 0) return out;
@@ -365,6 +370,11 @@ void HostMediaRecorder::run() {
         ++n;
         lock.lock();
     }
+}
+
+bool HostMediaRecorderPort::RequestKeyFrame() {
+    g_key_frame_wanted.store(true, std::memory_order_relaxed);
+    return true;
 }
 
 std::shared_ptr<MediaRecorder> HostMediaRecorderPort::create(const std::string& package) {

@@ -134,6 +134,8 @@ private:
 class HostMediaRecorderPort final : public MediaRecorderPort {
 public:
     std::shared_ptr<MediaRecorder> create(const std::string& package) override;
+    // The recording thread makes its next picture a key frame.
+    bool RequestKeyFrame() override;
 };
 
 }  // namespace host
