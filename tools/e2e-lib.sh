@@ -22,3 +22,14 @@ start() {
   sleep 0.5
   kill -0 "$pid" 2>/dev/null || fail "orvex did not start (port 554 in use, or no privileges?)"
 }
+
+# An RTSP client (ffmpeg, picture only) that joins a running capture: the pictures it decoded in
+# its first 6 s and the decoder's complaints (missing references, parameter sets, errors).
+join_check() {
+  local log frames complaints
+  log=$(timeout -k 5 25 ffmpeg -hide_banner -nostats -rtsp_transport udp -i "$1" -t 6 -map 0:v \
+    -f null - 2>&1) || true
+  frames=$(grep -o 'frame= *[0-9]*' <<<"$log" | tail -1 | grep -o '[0-9]*$')
+  complaints=$(grep -ciE 'error|missing|non-existing|no frame|concealing' <<<"$log" || true)
+  echo "frames=${frames:-0} complaints=$complaints"
+}

@@ -87,6 +87,11 @@ fps_ok "$fps" || fail "hls: $fps fps: $line"
 [[ $(field audio_frames "$line") -gt 100 ]] || fail "hls: no sound: $line"
 ok "ffmpeg decodes both tracks of nginx's HLS playlist: $line"
 
+line=$(join_check "rtsp://127.0.0.1/skyvo.0?width=1280&height=720&$query")
+[[ $(sed 's/.*frames=\([0-9]*\).*/\1/' <<<"$line") -ge 162 && $line == *complaints=0 ]] ||
+  fail "an RTSP client joining the publisher's capture: $line"
+ok "an RTSP client joining while the publisher holds capture: $line in 6 s"
+
 line=$(python3 "$check" latency "$rtmp" 5) || fail "latency: $line"
 ok "capture to decoded frame at an RTMP reader through nginx: $line"
 

@@ -123,6 +123,18 @@ drain 15 || fail "$(connections) connections still open after the idle crowd"
 out=$(check 40 crowd "$port" 50 1 trickling "$query") || fail "trickling crowd: $out"
 ok "$out"
 
+# 4c. An RTSP client joining while a web viewer holds capture starts at a key frame the
+# encoder makes for it: every picture of its first 6 s decodes.
+curl -s -m 12 -o /dev/null "$base/stream.mp4?width=1280&height=720" &
+holder=$!
+sleep 3
+line=$(join_check "rtsp://127.0.0.1/skyvo.0?width=1280&height=720&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30")
+[[ $(sed 's/.*frames=\([0-9]*\).*/\1/' <<<"$line") -ge 162 && $line == *complaints=0 ]] ||
+  fail "an RTSP client joining a web viewer's capture: $line"
+ok "an RTSP client joining while a web viewer holds capture: $line in 6 s"
+kill "$holder" 2>/dev/null || true
+wait "$holder" 2>/dev/null || true
+
 # 5. Connect/disconnect cycles: every viewer that came also leaves (its capture hold with it).
 # The service sees that a viewer went only when it next writes to it, so a socket reset by the
 # client (gone from ss at once) may still be counted until the next picture, which comes up
