@@ -1,11 +1,15 @@
 #include "media/MediaStreamH264.h"
 
 #include <cstdio>
+#include <cstring>
 
 #include "capture/LivecameraResolution.h"
 #include "media/AnnexB.h"
+#include "platform/Ports.h"
+#include "platform/PropertyPort.h"
 #include "rtp/RtpPackets.h"
 #include "service/GlobalConfig.h"
+#include "stream/StreamFacts.h"
 
 MediaStreamH264::MediaStreamH264(const char* name) : MediaStream(name, kMediaTypeH264) {}
 
@@ -32,6 +36,29 @@ const char* MediaStreamH264::FmtpForWidth(unsigned width) {
            "aMpDiA==; packetization-mode=1;";
 }
 
+bool MediaStreamH264::DescribesLiveStream() {
+    char value[platform::kPropertyValueMax] = {};
+    platform::Properties().Get("kv.orvex.sdp", value, "");
+    return strcmp(value, "live") == 0;
+}
+
+std::string MediaStreamH264::LiveFmtp(unsigned width, unsigned height) {
+    // A stream that is flowing is what the client will get, whatever size it asked for; a
+    // stopped one still describes the next capture when the size is the same (one encoder,
+    // one size, one SPS). Capture that is just starting gets a moment to send its first.
+    constexpr uint64_t kFlowingMs = 500;
+    constexpr int kStartWaitMs = 300;
+    const uint64_t now = stream::SteadyMs();
+    stream::StreamFacts::Video video;
+    const bool known = stream::Facts().Get(&video);
+    const bool flowing = known && now - video.last_frame_ms < kFlowingMs;
+    if (flowing || (known && video.width == width && video.height == height))
+        return stream::LiveH264Fmtp(video);
+    if (stream::Facts().WaitFresh(&video, now, kStartWaitMs)) return stream::LiveH264Fmtp(video);
+    // Nothing known: the parameter sets come in band, ahead of the first key picture.
+    return "packetization-mode=1;";
+}
+
 std::string MediaStreamH264::GenerateMediaSdp(unsigned payload_type, int with_control) {
     m_rtp_payload_type = static_cast<int>(payload_type);
     Global_Config* config = Global_Config::instance();
@@ -44,8 +71,12 @@ std::string MediaStreamH264::GenerateMediaSdp(unsigned payload_type, int with_co
     sdp += line;
     snprintf(line, sizeof line, "a=rtpmap:%d H264/%u\r\n", pt, config->m_video_rtp_frequency);
     sdp += line;
-    snprintf(line, sizeof line, "a=fmtp:%d %s\r\n", pt, FmtpForWidth(width));
-    sdp += line;
+    if (DescribesLiveStream()) {
+        sdp += "a=fmtp:" + std::to_string(pt) + " " + LiveFmtp(width, height) + "\r\n";
+    } else {
+        snprintf(line, sizeof line, "a=fmtp:%d %s\r\n", pt, FmtpForWidth(width));
+        sdp += line;
+    }
     if (with_control != 0) {
         snprintf(line, sizeof line, "a=control:trackID=%d\r\n",
                  static_cast<int>(payload_type) - 95);

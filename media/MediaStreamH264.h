@@ -22,6 +22,10 @@ public:
 
     // The fmtp parameters announced for a capture width.
     static const char* FmtpForWidth(unsigned width);
+    // kv.orvex.sdp=live (unset on the television, which keeps the fixed texts): the SDP
+    // describes the stream as it is, its own parameter sets and profile.
+    static bool DescribesLiveStream();
+    static std::string LiveFmtp(unsigned width, unsigned height);
 
 private:
     class NalPayloads;

@@ -8,6 +8,7 @@
 #include "server/RtspService_t.h"
 #include "server/skyvo_service.h"
 #include "service/OrvexLog.h"
+#include "stream/StreamFacts.h"
 
 namespace {
 // Producers may still run while the server closes: they enter (count up) before they load the
@@ -92,6 +93,7 @@ void skyvo_set_h264_rtp_config(unsigned rate) {
 
 int skyvo_add_h264_data(unsigned char* data, unsigned len) {
     if (data == nullptr || len == 0) return 0;
+    stream::Facts().Note(data, len, stream::SteadyMs());
     TapVideoFrame(data, len);
     ProducerScope inside;
     RtspTransport* listener = inside.listener();

@@ -150,5 +150,33 @@ errors=$(grep -ciE 'error|concealing|non-existing|missing picture' <<<"$log" || 
 ok "x264 stream with delimiters and SEI via orvex-feed: $frames frames in 6 s decoded, no errors"
 stop 1
 
+# Another encoder's High-profile stream, joined while it flows: DESCRIBE announces the stream's
+# own parameter sets (kv.orvex.sdp=live) and the client starts at its next key picture
+# (kv.orvex.join=key), so every picture it gets decodes, over RTSP and from /stream.mp4.
+for slices in 1 4; do
+  ffmpeg -y -v error -f lavfi -i testsrc2=size=1280x720:rate=30 -t 4 -c:v libx264 -preset veryfast \
+    -profile:v high -x264-params "aud=1:keyint=30:slices=$slices" -f h264 "$work/high.h264"
+  start env ORVEX_PROP_FILE="$work/feed.prop" "$build/orvex"
+  "$build/orvex-feed" --loop "$work/high.h264" 2>"$work/feed.log" &
+  feeder=$!
+  sleep 2.5
+  line=$(join_check "$(url 1280 720)")
+  [[ $(sed 's/.*frames=\([0-9]*\).*/\1/' <<<"$line") -ge 140 && $line == *complaints=0 ]] ||
+    fail "x264 High, $slices slice(s), joined over RTSP: $line"
+  ok "x264 High profile 1280x720, $slices slice(s) a picture, joined mid-stream over RTSP: $line"
+  if [[ $slices == 1 ]]; then
+    log=$(timeout -k 5 25 ffmpeg -hide_banner -nostats -i "http://127.0.0.1:8080/stream.mp4" \
+      -map 0:v -t 5 -f null - 2>&1) || true
+    frames=$(grep -o 'frame= *[0-9]*' <<<"$log" | tail -1 | grep -o '[0-9]*$')
+    errors=$(grep -ciE 'error|concealing|non-existing|missing|no frame' <<<"$log" || true)
+    [[ ${frames:-0} -ge 140 && $errors -eq 0 ]] ||
+      fail "x264 High joined from /stream.mp4: ${frames:-0} frames, $errors complaints"
+    ok "x264 High profile joined mid-stream from /stream.mp4: $frames frames of 5 s, no complaint"
+  fi
+  kill "$feeder" 2>/dev/null || true
+  wait "$feeder" 2>/dev/null || true
+  stop 1
+done
+
 echo "e2e: $pass passed, 0 failed"
 rm -rf "$work"
