@@ -1,5 +1,8 @@
 #include "media/AccessUnitGatherer.h"
 
+#include <algorithm>
+#include <iterator>
+
 #include "media/AnnexB.h"
 
 namespace {
@@ -17,37 +20,50 @@ AccessUnitGatherer::AccessUnitGatherer(Sink* sink, Prefix prefix, bool keep_head
 void AccessUnitGatherer::Add(const uint8_t* annexb, size_t len, uint32_t time_ms) {
     ForEachNalUnit(annexb, len, [&](const uint8_t* nal, size_t n) { OnNal(nal, n, time_ms); });
     // Judged per call: a call may carry several slices of one picture.
-    if (m_slices_per_picture > 0 && m_slices >= m_slices_per_picture) {
-        Finish();
-        m_sent_early = true;
-    }
+    if (m_slices == 0 || m_kind == SliceKind::kUnknown) return;
+    const int known = SlicesPerPicture(m_kind);
+    if (known == 0 || m_slices < known) return;
+    m_early_kind = m_kind;
+    m_early_slices = m_slices;
+    Finish();
+    m_sent_early = true;
+    m_early_short = false;
 }
 
 void AccessUnitGatherer::OnNal(const uint8_t* nal, size_t len, uint32_t time_ms) {
     const uint8_t type = nal[0] & 0x1F;
     if (type == kFiller) return;
-    if (m_slices > 0 && BeginsNextAccessUnit(nal, len)) Finish();
-    const bool slice = type == kSlice || type == kIdr;
-    if (slice && m_slices == 0 && !BeginsNextAccessUnit(nal, len)) {
-        // The rest of a picture that is gone: delivered before its end (so wait for picture
-        // ends from now on), or begun before the first call.
-        if (m_sent_early) {
-            m_slices_per_picture = 0;
-            m_sink->OnPictureLost(Loss::kSentEarly);
-        }
+    const bool begins = BeginsNextAccessUnit(nal, len);
+    if (begins) {
+        if (m_slices > 0) Finish();
         m_sent_early = false;
+    }
+    const bool slice = type == kSlice || type == kIdr;
+    if (slice && m_slices == 0 && !begins) {
+        // The rest of a picture that is gone: delivered before its end, or begun before the
+        // first call. The first is told once, and its kind's count grows to what it had.
+        if (m_sent_early) {
+            if (!m_early_short) m_sink->OnPictureLost(Loss::kSentEarly);
+            m_early_short = true;
+            int& count = SlicesPerPicture(m_early_kind);
+            count = std::max(count, ++m_early_slices);
+        }
         return;
     }
-    if (slice) m_sent_early = false;
     if (type == kSps || type == kPps) {
         std::vector<uint8_t>& set = type == kSps ? m_sps : m_pps;
-        if (len <= kMaxParameterSet) set.assign(nal, nal + len);
+        if (len <= kMaxParameterSet && !std::equal(nal, nal + len, set.begin(), set.end())) {
+            // Another stream (a new size, say), which the encoder may cut into more slices.
+            if (type == kSps && !set.empty())
+                std::fill(std::begin(m_slices_per_kind), std::end(m_slices_per_kind), 0);
+            set.assign(nal, nal + len);
+        }
     }
     if (m_keep_headers || (type != kSps && type != kPps && type != kAud)) {
         Append(nal, len, time_ms);
     }
     if (!slice) return;
-    ++m_slices;
+    if (m_slices++ == 0) m_kind = SliceKindOf(nal, len);
     if (type == kIdr) m_key = true;
 }
 
@@ -67,7 +83,10 @@ void AccessUnitGatherer::Append(const uint8_t* nal, size_t len, uint32_t time_ms
 }
 
 void AccessUnitGatherer::Finish() {
-    m_slices_per_picture = m_slices;
+    if (m_kind != SliceKind::kUnknown) {
+        int& count = SlicesPerPicture(m_kind);
+        count = std::max(count, m_slices);
+    }
     if (m_too_large) {
         m_sink->OnPictureLost(Loss::kTooLarge);
     } else {
@@ -75,6 +94,7 @@ void AccessUnitGatherer::Finish() {
     }
     m_picture.clear();
     m_slices = 0;
+    m_kind = SliceKind::kUnknown;
     m_key = false;
     m_too_large = false;
 }

@@ -4,13 +4,18 @@
 #include <cstdint>
 #include <vector>
 
+#include "media/AnnexB.h"
+
 // Gathers the NAL units a recorder hands over (one or a few per call) into pictures for the
 // consumers beside the RTP rings, which send whole access units. A picture ends where the next
-// one begins (BeginsNextAccessUnit); once a picture is known to have N slices, the next one
-// that reaches N goes at the end of that call instead of waiting for its successor's first
-// NAL unit, a frame interval later. When that guess proves wrong (a further slice comes), the
-// slice is dropped, the consumer is told, and pictures wait for their end until one teaches
-// the count again. Filler data (bit-rate padding) is left out.
+// one begins (BeginsNextAccessUnit). Waiting for that costs a frame interval, so the gatherer
+// learns how many slices a picture has, per kind (IDR, I, P, B, by its first slice): once a
+// picture of that kind has ended, the next one goes at the end of the call that brings it to
+// that count. Kinds differ (an encoder may cut its key pictures into more slices), so a kind
+// never seen waits for its end. The count kept is the largest seen; when a further slice of a
+// picture already sent comes anyway, that slice is dropped, the consumer is told, and the
+// count grows to what that picture really had. New parameter sets (another stream) forget the
+// counts. Filler data (bit-rate padding) is left out.
 // Thread contract: NOT thread safe; the frame tap's calls, which are serialised.
 class AccessUnitGatherer {
 public:
@@ -49,6 +54,7 @@ private:
     void OnNal(const uint8_t* nal, size_t len, uint32_t time_ms);
     void Append(const uint8_t* nal, size_t len, uint32_t time_ms);
     void Finish();
+    int& SlicesPerPicture(SliceKind kind) { return m_slices_per_kind[static_cast<int>(kind)]; }
 
     Sink* m_sink;
     Prefix m_prefix;
@@ -58,8 +64,14 @@ private:
     std::vector<uint8_t> m_picture;  // capacity kept between pictures
     uint32_t m_picture_ms = 0;
     int m_slices = 0;
+    SliceKind m_kind = SliceKind::kUnknown;  // of the picture's first slice
     bool m_key = false;
     bool m_too_large = false;
-    int m_slices_per_picture = 0;  // of the last picture that ended; 0: unknown
-    bool m_sent_early = false;     // the picture just delivered went before its end was seen
+    // Slices a picture of each SliceKind has, the largest seen; 0: none has ended yet.
+    int m_slices_per_kind[4] = {};
+    // The picture last delivered before its end was seen, while that end is still to come.
+    bool m_sent_early = false;
+    SliceKind m_early_kind = SliceKind::kUnknown;
+    int m_early_slices = 0;      // including the ones that came too late
+    bool m_early_short = false;  // a slice of it came too late, and was told
 };

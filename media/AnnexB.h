@@ -58,3 +58,10 @@ inline bool BeginsNextAccessUnit(const uint8_t* nal, size_t len) {
     if ((type >= 6 && type <= 9) || (type >= 14 && type <= 18)) return true;
     return (type == 1 || type == 5) && len > 1 && (nal[1] & 0x80) != 0;
 }
+
+// What kind of picture a slice NAL unit (header byte first) belongs to, for the gatherer's
+// count of slices per kind: IDR by its NAL type, the others by slice_type (7.4.3) with SP
+// counted as P and SI as I. kUnknown for other NAL types, a header cut short, or a
+// slice_type over 9.
+enum class SliceKind { kUnknown = -1, kIdr, kI, kP, kB };
+SliceKind SliceKindOf(const uint8_t* nal, size_t len);

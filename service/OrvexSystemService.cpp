@@ -3,10 +3,12 @@
 #include <pthread.h>
 #include <unistd.h>
 
+#include <cerrno>
 #include <chrono>
 
 #include "media/thread_mutex.h"
 #include "platform/Ports.h"
+#include "server/QuitFlag.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
 #include "service/OrvexService.h"
@@ -22,6 +24,7 @@ thread_mutex g_service_lock;  // with g_service_wake: ends a waiting service loo
 thread_condition g_service_wake;
 pthread_t g_service_thread{};
 bool g_service_started = false;
+std::atomic<bool> g_refused{false};
 
 }  // namespace
 
@@ -30,7 +33,13 @@ int start_orvex_service_main(std::atomic<bool>* run) {
     binder.initWithDriver("/dev/vndbinder");
     OrvexPrintLog(kTag, "OrvexServiceThread( ServiceManager: %p)", binder.defaultServiceManager());
     binder.startThreadPool();
-    android::OrvexService::instantiate();
+    if (android::OrvexService::instantiate() == -EADDRINUSE) {
+        // Another orvex would get this one's pictures, and its clients sound only; the port
+        // said how to run two. The process ends as SIGTERM would end it.
+        g_refused = true;
+        ClearLiveQuitFlag();
+        return -EADDRINUSE;
+    }
     OrvexPuts("\n start orvex service ");
     OrvexLog(kTag, "\n start orvex service \n");
     Global_Config* config = Global_Config::instance();
@@ -79,3 +88,5 @@ void close_orvex_system_service() {
     if (g_service_started) pthread_join(g_service_thread, nullptr);
     g_service_started = false;
 }
+
+bool orvex_system_service_refused() { return g_refused.load(); }

@@ -9,3 +9,5 @@ int start_orvex_system_service();
 void close_orvex_system_service();
 void* start_orvex_service_thread(void*);
 int start_orvex_service_main(std::atomic<bool>* run);
+// Whether "orvex.rtp" was served by another process, which ends this one.
+bool orvex_system_service_refused();

@@ -163,5 +163,5 @@ int main(int argc, char** argv) {
 
     OrvexPuts("\n orvex all services exit ! ");
     OrvexLog(kTag, "\n orvex all services exit ! \n");
-    return 0;
+    return orvex_system_service_refused() ? 1 : 0;
 }

@@ -1,6 +1,7 @@
 #!/usr/bin/env bash
-# Syntax-only check, for 32-bit ARM, of every source the television build compiles (Android.bp's
-# srcs: the shared layers and the Android adapters).
+# Syntax-only check, for 32-bit ARM, of every source the television build can compile (all of
+# Android.bp's srcs: the shared layers, the Android adapters, and the optional web viewer and
+# publisher with the stand-ins a build without them takes).
 # Uses Debian's AOSP headers for binder, utils, log and cutils; tests/android_shims supplies
 # declaration-only stand-ins for what Debian lacks (camera, media, audio); the vendor SDK's
 # declarations come from platform/android/vendor. Nothing is linked or run.

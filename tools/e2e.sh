@@ -5,7 +5,8 @@
 # and GStreamer play picture and sound, a raw RTP client checks the
 # packets, ffmpeg measures frame rate and A/V offset per capture size, SIGTERM stops it. Then
 # with kv.orvex.audiopt and kv.orvex.wake removed, as on the television: the audio packets
-# carry 98 again and idle threads poll.
+# carry 98 again and idle threads poll. Last, a stock encoder's stream through orvex-feed
+# while a second service runs in a network namespace of its own.
 #   tools/e2e.sh [BUILD_DIR]      (needs root for port 554)
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
@@ -131,13 +132,18 @@ measure 1280 720
 stop
 
 # A stock encoder's stream (access unit delimiters and SEI, as x264, NVENC and cameras write)
-# fed through orvex-feed: every picture must decode.
+# fed through orvex-feed: every picture must decode. Beside it, a second service with the test
+# pattern runs in a network namespace of its own; both use the binder's default sockets, which
+# the namespaces keep apart: neither may see the other's pictures.
 ffmpeg -v error -f lavfi -i testsrc2=size=640x480:rate=30 -t 4 -c:v libx264 -preset veryfast \
   -x264-params aud=1:keyint=15 -f h264 "$work/x264.h264"
 sed -e 's/^orvex.host.video=.*/orvex.host.video=none/' "$top/platform/host/orvex.prop" >"$work/feed.prop"
-start env ORVEX_PROP_FILE="$work/feed.prop" "$build/orvex"
+start env -u ORVEX_BINDER_DIR ORVEX_PROP_FILE="$work/feed.prop" "$build/orvex"
+unshare -n sh -c 'ip link set lo up && exec "$@"' sh env -u ORVEX_BINDER_DIR \
+  ORVEX_PROP_FILE="$top/platform/host/orvex.prop" "$build/orvex" >"$work/second.out" 2>&1 &
+second=$!
 # Fed from after the PLAY, so the client sees the stream from its first parameter sets.
-(sleep 2; exec "$build/orvex-feed" --loop "$work/x264.h264" 2>"$work/feed.log") &
+(sleep 2; exec env -u ORVEX_BINDER_DIR "$build/orvex-feed" --loop "$work/x264.h264" 2>"$work/feed.log") &
 feeder=$!
 log=$(timeout -k 5 25 ffmpeg -hide_banner -nostats -rtsp_transport udp -i "$(url 640 480)" \
   -map 0:v -t 6 -f null - 2>&1) || true
@@ -148,6 +154,15 @@ errors=$(grep -ciE 'error|concealing|non-existing|missing picture' <<<"$log" || 
 [[ ${frames:-0} -ge 170 && $errors -eq 0 ]] ||
   fail "x264 stream with delimiters and SEI via orvex-feed: ${frames:-0} frames, $errors errors: $(grep -iE 'error|concealing' <<<"$log" | head -3)"
 ok "x264 stream with delimiters and SEI via orvex-feed: $frames frames in 6 s decoded, no errors"
+# The first still serves its binder name; the second's pictures must reach its own clients.
+second_log=$(nsenter --net="/proc/$second/ns/net" timeout -k 5 20 ffmpeg -hide_banner -nostats \
+  -rtsp_transport udp -i "$(url 640 480)" -map 0:v -t 3 -f null - 2>&1) || true
+kill -TERM "$second" 2>/dev/null || true
+wait "$second" 2>/dev/null || true
+second_frames=$(grep -o 'frame= *[0-9]*' <<<"$second_log" | tail -1 | grep -o '[0-9]*$')
+[[ ${second_frames:-0} -ge 80 ]] && grep -q 'Video: h264.*640x480' <<<"$second_log" ||
+  fail "a second service in a network namespace of its own: ${second_frames:-0} frames: $(tail -3 <<<"$second_log") $(tail -3 "$work/second.out")"
+ok "a second service in a network namespace of its own streams its own pattern: $second_frames frames in 3 s"
 stop 1
 
 # Another encoder's High-profile stream, joined while it flows: DESCRIBE announces the stream's

@@ -14,6 +14,7 @@
 #include <vector>
 
 #include "platform/BinderPort.h"
+#include "platform/host/BinderWire.h"
 #include "platform/host/HostBinder.h"
 #include "tools/AccessUnitSplitter.h"
 
@@ -106,8 +107,14 @@ private:
         parcel_.writeInt32(0);
         int status = binder_.transact(kService, kEncodedFrameCode, parcel_);
         if (status == platform::host::HostBinder::kDeadObject) {
-            fprintf(stderr, "orvex-feed: service %s is not there (sockets in %s)\n", kService,
-                    platform::host::HostBinder::BinderDir().c_str());
+            fprintf(stderr,
+                    "orvex-feed: service %s is not there (%s; a service in another network "
+                    "namespace is out of reach)\n",
+                    kService,
+                    platform::host::binder_wire::PrintablePath(
+                        platform::host::HostBinder::ServicePath(
+                            platform::host::HostBinder::BinderDir(), kService))
+                        .c_str());
             return false;
         }
         if (status != platform::kBinderOk && refused_++ == 0) {

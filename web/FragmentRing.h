@@ -3,6 +3,7 @@
 #include <chrono>
 #include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -49,7 +50,7 @@ public:
     // the reader's stream has ended (`why` says how).
     long Read(Reader* reader, uint8_t* out, size_t cap, int wait_ms, const char** why);
 
-    size_t capacity() const { return m_data.size(); }
+    size_t capacity() const { return m_size; }
 
 private:
     static constexpr size_t kRecordHeader = 8;  // length (4 bytes) and flags (4 bytes)
@@ -61,12 +62,15 @@ private:
     void Put(uint64_t at, const uint8_t* src, size_t len) ORVEX_REQUIRES(m_lock);
     void Get(uint64_t at, uint8_t* dst, size_t len) const ORVEX_REQUIRES(m_lock);
     bool Overwritten(uint64_t pos) const ORVEX_REQUIRES(m_lock) {
-        return m_write_pos - pos > m_data.size();
+        return m_write_pos - pos > m_size;
     }
 
     thread_mutex m_lock;
     thread_condition m_written;
-    std::vector<uint8_t> m_data;  // sized once
+    // Not zeroed: pages become resident as fragments reach them, so an idle viewer costs no
+    // memory. Only bytes already written are ever read.
+    const size_t m_size;
+    const std::unique_ptr<uint8_t[]> m_data;
     uint64_t m_write_pos ORVEX_GUARDED_BY(m_lock) = 0;
     uint64_t m_last_key ORVEX_GUARDED_BY(m_lock) = kNoKey;
     std::chrono::steady_clock::time_point m_last_write ORVEX_GUARDED_BY(m_lock);

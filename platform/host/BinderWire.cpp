@@ -6,6 +6,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <cstddef>
 #include <cstring>
 
 namespace platform {
@@ -20,23 +21,32 @@ uint32_t GetLe32(const uint8_t* at) {
     return uint32_t{at[0]} | uint32_t{at[1]} << 8 | uint32_t{at[2]} << 16 | uint32_t{at[3]} << 24;
 }
 
-bool MakeAddress(const std::string& path, sockaddr_un* addr) {
-    if (path.size() >= sizeof addr->sun_path) return false;
+socklen_t MakeAddress(const std::string& path, sockaddr_un* addr) {
+    if (path.empty() || path.size() >= sizeof addr->sun_path) return 0;
     memset(addr, 0, sizeof *addr);
     addr->sun_family = AF_UNIX;
-    memcpy(addr->sun_path, path.c_str(), path.size() + 1);
-    return true;
+    memcpy(addr->sun_path, path.data(), path.size());
+    // An abstract name is every byte the length covers, so it must not take the padding.
+    if (path[0] == '\0')
+        return static_cast<socklen_t>(offsetof(sockaddr_un, sun_path) + path.size());
+    return sizeof *addr;
+}
+
+std::string PrintablePath(const std::string& path) {
+    if (path.empty() || path[0] != '\0') return path;
+    return "@" + path.substr(1);
 }
 
 int ConnectTo(const std::string& path, bool nonblocking) {
     sockaddr_un addr;
-    if (!MakeAddress(path, &addr)) {
+    const socklen_t addr_len = MakeAddress(path, &addr);
+    if (addr_len == 0) {
         errno = ENAMETOOLONG;
         return -1;
     }
     int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | (nonblocking ? SOCK_NONBLOCK : 0), 0);
     if (fd < 0) return -1;
-    if (connect(fd, reinterpret_cast<const sockaddr*>(&addr), sizeof addr) != 0) {
+    if (connect(fd, reinterpret_cast<const sockaddr*>(&addr), addr_len) != 0) {
         int saved = errno;
         close(fd);
         errno = saved;

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <sys/socket.h>
 #include <sys/types.h>
 #include <sys/un.h>
 
@@ -28,8 +29,12 @@ uint32_t GetLe32(const uint8_t* at);
 void WriteHeader(const Header& h, uint8_t out[kHeaderSize]);
 Header ReadHeader(const uint8_t in[kHeaderSize]);
 
-// False when the path does not fit a socket address.
-bool MakeAddress(const std::string& path, sockaddr_un* addr);
+// A socket's path: a file, or, when it begins with a NUL byte, a name in Linux's abstract
+// namespace (no file; scoped to the network namespace). The address's length, or 0 when the
+// path does not fit.
+socklen_t MakeAddress(const std::string& path, sockaddr_un* addr);
+// The path as logs show it: an abstract name with '@' for its NUL byte, as ss(8) does.
+std::string PrintablePath(const std::string& path);
 // A connected socket, or -1 with errno set.
 int ConnectTo(const std::string& path, bool nonblocking);
 // The bytes read: `len`, fewer when the peer closed first, -1 on an error or a timeout.

@@ -59,10 +59,14 @@ HostBinder::~HostBinder() { Stop(); }
 std::string HostBinder::BinderDir() {
     const char* env = getenv("ORVEX_BINDER_DIR");
     if (env != nullptr && env[0] != '\0') return env;
-    // Per user, so that two users' services never meet in one folder.
-    const char* runtime = getenv("XDG_RUNTIME_DIR");
-    if (runtime != nullptr && runtime[0] == '/') return std::string(runtime) + "/orvex-binder";
-    return "/tmp/orvex-binder-" + std::to_string(getuid());
+    // Abstract names live in the network namespace, so a service started in a namespace of
+    // its own (as the end-to-end scripts and a second service on one machine are) never meets
+    // another's; the user id keeps two users' services apart within one namespace.
+    return std::string(1, '\0') + "orvex-binder-" + std::to_string(getuid());
+}
+
+std::string HostBinder::ServicePath(const std::string& dir, const char* name) {
+    return dir + "/" + name;
 }
 
 bool HostBinder::ValidName(const char* name) {
@@ -79,7 +83,8 @@ bool HostBinder::ValidName(const char* name) {
 
 int HostBinder::initWithDriver(const char* driver) {
     driver_ = driver != nullptr ? driver : "";
-    HostLogf(kLogDebug, "binder: driver %s (host: sockets in %s)", driver_.c_str(), dir_.c_str());
+    HostLogf(kLogDebug, "binder: driver %s (host: sockets in %s)", driver_.c_str(),
+             PrintablePath(dir_).c_str());
     return 0;
 }
 
@@ -90,43 +95,57 @@ const void* HostBinder::defaultServiceManager() {
 
 int HostBinder::addService(const char* name, std::shared_ptr<BinderService> service) {
     if (!ValidName(name) || service == nullptr) return -EINVAL;
-    std::string path = dir_ + "/" + name;
+    const std::string path = ServicePath(dir_, name);
+    const std::string shown = PrintablePath(path);
+    const bool abstract = path[0] == '\0';
     sockaddr_un addr;
-    if (!MakeAddress(path, &addr)) {
-        HostLogf(kLogDebug, "binder: socket path too long: %s", path.c_str());
+    const socklen_t addr_len = MakeAddress(path, &addr);
+    if (addr_len == 0) {
+        HostLogf(kLogDebug, "binder: socket path too long: %s", shown.c_str());
         return -ENAMETOOLONG;
     }
     std::lock_guard<std::mutex> hold(mutex_);
     if (stopping_ || !epoll_fd_.valid()) return -EINVAL;
-    if (mkdir(dir_.c_str(), 0700) != 0 && errno != EEXIST) {
-        int err = errno;
-        HostLogf(kLogWarn, "binder: cannot create %s: %s", dir_.c_str(), strerror(err));
-        return -err;
-    }
-    struct stat st;
-    if (lstat(path.c_str(), &st) == 0) {
-        if (!S_ISSOCK(st.st_mode)) {
-            HostLogf(kLogWarn, "binder: %s exists and is not a socket", path.c_str());
-            return -EEXIST;
+    struct stat st {};
+    if (!abstract) {
+        if (mkdir(dir_.c_str(), 0700) != 0 && errno != EEXIST) {
+            int err = errno;
+            HostLogf(kLogWarn, "binder: cannot create %s: %s", dir_.c_str(), strerror(err));
+            return -err;
         }
-        // Nonblocking, so a live service with a full backlog still counts as live.
-        int probe = ConnectTo(path, true);
-        if (probe >= 0 || errno == EAGAIN) {
-            if (probe >= 0) close(probe);
-            HostLogf(kLogWarn,
-                     "binder: %s is served by another running orvex; to run a second one, give it "
-                     "a folder of its own: ORVEX_BINDER_DIR=/some/dir",
-                     path.c_str());
-            return -EADDRINUSE;
+        if (lstat(path.c_str(), &st) == 0) {
+            if (!S_ISSOCK(st.st_mode)) {
+                HostLogf(kLogWarn, "binder: %s exists and is not a socket", path.c_str());
+                return -EEXIST;
+            }
+            // Nonblocking, so a live service with a full backlog still counts as live.
+            int probe = ConnectTo(path, true);
+            if (probe >= 0 || errno == EAGAIN) {
+                if (probe >= 0) close(probe);
+                HostLogf(kLogError,
+                         "binder: %s is served by another running orvex; to run a second one, "
+                         "give it a folder of its own (ORVEX_BINDER_DIR=/some/dir) or start it "
+                         "in a network namespace of its own (unshare -n) without that variable",
+                         path.c_str());
+                return -EADDRINUSE;
+            }
+            unlink(path.c_str());  // left behind by a process that did not stop cleanly
         }
-        unlink(path.c_str());  // left behind by a process that did not stop cleanly
     }
     int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0);
     if (fd < 0) return -errno;
-    if (bind(fd, reinterpret_cast<const sockaddr*>(&addr), sizeof addr) != 0 ||
-        listen(fd, 16) != 0 || lstat(path.c_str(), &st) != 0) {
+    if (bind(fd, reinterpret_cast<const sockaddr*>(&addr), addr_len) != 0 || listen(fd, 16) != 0 ||
+        (!abstract && lstat(path.c_str(), &st) != 0)) {
         int err = errno;
-        HostLogf(kLogWarn, "binder: cannot listen on %s: %s", path.c_str(), strerror(err));
+        if (err == EADDRINUSE && abstract) {
+            HostLogf(kLogError,
+                     "binder: %s is served by another running orvex in this network namespace; "
+                     "to run a second one, start it in a network namespace of its own (unshare "
+                     "-n)",
+                     name);
+        } else {
+            HostLogf(kLogWarn, "binder: cannot listen on %s: %s", shown.c_str(), strerror(err));
+        }
         close(fd);
         return -err;
     }
@@ -143,11 +162,11 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
     if (epoll_ctl(epoll_fd_.get(), EPOLL_CTL_ADD, fd, &ev) != 0) {
         int err = errno;
         close(fd);
-        unlink(path.c_str());
+        if (!abstract) unlink(path.c_str());
         return -err;
     }
     listeners_.push_back(std::move(listener));
-    HostLogf(kLogDebug, "binder: service %s on %s", name, path.c_str());
+    HostLogf(kLogDebug, "binder: service %s on %s", name, shown.c_str());
     return 0;
 }
 
@@ -287,11 +306,11 @@ void HostBinder::Stop() {
     for (std::thread& t : pool_) t.join();
     pool_.clear();
     for (auto& listener : listeners_) {
-        close(listener->fd);
+        close(listener->fd);  // an abstract name goes with its socket
         // Only our own file: a newer service may have taken the name since.
         struct stat st;
-        if (lstat(listener->path.c_str(), &st) == 0 && st.st_dev == listener->dev &&
-            st.st_ino == listener->ino) {
+        if (listener->path[0] != '\0' && lstat(listener->path.c_str(), &st) == 0 &&
+            st.st_dev == listener->dev && st.st_ino == listener->ino) {
             unlink(listener->path.c_str());
         }
     }

@@ -16,8 +16,9 @@
 namespace platform {
 namespace host {
 
-// Binder on Linux: each service listens on a Unix stream socket at <dir>/<name>, and a
-// connection carries transactions in the Parcel layout of BinderPort.h, one after another.
+// Binder on Linux: each service listens on a Unix stream socket at <dir>/<name> (by default
+// an abstract name, which belongs to the network namespace; see BinderDir), and a connection
+// carries transactions in the Parcel layout of BinderPort.h, one after another.
 //
 //   request  uint32 code, uint32 flags, uint32 size, then `size` bytes of Parcel data
 //   reply    int32 status: what the service's onTransact returned
@@ -56,7 +57,8 @@ public:
     int initWithDriver(const char* driver) override;
     const void* defaultServiceManager() override;
     // 0, or a negative errno: bad name (-EINVAL), the name served by a live socket
-    // (-EADDRINUSE), a file of that name that is not a socket (-EEXIST), socket errors.
+    // (-EADDRINUSE, logged with how to run a second service), a file of that name that is not a
+    // socket (-EEXIST), socket errors.
     int addService(const char* name, std::shared_ptr<BinderService> service) override;
     void startThreadPool() override;
     int transact(const char* service, uint32_t code, const ParcelWriter& data) override;
@@ -68,8 +70,11 @@ public:
     const std::string& dir() const { return dir_; }
     const std::string& driver() const { return driver_; }
 
-    // $ORVEX_BINDER_DIR, else $XDG_RUNTIME_DIR/orvex-binder, else /tmp/orvex-binder-UID.
+    // $ORVEX_BINDER_DIR (a folder, for scripts that want the sockets as files), else
+    // "\0orvex-binder-UID": Linux abstract names, one set per network namespace and user.
     static std::string BinderDir();
+    // Where the service `name` listens, given a BinderDir().
+    static std::string ServicePath(const std::string& dir, const char* name);
     // One path component of [A-Za-z0-9._-], neither "." nor "..".
     static bool ValidName(const char* name);
 

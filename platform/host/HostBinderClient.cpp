@@ -27,7 +27,7 @@ int HostBinder::transact(const char* service, uint32_t code, const ParcelWriter&
         ParcelReader reader(data.data().data(), data.data().size());
         return Dispatch(*local, code, reader, 0);
     }
-    return TransactOn(out, dir_ + "/" + service, header, data.data());
+    return TransactOn(out, ServicePath(dir_, service), header, data.data());
 }
 
 int HostBinder::TransactOn(Outgoing& out, const std::string& path, const uint8_t header[12],

@@ -1,9 +1,13 @@
 #include <dirent.h>
 #include <gtest/gtest.h>
+#include <sched.h>
 #include <sys/socket.h>
 #include <sys/un.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
+#include <cerrno>
+#include <cstddef>
 #include <cstdlib>
 #include <fstream>
 #include <iterator>
@@ -13,6 +17,7 @@
 #include <thread>
 #include <vector>
 
+#include "platform/host/BinderWire.h"
 #include "platform/host/HostBinder.h"
 #include "tools/AccessUnitSplitter.h"
 
@@ -249,6 +254,90 @@ TEST_F(HostBinderTest, NobodyListeningIsANegativeStatus) {
     for (const char* bad : {"", ".", "..", "../x", "a/b", "a b"}) {
         EXPECT_LT(client.transact(bad, 101, p), 0) << bad;
     }
+}
+
+// Without ORVEX_BINDER_DIR the sockets are abstract names per user; with it, files in that
+// folder. The address covers exactly the name's bytes: an abstract name has no terminator.
+TEST(HostBinderNamingTest, AbstractByDefaultFilesInAFolderWhenAsked) {
+    unsetenv("ORVEX_BINDER_DIR");
+    const std::string uid = std::to_string(getuid());
+    const std::string abstract = HostBinder::BinderDir();
+    EXPECT_EQ(abstract, std::string("\0orvex-binder-", 14) + uid);
+    setenv("ORVEX_BINDER_DIR", "/run/x", 1);
+    EXPECT_EQ(HostBinder::BinderDir(), "/run/x");
+    unsetenv("ORVEX_BINDER_DIR");
+    const size_t header = offsetof(sockaddr_un, sun_path);
+    const size_t room = sizeof(sockaddr_un) - header;  // 108 on Linux
+    const std::string longest = std::string(1, '\0') + std::string(room - 2, 'a');
+    struct Case {
+        std::string path;
+        std::string shown;
+        size_t address_len;  // after sun_family; 0: does not fit
+    } const cases[] = {
+        {HostBinder::ServicePath(abstract, "orvex.rtp"), "@orvex-binder-" + uid + "/orvex.rtp",
+         14 + uid.size() + 10},
+        {HostBinder::ServicePath("/run/x", "orvex.rtp"), "/run/x/orvex.rtp", room},
+        {longest, "@" + longest.substr(1), room - 1},
+        {std::string(room, 'a'), "", 0},
+        {"", "", 0},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(platform::host::binder_wire::PrintablePath(c.path));
+        sockaddr_un addr;
+        const socklen_t len = platform::host::binder_wire::MakeAddress(c.path, &addr);
+        if (c.address_len == 0) {
+            EXPECT_EQ(len, 0u);
+            continue;
+        }
+        EXPECT_EQ(len, header + c.address_len);
+        EXPECT_EQ(std::string(addr.sun_path, c.path.size()), c.path);
+        EXPECT_EQ(platform::host::binder_wire::PrintablePath(c.path), c.shown);
+    }
+}
+
+// One name per network namespace: a second service in the same one is refused (and says how
+// to run two); in a namespace of its own it serves, and each side's calls reach its own.
+TEST(HostBinderNamingTest, EachNetworkNamespaceHasItsOwnServices) {
+    unsetenv("ORVEX_BINDER_DIR");
+    const std::string name = "orvex.test." + std::to_string(getpid());
+    auto ours = std::make_shared<RecordingService>();
+    HostBinder first;
+    ASSERT_EQ(first.addService(name.c_str(), ours), 0);
+    {
+        HostBinder second;
+        EXPECT_EQ(second.addService(name.c_str(), std::make_shared<RecordingService>()),
+                  -EADDRINUSE);
+    }
+    const pid_t child = fork();  // before any thread starts, so the child may start its own
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+        // 2: no namespace of our own (not root); 1: wrong; 0: right.
+        if (unshare(CLONE_NEWNET) != 0) _exit(2);
+        HostBinder client;
+        ParcelWriter p;
+        p.writeInt32(1);
+        if (client.transact(name.c_str(), 101, p) != HostBinder::kDeadObject) _exit(1);
+        auto theirs = std::make_shared<RecordingService>();
+        HostBinder own;
+        if (own.addService(name.c_str(), theirs) != 0) _exit(1);
+        own.startThreadPool();
+        HostBinder other;
+        if (other.transact(name.c_str(), 101, p) != platform::kBinderOk) _exit(1);
+        own.Stop();
+        _exit(theirs->Take().size() == 1 ? 0 : 1);
+    }
+    int status = 0;
+    ASSERT_EQ(waitpid(child, &status, 0), child);
+    ASSERT_TRUE(WIFEXITED(status));
+    first.startThreadPool();
+    HostBinder client;
+    ParcelWriter p;
+    p.writeInt32(2);
+    EXPECT_EQ(client.transact(name.c_str(), 101, p), platform::kBinderOk);
+    first.Stop();
+    EXPECT_EQ(ours->Take().size(), 1u) << "a call from the other namespace arrived here";
+    if (WEXITSTATUS(status) == 2) GTEST_SKIP() << "unshare -n needs root; only one namespace tried";
+    EXPECT_EQ(WEXITSTATUS(status), 0) << "the service in a namespace of its own failed";
 }
 
 // The units one call gives, and the same input fed in chunks as orvex-feed reads it.

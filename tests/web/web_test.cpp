@@ -281,33 +281,49 @@ TEST(LiveMuxerTest, PicturesBecomeOneFragmentEachWithTheirTimes) {
         {'v', SEI, 1000, {}},
         {'v', IDR, 1000, {}},
         {'v', AUD, 1033, {{1, 0, "00000005 060501ff80 00000004 65888421"}}},
-        {'v', P, 1033, {{1, 33 * 90, "00000004 419a0011"}}},
+        {'v', P, 1033, {}},  // the first P picture: its slice count is not known yet
         {'v', FILL, 1033, {}},
         {'a', "21 00 aa", 1040, {{2, 40 * 48, "2100aa"}}},
         {'a', "fff1 4c80 013f fc 21 01", 1061, {{2, 40 * 48 + 1024, "2101"}}},  // ADTS, raw out
         {'a', "fff0 4c80 013f fc 1234 21 05", 1082, {{2, 40 * 48 + 2048, "2105"}}},  // with CRC
         {'a', "21 02", 1500, {{2, 500 * 48, "2102"}}},  // a jump: the stamp again
-        {'v', P, 1066, {{1, 66 * 90, "00000004 419a0011"}}},
+        {'v', P, 1066, {{1, 33 * 90, "00000004 419a0011"}, {1, 66 * 90, "00000004 419a0011"}}},
         // Capture stops and starts again: the stream's time goes on without a gap.
         {'a', "21 03", 2500, {}},
         {'v', P, 3066, {{1, 99 * 90, "00000004 419a0011"}}},
         {'a', "21 04", 3070, {{2, 103 * 48, "2104"}}}});
-    Play("two slices a picture: known from the first, sent at the second after that", {
+    Play("two slices a picture: known from the first of its kind, sent at the second after that", {
         {'v', SPS, 0, {}},
         {'v', PPS, 0, {}},
         {'v', IDR, 0, {}},
         {'v', IDR_2ND, 0, {}},
         {'v', P, 33, {{1, 0, "00000004 65888421 00000004 65088421"}}},
-        {'v', P_2ND, 33, {{1, 33 * 90, "00000004 419a0011 00000003 411a22"}}},
-        {'v', P, 66, {}}});
-    Play("a picture sent too soon: its rest is dropped and the slice count learnt again", {
+        {'v', P_2ND, 33, {}},
+        {'v', P, 66, {{1, 33 * 90, "00000004 419a0011 00000003 411a22"}}},
+        {'v', P_2ND, 66, {{1, 66 * 90, "00000004 419a0011 00000003 411a22"}}},
+        {'v', P, 100, {}}});
+    Play("a key picture of two slices after pictures of one reaches the viewer whole", {
         {'v', SPS, 0, {}},
         {'v', PPS, 0, {}},
         {'v', IDR, 0, {}},
-        {'v', P, 33, {{1, 0, "00000004 65888421"}, {1, 33 * 90, "00000004 419a0011"}}},
-        {'v', P_2ND, 33, {}},
-        {'v', P, 66, {}},
-        {'v', P, 100, {{1, 66 * 90, "00000004 419a0011"}, {1, 100 * 90, "00000004 419a0011"}}}});
+        {'v', IDR_2ND, 0, {}},
+        {'v', P, 33, {{1, 0, "00000004 65888421 00000004 65088421"}}},
+        {'v', P, 66, {{1, 33 * 90, "00000004 419a0011"}, {1, 66 * 90, "00000004 419a0011"}}},
+        {'v', SPS, 100, {}},
+        {'v', PPS, 100, {}},
+        {'v', IDR, 100, {}},
+        {'v', IDR_2ND, 100, {{1, 100 * 90, "00000004 65888421 00000004 65088421"}}},
+        {'v', P, 133, {{1, 133 * 90, "00000004 419a0011"}}}});
+    Play("a picture sent too soon: its rest is dropped and its kind waits for more slices", {
+        {'v', SPS, 0, {}},
+        {'v', PPS, 0, {}},
+        {'v', IDR, 0, {}},
+        {'v', P, 33, {{1, 0, "00000004 65888421"}}},
+        {'v', P, 66, {{1, 33 * 90, "00000004 419a0011"}, {1, 66 * 90, "00000004 419a0011"}}},
+        {'v', P_2ND, 66, {}},
+        {'v', P, 100, {}},
+        {'v', P, 133, {{1, 100 * 90, "00000004 419a0011"}}},
+        {'v', P_2ND, 133, {{1, 133 * 90, "00000004 419a0011 00000003 411a22"}}}});
     Play("nothing before the first key frame, nor without parameter sets", {
         {'v', P, 0, {}},
         {'v', IDR, 33, {}},
@@ -333,7 +349,8 @@ TEST(LiveMuxerTest, NewParameterSetsStartANewStreamWithTheirSize) {
     ASSERT_TRUE(ring.WaitForStart(&reader, &type, 0));
     EXPECT_EQ(type, "video/mp4; codecs=\"avc1.42c01e,mp4a.40.2\"");
     Drain(ring, reader);
-    feed(kSps2, 66), feed(kPps, 66), feed(idr, 66), feed(p, 100);
+    // The new stream's slice counts are learnt anew: its P picture waits for a delimiter.
+    feed(kSps2, 66), feed(kPps, 66), feed(idr, 66), feed(p, 100), feed(Unhex(AUD), 133);
     const char* why = nullptr;
     Drain(ring, reader, &why);
     EXPECT_STREQ(why, "the stream changed");

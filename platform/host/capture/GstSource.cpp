@@ -1,29 +1,12 @@
 #include "platform/host/capture/GstSource.h"
 
-#include <dlfcn.h>
-#include <unistd.h>
-
-#include <cstdlib>
 #include <mutex>
+
+#include "platform/host/HostModule.h"
 
 namespace platform {
 namespace host {
 namespace {
-
-std::string ModulePath() {
-    const char* chosen = getenv("ORVEX_HOST_GST_MODULE");
-    if (chosen != nullptr && chosen[0] != '\0') return chosen;
-    // An installed service keeps the module beside itself; test programs elsewhere in the
-    // build tree find it where the build put it.
-    char exe[4096];
-    ssize_t n = readlink("/proc/self/exe", exe, sizeof exe - 1);
-    if (n > 0) {
-        std::string path(exe, static_cast<size_t>(n));
-        path = path.substr(0, path.rfind('/') + 1) + ORVEX_HOST_GST_MODULE_NAME;
-        if (access(path.c_str(), F_OK) == 0) return path;
-    }
-    return ORVEX_HOST_GST_MODULE_PATH;
-}
 
 // Loads the module once; a failure is tried again at the next start. It is never unloaded:
 // GLib and GStreamer cannot be.
@@ -31,18 +14,11 @@ LiveSourceFactory LoadModule(std::string* error) {
     static std::mutex mutex;
     static LiveSourceFactory factory = nullptr;
     std::lock_guard<std::mutex> hold(mutex);
-    if (factory != nullptr) return factory;
-    std::string path = ModulePath();
-    void* module = dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
-    void* entry = module != nullptr ? dlsym(module, kLiveSourceFactory) : nullptr;
-    if (entry == nullptr) {
-        const char* why = dlerror();
-        *error = std::string("cannot load ") + ORVEX_HOST_GST_MODULE_NAME + ": " +
-                 (why != nullptr ? why : path);
-        if (module != nullptr) dlclose(module);
-        return nullptr;
+    if (factory == nullptr) {
+        factory = reinterpret_cast<LiveSourceFactory>(
+            LoadModuleSymbol("ORVEX_HOST_GST_MODULE", ORVEX_HOST_GST_MODULE_NAME,
+                             ORVEX_HOST_GST_MODULE_PATH, kLiveSourceFactory, error));
     }
-    factory = reinterpret_cast<LiveSourceFactory>(entry);
     return factory;
 }
 

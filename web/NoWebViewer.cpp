@@ -1,0 +1,18 @@
+// The web viewer's entry points in a build without it (the television's default, which has
+// no HTTP library): a kv.orvex.http that asks for it is answered with one line, not a port.
+#include "platform/LogPort.h"
+#include "platform/Ports.h"
+#include "service/OrvexLog.h"
+#include "web/WebViewer.h"
+
+void StartWebViewer(RtspTransport*, auth::AccessGate*) {
+    char value[platform::kPropertyValueMax] = {};
+    platform::Properties().Get("kv.orvex.http", value, "");
+    if (value[0] == '\0') return;
+    OrvexLogPriority(platform::kLogWarn, "orvex:::web",
+                     "kv.orvex.http=%s: this build has no web viewer (docs/android.md says how "
+                     "to build it in); no port is opened",
+                     value);
+}
+
+void StopWebViewer() {}
