@@ -106,6 +106,7 @@ int main(int argc, char** argv) {
     platform::InstallDefaultPorts();
     OrvexPrintLog(kTag, "main");
     if (argc == 2 && strcmp(argv[1], "-v") == 0) {
+        platform::ShowStdoutMirror();
         OrvexPrintLog(kTag, "\n skyvoap version:%s,\n", kVersion);
         return 0;
     }
@@ -130,6 +131,7 @@ int main(int argc, char** argv) {
     StartWebViewer(skyvo_rtsp_service()->listener());   // only when kv.orvex.http names a port
     StartPublishing(skyvo_rtsp_service()->listener());  // only when kv.orvex.publish names servers
     start_orvex_system_service();
+    platform::AnnounceService(554, WebViewerPort(), "");  // who may watch: nothing to add yet
     const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
     int signal_pipe[2] = {-1, -1};
     if (Global_Config::instance()->wake_on_write() &&

@@ -338,3 +338,5 @@ void StartWebViewer(RtspTransport* transport) {
 }
 
 void StopWebViewer() { g_web_viewer.reset(); }
+
+unsigned WebViewerPort() { return g_web_viewer != nullptr ? g_web_viewer->port() : 0; }
