@@ -33,7 +33,10 @@ unsigned Number(const std::string& v) { return static_cast<unsigned>(LeadingInt(
 
 }  // namespace
 
-CaptureQueryResult ApplyCaptureQuery(const std::string& query) {
+const char kCaptureKeysText[] =
+    "width, height, cameraid, win, sub, dumpvideo, dumpaudio, specialcase, framerate";
+
+CaptureQueryResult ApplyCaptureQuery(const std::string& query, std::string* missing_key) {
     static const char* kKeys[] = {"width=",     "height=",    "cameraid=",    "win=",      "sub=",
                                   "dumpvideo=", "dumpaudio=", "specialcase=", "framerate="};
     std::string values[9];
@@ -41,6 +44,7 @@ CaptureQueryResult ApplyCaptureQuery(const std::string& query) {
         values[i] = getKeyWordValue(kKeys[i], query);
         if (values[i] == "failed") {
             OrvexPrintLog(kTag, "get %s failed \n ", kKeys[i]);
+            if (missing_key != nullptr) *missing_key = kKeys[i];
             return CaptureQueryResult::kMissingKey;
         }
     }

@@ -306,6 +306,23 @@ TEST_F(ServerTest, ReconnectFromTheSameAddressReplacesTheOldSession) {
     EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close", "video open", "audio open"}));
 }
 
+// The connection is reset without an answer, as ever; the log names the key and the client.
+TEST_F(ServerTest, AMissingCaptureKeyIsOneWarningNamingIt) {
+    RtspClient c("127.0.0.2", port);
+    c.Send(
+        "DESCRIBE rtsp://127.0.0.1/skyvo.0?width=640&height=480&win=main&sub=0&dumpvideo=0"
+        "&dumpaudio=0&specialcase=none&framerate=30 RTSP/1.0\r\nCSeq: 2\r\n\r\n");
+    EXPECT_TRUE(c.ClosedWithoutAnswer());
+    std::vector<std::string> warnings;
+    for (const auto& e : fake.log.Entries()) {
+        if (e.priority >= platform::kLogWarn) warnings.push_back(e.text);
+    }
+    EXPECT_EQ(warnings, (std::vector<std::string>{
+                            "rtsp client 127.0.0.2: the URL has no 'cameraid=' key; every key of "
+                            "width, height, cameraid, win, sub, dumpvideo, dumpaudio, "
+                            "specialcase, framerate is needed"}));
+}
+
 TEST_F(ServerTest, BadOrSilentClientsAreClosedWithoutAnswer) {
     const std::string without_framerate =
         "DESCRIBE rtsp://127.0.0.1/skyvo.0?width=640&height=480&cameraid=hd0&win=main&sub=0"
