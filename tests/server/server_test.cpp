@@ -569,6 +569,20 @@ TEST_F(ServerTest, CaptureHoldStartsCaptureAndOutlivesDepartingClients) {
     EXPECT_EQ(listener->capture_holders(), 0);
 }
 
+// A client that connects and never plays (a player that gave up, a probe) does not keep a
+// hold's capture from starting: it waits a moment for the client's choice, then starts.
+TEST_F(ServerTest, CaptureHoldStartsCaptureBesideAClientThatNeverPlays) {
+    Socket::SetReadinessWaitMs(10000);  // as in service: the idle client stays for the test
+    RtspClient idle("127.0.0.2", port);
+    ASSERT_TRUE(WaitFor([this] { return Clients() == 1; }));
+    RtspTransport* listener = skyvo_rtsp_service()->listener();
+    listener->HoldCapture(kQuery);
+    EXPECT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video open", "audio open"}));
+    EXPECT_EQ(Clients(), 1);
+    listener->ReleaseCapture();
+}
+
 // Track numbers beyond int's range are unknown tracks, not arithmetic on them.
 TEST_F(ServerTest, OutOfRangeTrackNumbersAnswerStreamNotFound) {
     RtspClient c("127.0.0.2", port);
