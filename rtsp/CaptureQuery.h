@@ -20,3 +20,5 @@ extern const char kCaptureKeysText[];
 // its '?' on: the capture keys `query` gives (a value of letters, digits and '_' only), the
 // rest as tools/run.sh's URL has them. Any thread: a pure function.
 std::string CaptureQueryFor(const std::string& query);
+// The size a query as CaptureQueryFor makes it asks for (0 for a value that is not a number).
+void CaptureQuerySize(const std::string& query, unsigned* width, unsigned* height);

@@ -288,18 +288,26 @@ void RtspTransport::ServeCaptureHolders() {
             m_hold_query_pending = false;
         }
     }
+    // A size the capture refuses would run capture with no picture for every consumer: the
+    // last accepted choice stays, or tools/run.sh's when there is none.
+    unsigned width = 0, height = 0;
+    if (!query.empty()) {
+        get_platform_info();
+        CaptureQuerySize(query, &width, &height);
+    }
+    const CaptureState& state = capture_state();
+    if (!query.empty() && ResolutionCode(width, height, state.board) < 0) {
+        OrvexLogPriority(platform::kLogWarn, kTag,
+                         "capture keys %s ask for %ux%u, a size the capture refuses; keeping "
+                         "%ux%u (accepted on %s: %s)",
+                         query.c_str(), width, height, state.width != 0 ? state.width : 1280,
+                         state.width != 0 ? state.height : 720, state.board,
+                         AcceptedSizesText(state.board).c_str());
+        query = state.width != 0 ? std::string() : CaptureQueryFor("");
+    }
     // An RTSP client's own choice stands; a refused query leaves the last accepted one.
     if (!query.empty() && ApplyCaptureQuery(query) != CaptureQueryResult::kApplied) {
         OrvexLogPriority(platform::kLogWarn, kTag, "capture keys refused: %s", query.c_str());
-    } else if (!query.empty()) {
-        const CaptureState& state = capture_state();
-        if (ResolutionCode(state.width, state.height, state.board) < 0) {
-            OrvexLogPriority(platform::kLogWarn, kTag,
-                             "capture keys %s ask for %ux%u, a size the capture refuses: no "
-                             "picture (accepted on %s: %s)",
-                             query.c_str(), state.width, state.height, state.board,
-                             AcceptedSizesText(state.board).c_str());
-        }
     }
     if (g_capture_running.load(std::memory_order_relaxed) == 0) StartCaptureAndSend();
 }

@@ -583,6 +583,34 @@ TEST_F(ServerTest, CaptureHoldStartsCaptureBesideAClientThatNeverPlays) {
     listener->ReleaseCapture();
 }
 
+// A viewer asking for a size the capture refuses would leave every consumer without a picture:
+// the last accepted size stays, and one warning says so.
+TEST_F(ServerTest, CaptureHoldWithARefusedSizeKeepsTheLastAcceptedOne) {
+    RtspTransport* listener = skyvo_rtsp_service()->listener();
+    listener->HoldCapture(kQuery);
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+    listener->ReleaseCapture();
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 4; }));
+    fake.log.Clear();
+    listener->HoldCapture("?width=1000&height=700");
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 6; }));
+    EXPECT_EQ(RecordedCalls().back(), "audio open");
+    unsigned width = 0, height = 0;
+    get_video_resolution(&width, &height);
+    EXPECT_EQ(width, 640u);
+    EXPECT_EQ(height, 480u);
+    std::vector<std::string> warnings;
+    for (const auto& e : fake.log.Entries()) {
+        if (e.priority >= platform::kLogWarn) warnings.push_back(e.text);
+    }
+    EXPECT_EQ(warnings, (std::vector<std::string>{
+                            "capture keys ?width=1000&height=700 ask for 1000x700, a size the "
+                            "capture refuses; keeping 640x480 (accepted on android: 640x480, "
+                            "720x576, 320x240, 480x320, 1280x720, 720x480, 720x400, 320x176, "
+                            "640x368, 1920x1080)"}));
+    listener->ReleaseCapture();
+}
+
 // Track numbers beyond int's range are unknown tracks, not arithmetic on them.
 TEST_F(ServerTest, OutOfRangeTrackNumbersAnswerStreamNotFound) {
     RtspClient c("127.0.0.2", port);
