@@ -359,6 +359,10 @@ int RtspTransport::ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, in
     }
     if (count > kMaxClients - 1) {
         OrvexPrint("\n CloseSockid,socketid:%d,\n", fd);
+        // The trace above is stdout only; whoever is refused needs a line in the log.
+        OrvexLogPriority(platform::kLogWarn, kTag,
+                         "rtsp client %s refused: %d clients already watch, the most served",
+                         DottedAddress(peer).c_str(), kMaxClients);
         ResetOnClose(fd);
         close(fd);
         return 0;

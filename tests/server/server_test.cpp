@@ -286,6 +286,12 @@ TEST_F(ServerTest, SixthClientIsResetAtOnce) {
     RtspClient sixth("127.0.0.7", port);
     EXPECT_TRUE(sixth.ClosedWithoutAnswer());
     EXPECT_EQ(Clients(), 5);
+    std::vector<std::string> warnings;
+    for (const auto& e : fake.log.Entries()) {
+        if (e.priority >= platform::kLogWarn) warnings.push_back(e.text);
+    }
+    EXPECT_EQ(warnings, (std::vector<std::string>{"rtsp client 127.0.0.7 refused: 5 clients "
+                                                  "already watch, the most served"}));
     // The five are still served.
     EXPECT_NE(
         clients[0]->Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n").find("200 OK"),
