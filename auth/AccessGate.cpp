@@ -162,7 +162,7 @@ void AccessGate::ReadUsers(bool first) {
     m_gate = std::make_unique<DigestGate>(std::move(users), m_secret, std::move(retired));
     m_closed = false;
     if (first) {
-        OrvexLogPriority(platform::kLogInfo, kTag, "Digest authentication on, realm \"%s\", %s",
+        OrvexLogPriority(platform::kLogDebug, kTag, "Digest authentication on, realm \"%s\", %s",
                          m_gate->realm().c_str(), m_file.c_str());
     } else {
         OrvexLogPriority(platform::kLogInfo, kTag, "%s changed: %zu user(s) may watch",

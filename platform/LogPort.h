@@ -17,6 +17,9 @@ public:
     virtual ~LogPort() = default;
     // `text` is fully formatted; the port adds no formatting of its own.
     virtual void Write(int buffer, int priority, const char* tag, const char* text) = 0;
+    // Whether the service's framed copy of its traces on standard output is printed. The
+    // television's console shows it; the host leaves it out unless asked for debug output.
+    virtual bool MirrorToStdout() const { return true; }
 };
 
 }  // namespace platform

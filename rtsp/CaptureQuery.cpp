@@ -31,9 +31,28 @@ unsigned WindowCode(const std::string& v) {
 
 unsigned Number(const std::string& v) { return static_cast<unsigned>(LeadingInt(v).value_or(0)); }
 
+// The value after "key=" at the query's start or after '?' or '&': letters, digits and '_', at
+// most 16 of them; empty when there is none.
+std::string ValueOf(const std::string& query, const char* key) {
+    const std::string name = std::string(key) + "=";
+    for (size_t at = query.find(name); at != std::string::npos; at = query.find(name, at + 1)) {
+        if (at != 0 && query[at - 1] != '?' && query[at - 1] != '&') continue;
+        size_t end = at + name.size();
+        while (end < query.size() && end - at - name.size() < 16 &&
+               (isalnum(static_cast<unsigned char>(query[end])) || query[end] == '_')) {
+            ++end;
+        }
+        return query.substr(at + name.size(), end - at - name.size());
+    }
+    return std::string();
+}
+
 }  // namespace
 
-CaptureQueryResult ApplyCaptureQuery(const std::string& query) {
+const char kCaptureKeysText[] =
+    "width, height, cameraid, win, sub, dumpvideo, dumpaudio, specialcase, framerate";
+
+CaptureQueryResult ApplyCaptureQuery(const std::string& query, std::string* missing_key) {
     static const char* kKeys[] = {"width=",     "height=",    "cameraid=",    "win=",      "sub=",
                                   "dumpvideo=", "dumpaudio=", "specialcase=", "framerate="};
     std::string values[9];
@@ -41,6 +60,7 @@ CaptureQueryResult ApplyCaptureQuery(const std::string& query) {
         values[i] = getKeyWordValue(kKeys[i], query);
         if (values[i] == "failed") {
             OrvexPrintLog(kTag, "get %s failed \n ", kKeys[i]);
+            if (missing_key != nullptr) *missing_key = kKeys[i];
             return CaptureQueryResult::kMissingKey;
         }
     }
@@ -58,21 +78,15 @@ std::string CaptureQueryFor(const std::string& query) {
         {"framerate", "30"}};
     std::string out = "?";
     for (const auto& key : kKeys) {
-        std::string value = key[1];
-        const std::string name = std::string(key[0]) + "=";
-        for (size_t at = query.find(name); at != std::string::npos; at = query.find(name, at + 1)) {
-            if (at != 0 && query[at - 1] != '?' && query[at - 1] != '&') continue;
-            size_t end = at + name.size();
-            while (end < query.size() && end - at - name.size() < 16 &&
-                   (isalnum(static_cast<unsigned char>(query[end])) || query[end] == '_')) {
-                ++end;
-            }
-            if (end > at + name.size())
-                value = query.substr(at + name.size(), end - at - name.size());
-            break;
-        }
+        std::string value = ValueOf(query, key[0]);
+        if (value.empty()) value = key[1];
         if (out.size() > 1) out += "&";
-        out += name + value;
+        out += std::string(key[0]) + "=" + value;
     }
     return out;
+}
+
+void CaptureQuerySize(const std::string& query, unsigned* width, unsigned* height) {
+    *width = Number(ValueOf(query, "width"));
+    *height = Number(ValueOf(query, "height"));
 }

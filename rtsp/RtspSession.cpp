@@ -157,8 +157,16 @@ bool RtspSession::TransportDescribe(std::string* sdp) {
             return false;
         }
     }
-    CaptureQueryResult applied = ApplyCaptureQuery(time_text);
-    if (applied == CaptureQueryResult::kMissingKey) return false;
+    std::string missing;
+    CaptureQueryResult applied = ApplyCaptureQuery(time_text, &missing);
+    if (applied == CaptureQueryResult::kMissingKey) {
+        // The connection is reset with no answer; this line is all the operator gets.
+        OrvexLogPriority(platform::kLogWarn, kTag,
+                         "rtsp client %s: the URL has no '%s' key; every key of %s is needed",
+                         DottedAddress(m_response->GetConnectAddr()).c_str(), missing.c_str(),
+                         kCaptureKeysText);
+        return false;
+    }
     if (applied == CaptureQueryResult::kRefused) {
         m_response->ResponseError("RTSP/1.0 405  resolvration error !");
         return false;

@@ -10,6 +10,7 @@
 #include <cstring>
 #include <vector>
 
+#include "capture/LivecameraResolution.h"
 #include "capture/livepipmanager.h"
 #include "platform/LogPort.h"
 #include "rtp/SendH264Rtp.h"
@@ -18,6 +19,7 @@
 #include "rtsp/RtspResponse.h"
 #include "rtsp/RtspSession.h"
 #include "server/QuitFlag.h"
+#include "service/Clocks.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
 #include "service/ThreadName.h"
@@ -32,6 +34,10 @@ constexpr int kMaxClients = 5;
 std::atomic<int> g_select_wait_ms{2000};
 // While capture is held, a stopped capture comes back within this wait.
 constexpr int kHeldSelectWaitMs = 250;
+// How long a hold's capture choice waits for a connected RTSP client to make its own (a
+// connecting client sends DESCRIBE at once). A client that stays connected without playing
+// (a player that gave up, a probe) must not keep capture from every viewer until it is dropped.
+constexpr unsigned kHoldChoiceWaitMs = 1000;
 
 void ResetOnClose(int fd) {
     linger reset{1, 0};
@@ -213,6 +219,7 @@ void RtspTransport::HoldCapture(const std::string& query) {
         if (!query.empty()) {
             m_hold_query = query;
             m_hold_query_pending = true;
+            m_hold_query_ms = GetTimeStampMillsec();
         }
     }
     m_capture_holders.fetch_add(1, std::memory_order_relaxed);
@@ -268,12 +275,38 @@ void RtspTransport::ServeCaptureHolders() {
         thread_mutex::Scoped hold(m_hold_lock);
         // A connected RTSP client may still choose the capture: the hold's choice waits until
         // nobody is connected, rather than being lost and capture started with none at all.
-        if (m_hold_query_pending && !nobody) return;
-        if (m_hold_query_pending) query.swap(m_hold_query);
-        m_hold_query_pending = false;
+        // After kHoldChoiceWaitMs capture starts anyway, with the hold's choice only when
+        // nothing was ever chosen.
+        if (m_hold_query_pending && !nobody) {
+            if (GetTimeStampMillsec() - m_hold_query_ms < kHoldChoiceWaitMs) return;
+            if (capture_state().width == 0) {
+                query.swap(m_hold_query);
+                m_hold_query_pending = false;
+            }
+        } else {
+            if (m_hold_query_pending) query.swap(m_hold_query);
+            m_hold_query_pending = false;
+        }
+    }
+    // A size the capture refuses would run capture with no picture for every consumer: the
+    // last accepted choice stays, or tools/run.sh's when there is none.
+    unsigned width = 0, height = 0;
+    if (!query.empty()) {
+        get_platform_info();
+        CaptureQuerySize(query, &width, &height);
+    }
+    const CaptureState& state = capture_state();
+    if (!query.empty() && ResolutionCode(width, height, state.board) < 0) {
+        OrvexLogPriority(platform::kLogWarn, kTag,
+                         "capture keys %s ask for %ux%u, a size the capture refuses; keeping "
+                         "%ux%u (accepted on %s: %s)",
+                         query.c_str(), width, height, state.width != 0 ? state.width : 1280,
+                         state.width != 0 ? state.height : 720, state.board,
+                         AcceptedSizesText(state.board).c_str());
+        query = state.width != 0 ? std::string() : CaptureQueryFor("");
     }
     // An RTSP client's own choice stands; a refused query leaves the last accepted one.
-    if (!query.empty() && nobody && ApplyCaptureQuery(query) != CaptureQueryResult::kApplied) {
+    if (!query.empty() && ApplyCaptureQuery(query) != CaptureQueryResult::kApplied) {
         OrvexLogPriority(platform::kLogWarn, kTag, "capture keys refused: %s", query.c_str());
     }
     if (g_capture_running.load(std::memory_order_relaxed) == 0) StartCaptureAndSend();
@@ -326,6 +359,10 @@ int RtspTransport::ProcessNewIncomingRtspSession(int listenFd, fd_set& ready, in
     }
     if (count > kMaxClients - 1) {
         OrvexPrint("\n CloseSockid,socketid:%d,\n", fd);
+        // The trace above is stdout only; whoever is refused needs a line in the log.
+        OrvexLogPriority(platform::kLogWarn, kTag,
+                         "rtsp client %s refused: %d clients already watch, the most served",
+                         DottedAddress(peer).c_str(), kMaxClients);
         ResetOnClose(fd);
         close(fd);
         return 0;

@@ -115,6 +115,7 @@ private:
     thread_mutex m_hold_lock;
     std::string m_hold_query ORVEX_GUARDED_BY(m_hold_lock);
     bool m_hold_query_pending ORVEX_GUARDED_BY(m_hold_lock) = false;
+    unsigned m_hold_query_ms ORVEX_GUARDED_BY(m_hold_lock) = 0;  // when it became pending
     // Self-pipe in the select set, opened on first use so that a listener nobody wakes keeps
     // its descriptors as they were.
     thread_mutex m_wake_lock;

@@ -28,6 +28,7 @@ void Format(Message& m, const char* fmt, va_list args) {
 
 // One fwrite per message so that lines of concurrent threads do not interleave.
 void WriteStdout(const char* prefix, const char* text, const char* suffix) {
+    if (!platform::Log().MirrorToStdout()) return;
     char framed[kMessageMax + 4];
     int n = snprintf(framed, sizeof framed, "%s%s%s", prefix, text, suffix);
     if (n < 0) return;

@@ -3,7 +3,8 @@
 #include <atomic>
 
 // Diagnostics of the service: every message goes to the platform log (system buffer, debug
-// priority) under its tag, and is mirrored to standard output framed by newlines.
+// priority) under its tag, and is mirrored to standard output framed by newlines. Every stdout
+// write below happens only where the platform log port shows the mirror (MirrorToStdout).
 // Thread contract: every function may be called from any thread.
 
 // The process-wide debug-print switch: starts at 0 and nothing in the service turns it on,

@@ -106,6 +106,7 @@ int main(int argc, char** argv) {
     platform::InstallDefaultPorts();
     OrvexPrintLog(kTag, "main");
     if (argc == 2 && strcmp(argv[1], "-v") == 0) {
+        platform::ShowStdoutMirror();
         OrvexPrintLog(kTag, "\n skyvoap version:%s,\n", kVersion);
         return 0;
     }
@@ -131,6 +132,9 @@ int main(int argc, char** argv) {
     StartWebViewer(skyvo_rtsp_service()->listener(), &skyvo_rtsp_service()->listener()->access());
     StartPublishing(skyvo_rtsp_service()->listener());  // only when kv.orvex.publish names servers
     start_orvex_system_service();
+    platform::AnnounceService(
+        554, WebViewerPort(),
+        "who may watch: " + skyvo_rtsp_service()->listener()->access().Summary());
     const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
     int signal_pipe[2] = {-1, -1};
     if (Global_Config::instance()->wake_on_write() &&

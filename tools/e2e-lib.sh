@@ -5,6 +5,8 @@
 work=$(mktemp -d)
 export ORVEX_LOG="file:$work/orvex.log"
 export ORVEX_BINDER_DIR="$work/binder"
+# The checks read the service's own traces: its debug lines and their copy on standard output.
+export ORVEX_LOG_LEVEL=debug
 pass=0
 fail() { echo "$name: FAILED: $*"; tail -n 20 "$work/stdout" "$work/orvex.log" 2>/dev/null || true; exit 1; }
 ok() { echo "$name: ok: $*"; pass=$((pass + 1)); }

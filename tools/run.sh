@@ -4,7 +4,11 @@ set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 "$top/tools/install-deps.sh"
 cmake -S "$top" -B "$top/build" -G Ninja -DCMAKE_BUILD_TYPE=RelWithDebInfo >/dev/null
-cmake --build "$top/build"
+# Only what running needs: the service, the GStreamer module it loads and orvex-feed (the tests
+# and benchmarks are tools/test.sh's).
+echo "run: building orvex, its GStreamer module and orvex-feed in build/ on $(nproc) cores" \
+     "(the first build takes a few minutes)"
+cmake --build "$top/build" --target orvex orvex_host_gst orvex-feed -j "$(nproc)"
 query="skyvo.0?width=1280&height=720&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"
 # The address other machines reach this one at (the URL is for them; 127.0.0.1 also works here).
 address=$( (ip -4 route get 192.0.2.1 2>/dev/null || true) | sed -n 's/.* src \([0-9.]*\).*/\1/p')

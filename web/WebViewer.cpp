@@ -444,3 +444,5 @@ void StartWebViewer(RtspTransport* transport, auth::AccessGate* gate) {
 }
 
 void StopWebViewer() { g_web_viewer.reset(); }
+
+unsigned WebViewerPort() { return g_web_viewer != nullptr ? g_web_viewer->port() : 0; }

@@ -77,3 +77,5 @@ private:
 // opened). kv.orvex.http.max: viewers at once (default 16). Main thread.
 void StartWebViewer(RtspTransport* transport, auth::AccessGate* gate);
 void StopWebViewer();
+// The port the service's web viewer listens on; 0 when there is none.
+unsigned WebViewerPort();

@@ -34,4 +34,8 @@ void InstallDefaultPorts() {
     Install(ports);
 }
 
+void AnnounceService(unsigned, unsigned, const std::string&) {}
+
+void ShowStdoutMirror() {}
+
 }  // namespace platform

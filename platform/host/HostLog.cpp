@@ -5,7 +5,10 @@
 #include <syslog.h>
 #include <unistd.h>
 
+#include <strings.h>
+
 #include <cstdarg>
+#include <cstdlib>
 #include <cstring>
 #include <ctime>
 
@@ -19,7 +22,29 @@ char PriorityLetter(int priority) {
     return priority >= 2 && priority <= 7 ? kLetters[priority] : '?';
 }
 
-HostLog::HostLog(const std::string& sink) {
+int ChooseLogLevel(const char* env, const std::string& property, const std::string& kv_log,
+                   std::string* complaint) {
+    static const struct {
+        const char* name;
+        int priority;
+    } kLevels[] = {{"verbose", 2},     {"debug", kLogDebug},  {"info", kLogInfo},
+                   {"warn", kLogWarn}, {"warning", kLogWarn}, {"error", kLogError}};
+    const bool from_env = env != nullptr && env[0] != '\0';
+    const std::string text = from_env ? env : property;
+    if (text.empty()) {
+        return kv_log == "debug" || atoi(kv_log.c_str()) != 0 ? kLogDebug : kLogInfo;
+    }
+    for (const auto& level : kLevels) {
+        if (strcasecmp(text.c_str(), level.name) == 0) return level.priority;
+    }
+    if (complaint != nullptr) {
+        *complaint = std::string(from_env ? "ORVEX_LOG_LEVEL" : "orvex.host.log.level") + "=\"" +
+                     text + "\" is not debug, info, warn or error; logging at info";
+    }
+    return kLogInfo;
+}
+
+HostLog::HostLog(const std::string& sink, int least_priority) : least_priority_(least_priority) {
     if (sink == "syslog") {
         sink_ = Sink::kSyslog;
         openlog("orvex", LOG_PID, LOG_DAEMON);
@@ -40,6 +65,7 @@ HostLog::~HostLog() {
 }
 
 void HostLog::Write(int, int priority, const char* tag, const char* text) {
+    if (priority < least_priority_) return;
     if (tag == nullptr) tag = "";
     if (text == nullptr) text = "";
     // The service frames many texts with newlines; each non-empty line becomes one entry.

@@ -11,6 +11,7 @@
 #include "platform/host/HostLog.h"
 #include "platform/host/HostProperties.h"
 #include "platform/host/KnownProperties.h"
+#include "platform/host/StartLine.h"
 
 namespace {
 
@@ -149,7 +150,8 @@ TEST(HostPlatformTest, DefaultPortsFollowThePropertyFile) {
     std::string props = TempPath("default_props");
     std::string log = TempPath("default_log");
     unlink(log.c_str());
-    WriteFile(props, "kelvo.build.kelvotv=px\norvex.host.log=file:" + log + "\n");
+    WriteFile(props, "kelvo.build.kelvotv=px\norvex.host.log=file:" + log +
+                         "\norvex.host.log.level=debug\n");
     setenv("ORVEX_PROP_FILE", props.c_str(), 1);
     unsetenv("ORVEX_LOG");
     platform::Ports before = platform::Installed();
@@ -167,6 +169,99 @@ TEST(HostPlatformTest, DefaultPortsFollowThePropertyFile) {
     unsetenv("ORVEX_PROP_FILE");
     unlink(props.c_str());
     unlink(log.c_str());
+}
+
+// The environment wins over the property, which wins over the television's kv.orvex.log; a
+// level nobody knows is info and one sentence naming where it came from.
+TEST(HostLogTest, LevelComesFromTheEnvironmentThenThePropertyThenKvOrvexLog) {
+    const struct {
+        const char* env;
+        const char* property;
+        const char* kv_log;
+        int level;
+        const char* complaint;
+    } cases[] = {
+        {nullptr, "", "", platform::kLogInfo, ""},
+        {"", "", "0", platform::kLogInfo, ""},
+        {nullptr, "", "1", platform::kLogDebug, ""},
+        {nullptr, "", "debug", platform::kLogDebug, ""},
+        {nullptr, "", "no", platform::kLogInfo, ""},
+        {nullptr, "warn", "1", platform::kLogWarn, ""},
+        {nullptr, "DEBUG", "", platform::kLogDebug, ""},
+        {"debug", "error", "", platform::kLogDebug, ""},
+        {"Warning", "", "", platform::kLogWarn, ""},
+        {"verbose", "", "", 2, ""},
+        {"loud", "debug", "", platform::kLogInfo,
+         "ORVEX_LOG_LEVEL=\"loud\" is not debug, info, warn or error; logging at info"},
+        {nullptr, "3", "", platform::kLogInfo,
+         "orvex.host.log.level=\"3\" is not debug, info, warn or error; logging at info"},
+    };
+    for (const auto& c : cases) {
+        std::string complaint;
+        EXPECT_EQ(platform::host::ChooseLogLevel(c.env, c.property, c.kv_log, &complaint), c.level)
+            << (c.env ? c.env : "-") << " " << c.property << " " << c.kv_log;
+        EXPECT_EQ(complaint, c.complaint);
+    }
+}
+
+// Below the level nothing is written, and the stdout copy of the traces is shown only at debug
+// or once asked for.
+TEST(HostLogTest, LinesBelowTheLevelAreLeftOut) {
+    std::string path = TempPath("level_log");
+    unlink(path.c_str());
+    {
+        platform::host::HostLog log("file:" + path, platform::kLogInfo);
+        EXPECT_FALSE(log.MirrorToStdout());
+        log.Write(3, 3, "orvex:::RtspSession", "sendppsandspsframe");
+        log.Write(3, 4, "orvex:::host", "serving");
+        log.Write(3, 5, "orvex:::web", "refused");
+        log.ShowMirror();
+        EXPECT_TRUE(log.MirrorToStdout());
+        EXPECT_TRUE(platform::host::HostLog("stderr").MirrorToStdout());
+    }
+    std::string text = ReadFile(path);
+    EXPECT_EQ(text.find("sendppsandspsframe"), std::string::npos) << text;
+    EXPECT_NE(text.find(" I orvex:::host: serving\n"), std::string::npos) << text;
+    EXPECT_NE(text.find(" W orvex:::web: refused\n"), std::string::npos) << text;
+    unlink(path.c_str());
+}
+
+// The start line names both sources as configured and every address served.
+TEST(StartLineTest, NamesSourcesAndAddresses) {
+    using platform::host::SourceChoice;
+    const struct {
+        const char* video;
+        const char* audio;
+        unsigned http;
+        const char* access;
+        const char* line;
+    } cases[] = {
+        {"pattern", "tone", 8080, "",
+         "serving picture: test pattern, sound: 1 kHz tone at rtsp://10.0.0.5:554/skyvo.0 and "
+         "http://10.0.0.5:8080/"},
+        {"x11", "pulse", 0, "",
+         "serving picture: the screen of $DISPLAY, sound: what the machine plays (PulseAudio) at "
+         "rtsp://10.0.0.5:554/skyvo.0"},
+        {"x11::1", "pulse:mic", 0, "",
+         "serving picture: the screen :1, sound: PulseAudio source mic at "
+         "rtsp://10.0.0.5:554/skyvo.0"},
+        {"v4l2", "alsa:hw:1,0", 0, "",
+         "serving picture: camera /dev/video0, sound: ALSA hw:1,0 at rtsp://10.0.0.5:554/skyvo.0"},
+        {"gst:videotestsrc pattern=ball", "none", 0, "",
+         "serving picture: GStreamer videotestsrc pattern=ball, sound: none at "
+         "rtsp://10.0.0.5:554/skyvo.0"},
+        {"none", "alsa", 8080, "users of /etc/orvex/users",
+         "serving picture: none (only what orvex-feed sends), sound: ALSA default at "
+         "rtsp://10.0.0.5:554/skyvo.0 and http://10.0.0.5:8080/; users of /etc/orvex/users"},
+    };
+    for (const auto& c : cases) {
+        SourceChoice video, audio;
+        ASSERT_TRUE(platform::host::ParseVideoSource(c.video, &video)) << c.video;
+        ASSERT_TRUE(platform::host::ParseAudioSource(c.audio, &audio)) << c.audio;
+        EXPECT_EQ(platform::host::StartLine(video, audio, "10.0.0.5", 554, c.http, c.access),
+                  c.line);
+    }
+    EXPECT_EQ(platform::host::ReachableAddress("192.168.7.2"), "192.168.7.2");
 }
 
 // A key that nothing reads is named with the known key it most likely meant.

@@ -286,6 +286,12 @@ TEST_F(ServerTest, SixthClientIsResetAtOnce) {
     RtspClient sixth("127.0.0.7", port);
     EXPECT_TRUE(sixth.ClosedWithoutAnswer());
     EXPECT_EQ(Clients(), 5);
+    std::vector<std::string> warnings;
+    for (const auto& e : fake.log.Entries()) {
+        if (e.priority >= platform::kLogWarn) warnings.push_back(e.text);
+    }
+    EXPECT_EQ(warnings, (std::vector<std::string>{"rtsp client 127.0.0.7 refused: 5 clients "
+                                                  "already watch, the most served"}));
     // The five are still served.
     EXPECT_NE(
         clients[0]->Exchange("OPTIONS " + url + " RTSP/1.0\r\nCSeq: 1\r\n\r\n").find("200 OK"),
@@ -304,6 +310,23 @@ TEST_F(ServerTest, ReconnectFromTheSameAddressReplacesTheOldSession) {
     Play(again, v.port(), a.port());
     ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 4; }));
     EXPECT_EQ(RecordedCalls(), (Calls{"video close", "audio close", "video open", "audio open"}));
+}
+
+// The connection is reset without an answer, as ever; the log names the key and the client.
+TEST_F(ServerTest, AMissingCaptureKeyIsOneWarningNamingIt) {
+    RtspClient c("127.0.0.2", port);
+    c.Send(
+        "DESCRIBE rtsp://127.0.0.1/skyvo.0?width=640&height=480&win=main&sub=0&dumpvideo=0"
+        "&dumpaudio=0&specialcase=none&framerate=30 RTSP/1.0\r\nCSeq: 2\r\n\r\n");
+    EXPECT_TRUE(c.ClosedWithoutAnswer());
+    std::vector<std::string> warnings;
+    for (const auto& e : fake.log.Entries()) {
+        if (e.priority >= platform::kLogWarn) warnings.push_back(e.text);
+    }
+    EXPECT_EQ(warnings, (std::vector<std::string>{
+                            "rtsp client 127.0.0.2: the URL has no 'cameraid=' key; every key of "
+                            "width, height, cameraid, win, sub, dumpvideo, dumpaudio, "
+                            "specialcase, framerate is needed"}));
 }
 
 TEST_F(ServerTest, BadOrSilentClientsAreClosedWithoutAnswer) {
@@ -550,6 +573,48 @@ TEST_F(ServerTest, CaptureHoldStartsCaptureAndOutlivesDepartingClients) {
     ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 8; }));
     EXPECT_EQ(RecordedCalls().back(), "audio close");
     EXPECT_EQ(listener->capture_holders(), 0);
+}
+
+// A client that connects and never plays (a player that gave up, a probe) does not keep a
+// hold's capture from starting: it waits a moment for the client's choice, then starts.
+TEST_F(ServerTest, CaptureHoldStartsCaptureBesideAClientThatNeverPlays) {
+    Socket::SetReadinessWaitMs(10000);  // as in service: the idle client stays for the test
+    RtspClient idle("127.0.0.2", port);
+    ASSERT_TRUE(WaitFor([this] { return Clients() == 1; }));
+    RtspTransport* listener = skyvo_rtsp_service()->listener();
+    listener->HoldCapture(kQuery);
+    EXPECT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+    EXPECT_EQ(RecordedCalls(), (Calls{"video open", "audio open"}));
+    EXPECT_EQ(Clients(), 1);
+    listener->ReleaseCapture();
+}
+
+// A viewer asking for a size the capture refuses would leave every consumer without a picture:
+// the last accepted size stays, and one warning says so.
+TEST_F(ServerTest, CaptureHoldWithARefusedSizeKeepsTheLastAcceptedOne) {
+    RtspTransport* listener = skyvo_rtsp_service()->listener();
+    listener->HoldCapture(kQuery);
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 2; }));
+    listener->ReleaseCapture();
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 4; }));
+    fake.log.Clear();
+    listener->HoldCapture("?width=1000&height=700");
+    ASSERT_TRUE(WaitFor([] { return RecordedCalls().size() == 6; }));
+    EXPECT_EQ(RecordedCalls().back(), "audio open");
+    unsigned width = 0, height = 0;
+    get_video_resolution(&width, &height);
+    EXPECT_EQ(width, 640u);
+    EXPECT_EQ(height, 480u);
+    std::vector<std::string> warnings;
+    for (const auto& e : fake.log.Entries()) {
+        if (e.priority >= platform::kLogWarn) warnings.push_back(e.text);
+    }
+    EXPECT_EQ(warnings, (std::vector<std::string>{
+                            "capture keys ?width=1000&height=700 ask for 1000x700, a size the "
+                            "capture refuses; keeping 640x480 (accepted on android: 640x480, "
+                            "720x576, 320x240, 480x320, 1280x720, 720x480, 720x400, 320x176, "
+                            "640x368, 1920x1080)"}));
+    listener->ReleaseCapture();
 }
 
 // Track numbers beyond int's range are unknown tracks, not arithmetic on them.
