@@ -206,6 +206,10 @@ void HostBinder::PoolLoop() {
             }
             continue;
         }
+        if (!FromOwnUser(fd)) {
+            close(fd);
+            continue;
+        }
         if (!TrackConnection(fd)) {
             close(fd);
             return;
@@ -215,6 +219,22 @@ void HostBinder::PoolLoop() {
         UntrackConnection(fd);
         close(fd);
     }
+}
+
+bool HostBinder::FromOwnUser(int fd) {
+    // An abstract name has no file whose mode keeps other users out, as the per-user folder
+    // did; the kernel's word on who connected does instead.
+    ucred peer{};
+    socklen_t len = sizeof peer;
+    if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &peer, &len) == 0 &&
+        (peer.uid == getuid() || peer.uid == 0)) {
+        return true;
+    }
+    if (!refused_told_.exchange(true)) {
+        HostLogf(kLogWarn, "binder: a connection from user %d refused: only %d and root may send",
+                 static_cast<int>(peer.uid), static_cast<int>(getuid()));
+    }
+    return false;
 }
 
 void HostBinder::Serve(int fd, BinderService& service) {

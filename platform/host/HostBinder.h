@@ -2,6 +2,7 @@
 
 #include <sys/types.h>
 
+#include <atomic>
 #include <cstdint>
 #include <map>
 #include <memory>
@@ -23,11 +24,12 @@ namespace host {
 //   request  uint32 code, uint32 flags, uint32 size, then `size` bytes of Parcel data
 //   reply    int32 status: what the service's onTransact returned
 //
-// All integers are little-endian. A size above kMaxTransactionSize is answered with kBadValue
-// and the connection is closed; a connection that ends, or stalls for kStallSeconds, in the
-// middle of a transaction is dropped without a reply. A pool thread serves one connection
-// until it closes, so transactions on different connections run concurrently and clients
-// beyond the pool's size wait in the listen backlog until a connection ends.
+// All integers are little-endian. Only this process's user and root may connect. A size above
+// kMaxTransactionSize is answered with kBadValue and the connection is closed; a connection
+// that ends, or stalls for kStallSeconds, in the middle of a transaction is dropped without a
+// reply. A pool thread serves one connection until it closes, so transactions on different
+// connections run concurrently and clients beyond the pool's size wait in the listen backlog
+// until a connection ends.
 //
 // A transaction to a service registered on this same object is dispatched in-process: its
 // onTransact runs on the caller's thread over the caller's bytes, as binder runs a call into
@@ -97,6 +99,7 @@ private:
     std::shared_ptr<BinderService> LocalService(const char* name);
     void PoolLoop();
     void Serve(int fd, BinderService& service);
+    bool FromOwnUser(int fd);
     bool TrackConnection(int fd);
     void UntrackConnection(int fd);
     Outgoing& OutgoingFor(const std::string& service);
@@ -108,6 +111,8 @@ private:
     std::string driver_;
     UniqueFd epoll_fd_;
     UniqueFd wake_fd_;  // an eventfd in the epoll set: readable once Stop begins
+
+    std::atomic<bool> refused_told_{false};  // another user's connection was logged once
 
     std::mutex mutex_;  // guards what follows
     bool stopping_ = false;

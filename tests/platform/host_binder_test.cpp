@@ -340,6 +340,39 @@ TEST(HostBinderNamingTest, EachNetworkNamespaceHasItsOwnServices) {
     EXPECT_EQ(WEXITSTATUS(status), 0) << "the service in a namespace of its own failed";
 }
 
+// An abstract name has no file mode to keep other users out: the service turns away a
+// connection from any user but its own and root, with no reply.
+TEST(HostBinderNamingTest, OtherUsersAreTurnedAway) {
+    if (getuid() != 0) GTEST_SKIP() << "taking another user's id needs root";
+    unsetenv("ORVEX_BINDER_DIR");
+    const std::string name = "orvex.test.user." + std::to_string(getpid());
+    auto service = std::make_shared<RecordingService>();
+    HostBinder server;
+    ASSERT_EQ(server.addService(name.c_str(), service), 0);
+    const pid_t child = fork();  // before any thread starts; it connects into the backlog
+    ASSERT_GE(child, 0);
+    if (child == 0) {
+        if (setgid(65534) != 0 || setuid(65534) != 0) _exit(2);
+        HostBinder client;
+        ParcelWriter p;
+        p.writeInt32(1);
+        _exit(client.transact(name.c_str(), 101, p) == HostBinder::kDeadObject ? 0 : 1);
+    }
+    server.startThreadPool();
+    int status = 0;
+    ASSERT_EQ(waitpid(child, &status, 0), child);
+    ASSERT_TRUE(WIFEXITED(status));
+    EXPECT_EQ(WEXITSTATUS(status), 0) << "the other user got an answer";
+    HostBinder client;
+    ParcelWriter p;
+    p.writeInt32(2);
+    EXPECT_EQ(client.transact(name.c_str(), 101, p), platform::kBinderOk);
+    server.Stop();
+    const auto got = service->Take();
+    ASSERT_EQ(got.size(), 1u) << "the other user's transaction reached the service";
+    EXPECT_EQ(got[0].data, Le32(2));
+}
+
 // The units one call gives, and the same input fed in chunks as orvex-feed reads it.
 std::vector<Bytes> Split(const Bytes& in, size_t chunk) {
     std::vector<Bytes> units;
