@@ -255,8 +255,9 @@ std::string AccessGate::Summary() const {
     } else if (m_gate == nullptr) {
         text = "nobody (the users file " + m_file + " is unusable)";
     } else {
-        text =
-            std::to_string(m_gate->users().size()) + " user(s) of " + m_file + " (Digest password)";
+        text = std::to_string(m_gate->users().size()) +
+               (m_gate->users().size() == 1 ? " user of " : " users of ") + m_file +
+               " (Digest passwords)";
     }
     if (m_allow_set) text += m_allow.everyone() ? "" : ", from kv.orvex.allow only";
     return text;
