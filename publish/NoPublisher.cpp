@@ -7,7 +7,7 @@
 #include "publish/Publisher.h"
 #include "service/OrvexLog.h"
 
-void StartPublishing(RtspTransport*) {
+void StartPublishing(stream::CaptureDemand*) {
     char value[platform::kPropertyValueMax] = {};
     platform::Properties().Get("kv.orvex.publish", value, "");
     if (value[strspn(value, " \t")] == '\0') return;

@@ -5,16 +5,14 @@
 #include <thread>
 
 #include "media/AnnexB.h"
-#include "media/MediaStreamMP4A.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "publish/PublishQueue.h"
-#include "rtp/h264_sps.h"
-#include "rtsp/CaptureQuery.h"
-#include "rtsp/RtspTransport.h"
 #include "service/OrvexLog.h"
 #include "service/ThreadName.h"
+#include "stream/CaptureChoice.h"
 #include "stream/KeyFrames.h"
+#include "stream/StreamFacts.h"
 
 namespace {
 
@@ -125,12 +123,14 @@ bool Publisher::Server::Connect(uint32_t time_ms) {
     target.sps = sps;
     target.pps = pps;
     uint16_t width = 0, height = 0;
-    if (h264_picture_size(sps.data(), sps.size(), &width, &height)) {
+    if (stream::PictureSize(sps.data(), sps.size(), &width, &height)) {
         target.width = width;
         target.height = height;
     }
+    target.audio_rate = static_cast<int>(stream::kAudioRate);
+    target.audio_channels = stream::kAudioChannels;
     uint8_t config[2];
-    MediaStreamMP4A::Config(target.audio_rate, target.audio_channels, config);
+    stream::AudioSpecificConfig(config);
     target.audio_config.assign(config, config + sizeof config);
     target.stop = &stop;
     std::string error;
@@ -169,7 +169,8 @@ void Publisher::Server::Lost(const char* what) {
                      url.url.c_str(), what, backoff_ms, max_backoff_ms / 1000);
 }
 
-Publisher::Publisher(RtspTransport* transport, std::vector<PublishUrl> urls, Options options)
+Publisher::Publisher(stream::CaptureDemand* transport, std::vector<PublishUrl> urls,
+                     Options options)
     : m_transport(transport),
       m_options(std::move(options)),
       m_gatherer(this, AccessUnitGatherer::Prefix::kStartCode, true, kMaxUnit) {
@@ -238,7 +239,7 @@ namespace {
 std::unique_ptr<Publisher> g_publisher;
 }
 
-void StartPublishing(RtspTransport* transport) {
+void StartPublishing(stream::CaptureDemand* transport) {
     char value[platform::kPropertyValueMax] = {};
     platform::Properties().Get("kv.orvex.publish", value, "");
     const std::vector<std::string> words = SplitPublishList(value);

@@ -9,9 +9,8 @@
 
 #include "media/AccessUnitGatherer.h"
 #include "publish/PublishUrl.h"
-#include "server/FrameTap.h"
-
-class RtspTransport;
+#include "stream/CaptureChoice.h"
+#include "stream/FrameTap.h"
 
 // Sends the live stream, as encoded, to media servers (kv.orvex.publish): RTMP as FLV, SRT as
 // MPEG-TS, through the platform's PublishPort. Capture is held while it runs, as a playing
@@ -33,7 +32,7 @@ public:
         std::string capture_query;  // what capture is held with, from its '?' on
     };
 
-    Publisher(RtspTransport* transport, std::vector<PublishUrl> urls, Options options);
+    Publisher(stream::CaptureDemand* transport, std::vector<PublishUrl> urls, Options options);
     ~Publisher() override;
     Publisher(const Publisher&) = delete;
     Publisher& operator=(const Publisher&) = delete;
@@ -51,7 +50,7 @@ private:
     void OnPicture(const AccessUnitGatherer::Picture& picture) override;
     void OnPictureLost(AccessUnitGatherer::Loss loss) override;
 
-    RtspTransport* m_transport;
+    stream::CaptureDemand* m_transport;
     Options m_options;
     std::vector<std::unique_ptr<Server>> m_servers;
     bool m_started = false;
@@ -66,5 +65,5 @@ int NextBackoffMs(int previous_ms, int first_ms, int max_ms);
 
 // The service's publisher, started when kv.orvex.publish names servers (unset: nothing
 // happens). Main thread.
-void StartPublishing(RtspTransport* transport);
+void StartPublishing(stream::CaptureDemand* transport);
 void StopPublishing();

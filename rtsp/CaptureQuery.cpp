@@ -31,22 +31,6 @@ unsigned WindowCode(const std::string& v) {
 
 unsigned Number(const std::string& v) { return static_cast<unsigned>(LeadingInt(v).value_or(0)); }
 
-// The value after "key=" at the query's start or after '?' or '&': letters, digits and '_', at
-// most 16 of them; empty when there is none.
-std::string ValueOf(const std::string& query, const char* key) {
-    const std::string name = std::string(key) + "=";
-    for (size_t at = query.find(name); at != std::string::npos; at = query.find(name, at + 1)) {
-        if (at != 0 && query[at - 1] != '?' && query[at - 1] != '&') continue;
-        size_t end = at + name.size();
-        while (end < query.size() && end - at - name.size() < 16 &&
-               (isalnum(static_cast<unsigned char>(query[end])) || query[end] == '_')) {
-            ++end;
-        }
-        return query.substr(at + name.size(), end - at - name.size());
-    }
-    return std::string();
-}
-
 }  // namespace
 
 const char kCaptureKeysText[] =
@@ -69,24 +53,4 @@ CaptureQueryResult ApplyCaptureQuery(const std::string& query, std::string* miss
         Number(values[4]), Number(values[5]), Number(values[6]),
         values[7] == "followmain" ? 1u : 0u, Number(values[8]));
     return refused != 0 ? CaptureQueryResult::kRefused : CaptureQueryResult::kApplied;
-}
-
-std::string CaptureQueryFor(const std::string& query) {
-    static const char* const kKeys[][2] = {
-        {"width", "1280"},  {"height", "720"},  {"cameraid", "hd0"}, {"win", "main"},
-        {"sub", "0"},       {"dumpvideo", "0"}, {"dumpaudio", "0"},  {"specialcase", "none"},
-        {"framerate", "30"}};
-    std::string out = "?";
-    for (const auto& key : kKeys) {
-        std::string value = ValueOf(query, key[0]);
-        if (value.empty()) value = key[1];
-        if (out.size() > 1) out += "&";
-        out += std::string(key[0]) + "=" + value;
-    }
-    return out;
-}
-
-void CaptureQuerySize(const std::string& query, unsigned* width, unsigned* height) {
-    *width = Number(ValueOf(query, "width"));
-    *height = Number(ValueOf(query, "height"));
 }

@@ -15,6 +15,7 @@
 #include "media/thread_mutex.h"
 #include "platform/UniqueFd.h"
 #include "rtsp/RtspAccess.h"
+#include "stream/CaptureChoice.h"
 
 class RtspSession;
 
@@ -29,7 +30,7 @@ void CloseVideoAndAudioDecodeAndSend();
 // Thread contract: Open and CloseAll from the controlling thread; the add_* producers from any
 // threads (the rings' producer contract, media/cycle_buffer.h); HoldCapture, ReleaseCapture and
 // Wake from any thread; everything else runs on the listener thread.
-class RtspTransport : public MediaSessionList {
+class RtspTransport : public MediaSessionList, public stream::CaptureDemand {
 public:
     RtspTransport();
     ~RtspTransport() override;
@@ -60,8 +61,8 @@ public:
     // stops it when no RTSP client is connected. `query` carries capture keys as an RTSP URL's
     // query does, from its '?' on; the listener applies it when no RTSP client is connected (empty:
     // keep the current choice). Any thread. With no hold ever taken the listener behaves as before.
-    void HoldCapture(const std::string& query);
-    void ReleaseCapture();
+    void HoldCapture(const std::string& query) override;
+    void ReleaseCapture() override;
     int capture_holders() const { return m_capture_holders.load(std::memory_order_relaxed); }
     // Listener rounds completed so far, so that a test can wait for rounds to pass.
     unsigned rounds() const { return m_rounds.load(std::memory_order_relaxed); }

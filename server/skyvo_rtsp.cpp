@@ -4,10 +4,10 @@
 #include <memory>
 #include <thread>
 
-#include "server/FrameTap.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_service.h"
 #include "service/OrvexLog.h"
+#include "stream/FrameTap.h"
 #include "stream/StreamFacts.h"
 
 namespace {

@@ -76,6 +76,16 @@ StreamFacts& Facts() {
     return *facts;
 }
 
+bool PictureSize(const uint8_t* sps, size_t len, uint16_t* width, uint16_t* height) {
+    return h264_picture_size(sps, len, width, height);
+}
+
+void AudioSpecificConfig(uint8_t out[2]) {
+    constexpr unsigned kObjectType = 2, kFrequencyIndex = 3;  // AAC LC, 48000 Hz
+    out[0] = static_cast<uint8_t>(kObjectType << 3 | kFrequencyIndex >> 1);
+    out[1] = static_cast<uint8_t>((kFrequencyIndex & 1) << 7 | kAudioChannels << 3);
+}
+
 std::string LiveH264Fmtp(const StreamFacts::Video& video) {
     std::string fmtp;
     if (video.sps.size() >= 4) {

@@ -44,6 +44,16 @@ private:
 StreamFacts& Facts();
 uint64_t SteadyMs();
 
+// The displayed size an SPS (NAL header byte first) gives; false when it gives none.
+bool PictureSize(const uint8_t* sps, size_t len, uint16_t* width, uint16_t* height);
+
+// The sound every platform's AAC encoder gives: AAC LC, 48 kHz, stereo.
+constexpr uint32_t kAudioRate = 48000;
+constexpr uint8_t kAudioChannels = 2;
+// Its AudioSpecificConfig (ISO/IEC 14496-3 1.6.2.1): object type 2, frequency index 3,
+// channel configuration 2: 0x11 0x90.
+void AudioSpecificConfig(uint8_t out[2]);
+
 // The a=fmtp parameters of an SDP that describes `video`: profile-level-id from its SPS,
 // sprop-parameter-sets (RFC 6184 §8.1), packetization-mode=1. Pure.
 std::string LiveH264Fmtp(const StreamFacts::Video& video);

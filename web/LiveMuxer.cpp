@@ -4,10 +4,9 @@
 #include <string>
 
 #include "media/AnnexB.h"
-#include "media/MediaStreamMP4A.h"
 #include "platform/LogPort.h"
-#include "rtp/h264_sps.h"
 #include "service/OrvexLog.h"
+#include "stream/StreamFacts.h"
 #include "web/Fmp4.h"
 
 namespace {
@@ -99,7 +98,7 @@ bool LiveMuxer::StartStream(uint32_t time_ms) {
     const std::vector<uint8_t>& pps = m_gatherer.pps();
     fmp4::VideoConfig video{};
     if (sps.empty() || pps.empty() ||
-        !h264_picture_size(sps.data(), sps.size(), &video.width, &video.height)) {
+        !stream::PictureSize(sps.data(), sps.size(), &video.width, &video.height)) {
         OrvexLogPriority(platform::kLogWarn, kTag,
                          "a key frame without a usable SPS and PPS: the web viewers wait for the "
                          "next");
@@ -110,10 +109,9 @@ bool LiveMuxer::StartStream(uint32_t time_ms) {
     video.pps = pps.data();
     video.pps_len = pps.size();
     fmp4::AudioConfig audio{};
-    // The AudioSpecificConfig the SDP announces for the RTP track.
-    MediaStreamMP4A::Config(kAudioRate, kAudioChannels, audio.asc);
-    audio.sample_rate = kAudioRate;
-    audio.channels = kAudioChannels;
+    stream::AudioSpecificConfig(audio.asc);
+    audio.sample_rate = stream::kAudioRate;
+    audio.channels = stream::kAudioChannels;
     const bool with_audio = AudioWanted(time_ms);
 
     const size_t need = 2048 + sps.size() + pps.size();
@@ -154,7 +152,7 @@ void LiveMuxer::OnAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) 
     if (static_cast<int32_t>(time_ms - m_last_seen_ms) > 1000) return;
     const int32_t since = static_cast<int32_t>(time_ms - m_origin_ms);
     if (since < 0) return;  // from before the stream's first picture
-    const uint64_t stamped = static_cast<uint64_t>(since) * (kAudioRate / 1000);
+    const uint64_t stamped = static_cast<uint64_t>(since) * (stream::kAudioRate / 1000);
     const int64_t drift = static_cast<int64_t>(stamped) - static_cast<int64_t>(m_audio_samples);
     if (!m_audio_running || std::llabs(drift) > kAudioResyncSamples) {
         m_audio_samples = stamped;

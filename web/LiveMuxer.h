@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "media/AccessUnitGatherer.h"
-#include "server/FrameTap.h"
+#include "stream/FrameTap.h"
 #include "web/FragmentRing.h"
 
 // Turns the encoded frames into the live fMP4 stream of the web viewers: NAL units are
@@ -16,9 +16,6 @@
 // serialises its sinks), so the muxer's own state needs no lock; the ring has its own.
 class LiveMuxer : public EncodedFrameSink, private AccessUnitGatherer::Sink {
 public:
-    static constexpr uint32_t kAudioRate = 48000;  // what both platforms' AAC encoders give
-    static constexpr uint8_t kAudioChannels = 2;
-
     explicit LiveMuxer(FragmentRing* ring);
 
     void OnVideoFrame(const uint8_t* data, size_t len, uint32_t time_ms) override;

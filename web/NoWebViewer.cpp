@@ -5,7 +5,7 @@
 #include "service/OrvexLog.h"
 #include "web/WebViewer.h"
 
-void StartWebViewer(RtspTransport*, auth::AccessGate*) {
+void StartWebViewer(stream::CaptureDemand*, auth::AccessGate*) {
     char value[platform::kPropertyValueMax] = {};
     platform::Properties().Get("kv.orvex.http", value, "");
     if (value[0] == '\0') return;

@@ -19,9 +19,6 @@
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
-#include "rtsp/CaptureQuery.h"
-#include "rtsp/KeyWordValue.h"
-#include "rtsp/RtspTransport.h"
 #include "service/Clocks.h"
 #include "service/OrvexLog.h"
 #include "web/WebPage.h"
@@ -81,11 +78,8 @@ constexpr const char* kUnauthorizedText =
 // Why the capture would refuse the size a query asks for, in words for the viewer; empty when
 // it takes it. Without this the viewer would wait for pictures that never come.
 std::string RefusedSize(const std::string& query) {
-    const std::string chosen = CaptureQueryFor(query);
-    const unsigned width =
-        static_cast<unsigned>(strtoul(getKeyWordValue("width=", chosen).c_str(), nullptr, 10));
-    const unsigned height =
-        static_cast<unsigned>(strtoul(getKeyWordValue("height=", chosen).c_str(), nullptr, 10));
+    unsigned width = 0, height = 0;
+    stream::CaptureQuerySize(stream::CaptureQueryFor(query), &width, &height);
     char board[platform::kPropertyValueMax] = {};
     platform::Properties().Get("ro.board.platform", board, "android");
     if (ResolutionCode(width, height, board) >= 0) return "";
@@ -265,7 +259,8 @@ struct WebViewerCalls {
                              static_cast<int>(refused.size() - 1), refused.c_str());
             return Reply(connection, 400, refused);
         }
-        if (self->m_transport != nullptr) self->m_transport->HoldCapture(CaptureQueryFor(query));
+        if (self->m_transport != nullptr)
+            self->m_transport->HoldCapture(stream::CaptureQueryFor(query));
         stream::AskForKeyFrame();  // a fresh key frame to start from, not the encoder's next
         auto* viewer = new StreamViewer{self, peer, {}, GetTimeStampMillsec()};
         std::string type;
@@ -329,7 +324,7 @@ struct WebViewerCalls {
     }
 };
 
-WebViewer::WebViewer(RtspTransport* transport, auth::AccessGate* gate, Options options)
+WebViewer::WebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, Options options)
     : m_transport(transport),
       m_options(options),
       m_ring(options.ring_bytes),
@@ -416,7 +411,7 @@ namespace {
 std::unique_ptr<WebViewer> g_web_viewer;
 }
 
-void StartWebViewer(RtspTransport* transport, auth::AccessGate* gate) {
+void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate) {
     char value[platform::kPropertyValueMax] = {};
     platform::Properties().Get("kv.orvex.http", value, "");
     if (value[0] == '\0') return;  // the television's default: no web viewer, no port

@@ -7,11 +7,11 @@
 
 #include "auth/AccessGate.h"
 #include "media/thread_mutex.h"
+#include "stream/CaptureChoice.h"
 #include "web/ConnectionWarden.h"
 #include "web/FragmentRing.h"
 #include "web/LiveMuxer.h"
 
-class RtspTransport;
 struct MHD_Daemon;
 struct MHD_Connection;
 
@@ -40,7 +40,7 @@ public:
 
     // `gate`: who may watch, shared with the RTSP side; null makes the viewer a gate of its own,
     // read from the properties at Start.
-    WebViewer(RtspTransport* transport, auth::AccessGate* gate, Options options);
+    WebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, Options options);
     ~WebViewer();
     WebViewer(const WebViewer&) = delete;
     WebViewer& operator=(const WebViewer&) = delete;
@@ -56,7 +56,7 @@ public:
 private:
     friend struct WebViewerCalls;  // libmicrohttpd's callbacks, in the source file
 
-    RtspTransport* m_transport;
+    stream::CaptureDemand* m_transport;
     Options m_options;
     FragmentRing m_ring;
     LiveMuxer m_muxer;
@@ -75,7 +75,7 @@ private:
 
 // The service's web viewer, started when kv.orvex.http names a port (unset: none, no port is
 // opened). kv.orvex.http.max: viewers at once (default 16). Main thread.
-void StartWebViewer(RtspTransport* transport, auth::AccessGate* gate);
+void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate);
 void StopWebViewer();
 // The port the service's web viewer listens on; 0 when there is none.
 unsigned WebViewerPort();

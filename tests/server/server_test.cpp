@@ -19,12 +19,12 @@
 #include "rtp/SendMP3Rtp.h"
 #include "rtsp/RtspResponse.h"
 #include "rtsp/RtspTransport.h"
-#include "server/FrameTap.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
 #include "service/Clocks.h"
 #include "service/OrvexLog.h"
+#include "stream/FrameTap.h"
 #include "tests/rtp/UdpReceiver.h"
 #include "tests/server/RtspClient.h"
 

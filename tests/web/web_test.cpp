@@ -18,7 +18,7 @@
 #include "platform/fake/FakePlatform.h"
 #include "rtsp/RtspAccess.h"
 #include "rtsp/RtspResponse.h"
-#include "server/FrameTap.h"
+#include "stream/FrameTap.h"
 #include "tests/web/HexBytes.h"
 #include "web/ConnectionWarden.h"
 #include "web/FragmentRing.h"

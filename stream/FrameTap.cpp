@@ -1,4 +1,4 @@
-#include "server/FrameTap.h"
+#include "stream/FrameTap.h"
 
 #include <atomic>
 #include "media/thread_mutex.h"
