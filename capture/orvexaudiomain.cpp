@@ -2,6 +2,7 @@
 
 #include <pthread.h>
 #include <unistd.h>
+#include <functional>
 
 #include <memory>
 #include <vector>
@@ -190,33 +191,38 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
     AACENC_PARAM params{48000, 128000, 2, 1};  // ADTS headers on
 
     platform::AacLibraryPort& library = platform::AacLibrary();
-    void* handle = library.open();
+    // Closed on every way out, before the closing trace.
+    std::unique_ptr<void, std::function<void(void*)>> handle(
+        library.open(), [&library](void* h) { library.close(h); });
     if (handle == nullptr) {
         OrvexPrint("open dll error......");
         return -1;
     }
-    auto get_api = reinterpret_cast<VoGetAacEncApi>(library.symbol(handle, "voGetAACEncAPI"));
+    auto get_api = reinterpret_cast<VoGetAacEncApi>(library.symbol(handle.get(), "voGetAACEncAPI"));
     if (get_api == nullptr) {
-        library.close(handle);
+        handle.reset();
         OrvexPrint("open function error......");
         return -1;
     }
     VO_AUDIO_CODECAPI api{};
     if (get_api(&api) != 0) {
-        library.close(handle);
+        handle.reset();
         OrvexPrint("pGetAPI function return error");
         return -1;
     }
     VO_HANDLE codec = nullptr;
     if (static_cast<int32_t>(api.Init(&codec, kVoAudioCodingAac, &user)) < 0) {
-        library.close(handle);
+        handle.reset();
         OrvexPrint("#### VOI_Error2:fail to initialize the Encoderr###");
         return -1;
     }
     api.SetParam(codec, kVoPidAacEncParam, &params);
 
-    static unsigned char input[kPcmBlockBytes];
-    static unsigned char output[kPcmBlockBytes];
+    // This thread's own blocks, taken once per start: a second start stops the first thread,
+    // but buffers of its own keep the two from ever sharing one.
+    std::vector<unsigned char> input_block(kPcmBlockBytes), output_block(kPcmBlockBytes);
+    unsigned char* const input = input_block.data();
+    unsigned char* const output = output_block.data();
     const bool wake_on_write = Global_Config::instance()->wake_on_write();
     const bool by_samples = Global_Config::instance()->audio_clock_samples();
     AudioSampleClock clock(static_cast<unsigned>(params.sampleRate), kAacFrameSamples);
@@ -253,7 +259,7 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
         }
     }
     api.Uninit(codec);
-    library.close(handle);
+    handle.reset();
     OrvexPrint("\n exit audio_aac_enc ");
     return 0;
 }
