@@ -19,8 +19,10 @@ size_t StartCodeLength(const uint8_t* p, size_t len);
 // Calls f(nal, nal_len) for each NAL unit of an Annex B buffer, start codes (and the zero
 // byte of a 4-byte start code that follows) left out; a buffer with no start code is one bare
 // NAL unit. Empty NAL units are skipped.
+// The same walk for as long as f(nal, nal_len) returns true: a reader that wants only what
+// stands before the first slice stops there without scanning the rest.
 template <typename F>
-void ForEachNalUnit(const uint8_t* data, size_t len, F&& f) {
+void ForEachNalUnitWhile(const uint8_t* data, size_t len, F&& f) {
     size_t pos = FindStartCode(data, len, 0);
     if (pos == len) {
         if (len > 0) f(data, len);
@@ -31,9 +33,17 @@ void ForEachNalUnit(const uint8_t* data, size_t len, F&& f) {
         const size_t next = FindStartCode(data, len, start);
         size_t end = next;
         while (end > start && data[end - 1] == 0) --end;  // the next start code's leading zero
-        if (end > start) f(data + start, end - start);
+        if (end > start && !f(data + start, end - start)) return;
         pos = next;
     }
+}
+
+template <typename F>
+void ForEachNalUnit(const uint8_t* data, size_t len, F&& f) {
+    ForEachNalUnitWhile(data, len, [&f](const uint8_t* nal, size_t nal_len) {
+        f(nal, nal_len);
+        return true;
+    });
 }
 
 // The raw AAC frame behind an ADTS header (7 bytes, 9 with a CRC), in place; a frame without

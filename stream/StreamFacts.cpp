@@ -19,24 +19,19 @@ void StreamFacts::Note(const uint8_t* data, size_t len, uint64_t now_ms) {
     const uint8_t* sps = nullptr;
     const uint8_t* pps = nullptr;
     size_t sps_len = 0, pps_len = 0;
-    size_t pos = FindStartCode(data, len, 0);
-    while (pos < len) {
-        const size_t start = pos + 3;
-        if (start >= len) break;
-        const unsigned type = data[start] & 0x1F;
-        if (type >= 1 && type <= 5) break;  // parameter sets come before the slices
-        const size_t next = FindStartCode(data, len, start);
-        size_t end = next;
-        while (end > start && data[end - 1] == 0) --end;
+    // Parameter sets come before the slices: the walk ends at the first one.
+    ForEachNalUnitWhile(data, len, [&](const uint8_t* nal, size_t nal_len) {
+        const unsigned type = nal[0] & 0x1F;
+        if (type >= 1 && type <= 5) return false;
         if (type == 7) {
-            sps = data + start;
-            sps_len = end - start;
+            sps = nal;
+            sps_len = nal_len;
         } else if (type == 8) {
-            pps = data + start;
-            pps_len = end - start;
+            pps = nal;
+            pps_len = nal_len;
         }
-        pos = next;
-    }
+        return true;
+    });
     thread_mutex::Scoped hold(m_lock);
     m_video.last_frame_ms = now_ms;
     if (sps == nullptr && pps == nullptr) return;
