@@ -175,19 +175,15 @@ for slices in 1 4; do
   "$build/orvex-feed" --loop "$work/high.h264" 2>"$work/feed.log" &
   feeder=$!
   sleep 2.5
-  line=$(join_check "$(url 1280 720)")
-  [[ $(sed 's/.*frames=\([0-9]*\).*/\1/' <<<"$line") -ge 140 && $line == *complaints=0 ]] ||
-    fail "x264 High, $slices slice(s), joined over RTSP: $line"
-  ok "x264 High profile 1280x720, $slices slice(s) a picture, joined mid-stream over RTSP: $line"
-  if [[ $slices == 1 ]]; then
-    log=$(timeout -k 5 25 ffmpeg -hide_banner -nostats -i "http://127.0.0.1:8080/stream.mp4" \
-      -map 0:v -t 5 -f null - 2>&1) || true
-    frames=$(grep -o 'frame= *[0-9]*' <<<"$log" | tail -1 | grep -o '[0-9]*$')
-    errors=$(grep -ciE 'error|concealing|non-existing|missing|no frame' <<<"$log" || true)
-    [[ ${frames:-0} -ge 140 && $errors -eq 0 ]] ||
-      fail "x264 High joined from /stream.mp4: ${frames:-0} frames, $errors complaints"
-    ok "x264 High profile joined mid-stream from /stream.mp4: $frames frames of 5 s, no complaint"
-  fi
+  join_check "$(url 1280 720)" 140 \
+    "x264 High profile 1280x720, $slices slice(s) a picture, joined mid-stream over RTSP"
+  log=$(timeout -k 5 25 ffmpeg -hide_banner -nostats -i "http://127.0.0.1:8080/stream.mp4" \
+    -map 0:v -t 5 -f null - 2>&1) || true
+  frames=$(grep -o 'frame= *[0-9]*' <<<"$log" | tail -1 | grep -o '[0-9]*$')
+  errors=$(grep -ciE 'error|concealing|non-existing|missing|no frame' <<<"$log" || true)
+  [[ ${frames:-0} -ge 140 && $errors -eq 0 ]] ||
+    fail "x264 High, $slices slice(s), joined from /stream.mp4: ${frames:-0} frames, $errors complaints"
+  ok "x264 High profile, $slices slice(s) a picture, joined mid-stream from /stream.mp4: $frames frames of 5 s, no complaint"
   kill "$feeder" 2>/dev/null || true
   wait "$feeder" 2>/dev/null || true
   stop 1
