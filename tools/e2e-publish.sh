@@ -165,7 +165,7 @@ sleep 2
 log=$(timeout -k 5 25 ffmpeg -hide_banner -nostats -i "$rtmp" -map 0:v -t 5 -f null - 2>&1) || true
 frames=$(grep -o 'frame= *[0-9]*' <<<"$log" | tail -1 | grep -o '[0-9]*$')
 errors=$(grep -ciE 'error|concealing|non-existing|missing|no frame' <<<"$log" || true)
-[[ ${frames:-0} -ge 140 && $errors -eq 0 ]] ||
+[[ ${frames:-0} -ge 100 && $errors -eq 0 ]] ||
   fail "x264 High in 4 slices through nginx: ${frames:-0} frames, $errors complaints: $(grep -iE 'error|missing' <<<"$log" | head -2)"
 ok "x264 High profile, 4 slices a picture, joined mid-stream through nginx over RTMP: $frames frames of 5 s, no complaint"
 kill "$feeder" 2>/dev/null || true
