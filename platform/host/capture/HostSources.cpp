@@ -165,8 +165,13 @@ std::string VideoPipeline(const SourceChoice& source, int width, int height, int
     return VideoPipelineTo(source, width, height, fps, kAppSink);
 }
 
-std::string VideoConversion(int width, int height, int fps) {
-    return ConversionTo(width, height, fps, kAppSink);
+std::string VideoConversion(int width, int height) {
+    // No videorate: PipeWire sends a picture when the screen changes, often without a time
+    // stamp videorate would accept, and the recorder sends the last picture again anyway.
+    return "videoconvert ! videoscale add-borders=true ! "
+           "video/x-raw,format=I420,colorimetry=bt601,width=" +
+           std::to_string(width) + ",height=" + std::to_string(height) +
+           ",pixel-aspect-ratio=1/1 ! " + kAppSink;
 }
 
 std::string ChildVideoPipeline(const SourceChoice& source, int width, int height, int fps) {

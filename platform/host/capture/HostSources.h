@@ -50,8 +50,8 @@ std::string VideoPipeline(const SourceChoice& source, int width, int height, int
 // empty for sources that run in this process.
 std::string ChildVideoPipeline(const SourceChoice& source, int width, int height, int fps);
 // The end of a video pipeline, from the first converter to the appsink, for pictures that come
-// through PipeWire (GstSource::startScreen).
-std::string VideoConversion(int width, int height, int fps);
+// through PipeWire (GstSource::startScreen): I420 of exactly width x height, as they come.
+std::string VideoConversion(int width, int height);
 std::string AudioPipeline(const SourceChoice& source);
 
 }  // namespace host

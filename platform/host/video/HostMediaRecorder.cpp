@@ -196,7 +196,7 @@ bool HostMediaRecorder::startLive(bool wait_first, std::string* error) {
     bool started = false;
     if (source_.throughPipeWire()) {
         started = live->startScreen(source_.kind == SourceChoice::kPipeWire ? source_.arg : "",
-                                    VideoConversion(w, h, fps_), error, wait_first);
+                                    VideoConversion(w, h), error, wait_first);
     } else if (child.empty()) {
         started = live->start(VideoPipeline(source_, w, h, fps_), error, wait_first);
     } else {

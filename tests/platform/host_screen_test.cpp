@@ -1,0 +1,256 @@
+#include <gtest/gtest.h>
+
+#include <signal.h>
+#include <spawn.h>
+#include <stdlib.h>
+#include <sys/stat.h>
+#include <sys/wait.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <cstdint>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include "platform/host/capture/GstSource.h"
+#include "platform/host/capture/HostSources.h"
+#include "platform/host/video/HostCamera.h"
+#include "platform/host/video/HostMediaRecorder.h"
+#include "tests/platform/HostPortsTest.h"
+
+// GLib's allocations while it is loaded belong to the library.
+extern "C" const char* __lsan_default_suppressions() { return "leak:_dl_init\n"; }
+
+extern char** environ;
+
+namespace {
+
+using platform::host::GstSource;
+using platform::host::SourceChoice;
+using Clock = std::chrono::steady_clock;
+
+template <typename F>
+bool WaitFor(F done, int seconds = 10) {
+    auto end = Clock::now() + std::chrono::seconds(seconds);
+    while (!done()) {
+        if (Clock::now() > end) return false;
+        std::this_thread::sleep_for(std::chrono::milliseconds(10));
+    }
+    return true;
+}
+
+// `command` run by sh in a process group of its own, so that everything it starts ends with it.
+pid_t Spawn(const std::string& command) {
+    posix_spawnattr_t attr;
+    posix_spawnattr_init(&attr);
+    posix_spawnattr_setpgroup(&attr, 0);
+    posix_spawnattr_setflags(&attr, POSIX_SPAWN_SETPGROUP);
+    const char* argv[] = {"sh", "-c", command.c_str(), nullptr};
+    pid_t pid = -1;
+    int rc = posix_spawnp(&pid, "sh", nullptr, &attr, const_cast<char**>(argv), environ);
+    posix_spawnattr_destroy(&attr);
+    return rc == 0 ? pid : -1;
+}
+
+void End(pid_t* pid) {
+    if (*pid <= 0) return;
+    kill(-*pid, SIGKILL);
+    waitpid(*pid, nullptr, 0);
+    *pid = -1;
+}
+
+bool Installed(const char* command) {
+    return system((std::string("command -v ") + command + " >/dev/null 2>&1").c_str()) == 0;
+}
+
+// A session of our own: a session bus, PipeWire and WirePlumber (which links a consumer to the
+// node it names) under a private XDG_RUNTIME_DIR, and no compositor. A producer is
+// gst-launch-1.0 with pipewiresink offering a node of the given name.
+class HostScreenTest : public HostPortsTest {
+protected:
+    static void SetUpTestSuite() {
+        for (const char* tool : {"dbus-daemon", "pipewire", "wireplumber", "gst-launch-1.0"}) {
+            if (!Installed(tool)) {
+                missing_ = std::string(tool) + " is not installed (tools/install-deps.sh ci)";
+                return;
+            }
+        }
+        if (system("gst-inspect-1.0 pipewiresrc >/dev/null 2>&1") != 0) {
+            missing_ = "GStreamer's PipeWire elements are not installed (gstreamer1.0-pipewire)";
+            return;
+        }
+        char dir[] = "/tmp/orvex-screen-XXXXXX";
+        runtime_ = mkdtemp(dir);
+        chmod(runtime_.c_str(), 0700);
+        setenv("XDG_RUNTIME_DIR", runtime_.c_str(), 1);
+        setenv("DBUS_SESSION_BUS_ADDRESS", ("unix:path=" + runtime_ + "/bus").c_str(), 1);
+        unsetenv("WAYLAND_DISPLAY");
+        session_ = Spawn(
+            "dbus-daemon --session --nofork --address=$DBUS_SESSION_BUS_ADDRESS & "
+            "pipewire & sleep 0.3; wireplumber & wait");
+        const std::string socket = runtime_ + "/pipewire-0";
+        if (!WaitFor([&] { return access(socket.c_str(), F_OK) == 0; })) {
+            missing_ = "pipewire did not start";
+        }
+    }
+    static void TearDownTestSuite() {
+        End(&session_);
+        if (!runtime_.empty()) system(("rm -rf " + runtime_).c_str());
+    }
+    void SetUp() override {
+        if (!missing_.empty()) GTEST_SKIP() << missing_;
+        HostPortsTest::SetUp();
+    }
+    void TearDown() override {
+        End(&producer_);
+        HostPortsTest::TearDown();
+    }
+
+    void Produce(const std::string& name, const char* framerate) {
+        End(&producer_);
+        producer_ = Spawn(std::string("exec gst-launch-1.0 -q videotestsrc pattern=solid-color "
+                                      "foreground-color=0xffff0000 is-live=true ! "
+                                      "video/x-raw,format=BGRx,width=320,height=240,framerate=") +
+                          framerate +
+                          " ! pipewiresink mode=provide stream-properties=\"p,node.name=" + name +
+                          "\" >/dev/null 2>&1");
+        // pipewiresrc waits long in its start for a node that is not there yet.
+        const std::string listed = "pw-cli ls Node | grep -q 'node.name = \"" + name + "\"'";
+        ASSERT_TRUE(WaitFor([&] { return system(listed.c_str()) == 0; }));
+    }
+
+    static std::string missing_;
+    static std::string runtime_;
+    static pid_t session_;
+    pid_t producer_ = -1;
+};
+
+std::string HostScreenTest::missing_;
+std::string HostScreenTest::runtime_;
+pid_t HostScreenTest::session_ = -1;
+
+TEST(HostScreenValues, ScreenIsWaylandWhenTheSessionSaysSo) {
+    struct Case {
+        const char* wayland_display;
+        const char* session_type;
+        SourceChoice::Kind kind;
+    };
+    const Case cases[] = {
+        {nullptr, nullptr, SourceChoice::kX11},
+        {"wayland-0", nullptr, SourceChoice::kWayland},
+        {nullptr, "wayland", SourceChoice::kWayland},
+        {"", "x11", SourceChoice::kX11},
+        {"", "tty", SourceChoice::kX11},
+        // A Wayland session whose X applications run on Xwayland still casts through PipeWire.
+        {"wayland-1", "x11", SourceChoice::kWayland},
+    };
+    for (const Case& c : cases) {
+        EXPECT_EQ(platform::host::ScreenKind(c.wayland_display, c.session_type), c.kind)
+            << (c.wayland_display ? c.wayland_display : "(unset)") << " "
+            << (c.session_type ? c.session_type : "(unset)");
+    }
+}
+
+// A moving picture and a still one (a picture every 5 s, as a screen nobody touches): both
+// arrive converted, and the still one is not taken for a lost source, since pipewiresrc sends
+// its last picture again while nothing new comes.
+TEST_F(HostScreenTest, ANodesPicturesArriveAndAStillNodeIsNotLost) {
+    struct Case {
+        const char* node;
+        const char* framerate;
+    };
+    const Case cases[] = {{"orvex-still", "1/5"}, {"orvex-moving", "30/1"}};
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.node);
+        ASSERT_NO_FATAL_FAILURE(Produce(c.node, c.framerate));
+        GstSource live;
+        std::string error;
+        ASSERT_TRUE(
+            live.startScreen(c.node, platform::host::VideoConversion(160, 120), &error, false))
+            << error;
+        std::vector<uint8_t> picture(160 * 120 * 3 / 2, 0);
+        ASSERT_TRUE(WaitFor([&] { return live.latestFrame(picture.data(), 160, 120); }, 30));
+        // Red, BT.601 limited range: Y 81, U 90, V 240.
+        EXPECT_NEAR(picture[80 * 60], 81, 6);
+        EXPECT_NEAR(picture[160 * 120 + 40 * 30], 90, 6);
+        EXPECT_NEAR(picture[160 * 120 * 5 / 4 + 40 * 30], 240, 6);
+        int fresh = 0;
+        std::string why;
+        for (auto end = Clock::now() + std::chrono::seconds(6); Clock::now() < end;) {
+            ASSERT_FALSE(live.ended(&why)) << why;
+            fresh += live.latestFrame(picture.data(), 160, 120);
+            std::this_thread::sleep_for(std::chrono::milliseconds(33));
+        }
+        EXPECT_GE(fresh, 5);
+    }
+}
+
+// The node's producer goes away and comes back: one line naming the source, "no signal" at the
+// asked rate meanwhile, and the picture back without a new start.
+TEST_F(HostScreenTest, ALostNodeShowsNoSignalAndComesBack) {
+    ASSERT_NO_FATAL_FAILURE(Produce("orvex-lost", "30/1"));
+    properties_.Set("orvex.host.video", "pipewire:orvex-lost");
+    platform::host::HostCamera camera;
+    camera.unlock();
+    platform::host::HostMediaRecorder r;
+    ASSERT_EQ(r.setCamera(camera), 0);
+    ASSERT_EQ(r.setVideoSource(1), 0);
+    ASSERT_EQ(r.setOutputFormat(101), 0);
+    ASSERT_EQ(r.setVideoEncoder(2), 0);
+    ASSERT_EQ(r.setVideoSize(320, 240), 0);
+    ASSERT_EQ(r.setVideoFrameRate(30), 0);
+    ASSERT_EQ(r.prepare(), 0);
+    ASSERT_EQ(r.start(), 0);
+    ASSERT_TRUE(WaitFor([&] { return binder_.frames.load() >= 30; }));
+    End(&producer_);
+    ASSERT_TRUE(WaitFor([&] { return !Lines("stopped").empty(); }));
+    int after = binder_.frames.load();
+    EXPECT_TRUE(WaitFor([&] { return binder_.frames.load() >= after + 30; }, 3));
+    Produce("orvex-lost", "30/1");
+    EXPECT_TRUE(WaitFor([&] { return !Lines("is back").empty(); }, 20));
+    EXPECT_EQ(r.stop(), 0);
+    EXPECT_EQ(Lines("stopped"),
+              (std::vector<std::string>{"MediaRecorder: video source pipewire:orvex-lost stopped: "
+                                        "no picture from PipeWire for 4 s; showing \"no signal\", "
+                                        "trying again in 1 s"}));
+}
+
+// Without a desktop to ask, a Wayland screen cannot start: one line says why (nobody offers a
+// screen cast here; no bus at all), and the picture is "no signal".
+TEST_F(HostScreenTest, AWaylandScreenWithoutADesktopSaysWhyInOneLine) {
+    struct Case {
+        const char* bus;  // null: the session's own
+        const char* reason;
+    };
+    const Case cases[] = {
+        {nullptr, "org.gnome.Mutter.ScreenCast was not provided by any .service files"},
+        {"unix:path=/nonexistent/orvex-bus", "no session bus"},
+    };
+    const std::string own = getenv("DBUS_SESSION_BUS_ADDRESS");
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.reason);
+        log_.Clear();
+        setenv("DBUS_SESSION_BUS_ADDRESS", c.bus != nullptr ? c.bus : own.c_str(), 1);
+        properties_.Set("orvex.host.video", "wayland");
+        platform::host::HostCamera camera;
+        camera.unlock();
+        platform::host::HostMediaRecorder r;
+        ASSERT_EQ(r.setCamera(camera), 0);
+        ASSERT_EQ(r.setOutputFormat(101), 0);
+        ASSERT_EQ(r.setVideoEncoder(2), 0);
+        ASSERT_EQ(r.setVideoSize(320, 240), 0);
+        ASSERT_EQ(r.prepare(), 0);
+        ASSERT_EQ(r.start(), 0);
+        // A slow portal may leave the answer to the recording thread.
+        ASSERT_TRUE(WaitFor([&] { return !Lines(c.reason).empty(); }, 15));
+        EXPECT_TRUE(WaitFor([&] { return binder_.frames.load() >= 10; }));
+        EXPECT_EQ(r.release(), 0);
+        std::vector<std::string> lines = Lines(c.reason);
+        ASSERT_EQ(lines.size(), 1u);
+        EXPECT_EQ(lines[0].compare(0, 35, "MediaRecorder: video source wayland"), 0) << lines[0];
+    }
+    setenv("DBUS_SESSION_BUS_ADDRESS", own.c_str(), 1);
+}
+
+}  // namespace
