@@ -217,7 +217,7 @@ TEST_F(HostScreenTest, ALostNodeShowsNoSignalAndComesBack) {
 }
 
 // Without a desktop to ask, a Wayland screen cannot start: one line says why (nobody offers a
-// screen cast here; no bus at all), and the picture is "no signal".
+// screen cast here; no bus at all), the picture is "no signal", and the desktop is asked again.
 TEST_F(HostScreenTest, AWaylandScreenWithoutADesktopSaysWhyInOneLine) {
     struct Case {
         const char* bus;  // null: the session's own
@@ -245,8 +245,13 @@ TEST_F(HostScreenTest, AWaylandScreenWithoutADesktopSaysWhyInOneLine) {
         // A slow portal may leave the answer to the recording thread.
         ASSERT_TRUE(WaitFor([&] { return !Lines(c.reason).empty(); }, 15));
         EXPECT_TRUE(WaitFor([&] { return binder_.frames.load() >= 10; }));
+        // And it is asked for again, quietly, while the picture goes on.
+        EXPECT_TRUE(WaitFor([&] { return !Lines("still failing").empty(); }));
         EXPECT_EQ(r.release(), 0);
-        std::vector<std::string> lines = Lines(c.reason);
+        std::vector<std::string> lines;
+        for (const std::string& line : Lines(c.reason)) {
+            if (line.find("still failing") == std::string::npos) lines.push_back(line);
+        }
         ASSERT_EQ(lines.size(), 1u);
         EXPECT_EQ(lines[0].compare(0, 35, "MediaRecorder: video source wayland"), 0) << lines[0];
     }

@@ -71,7 +71,7 @@ public:
                      std::string* error) override;
     bool waiting() const override { return screen_ && pipeline_ == nullptr; }
     void stop() override;
-    bool running() const override { return pipeline_ != nullptr; }
+    bool running() const override { return pipeline_ != nullptr || screen_; }
     bool ended(std::string* why) override;
     bool latestFrame(uint8_t* i420, int width, int height) override;
     uint64_t lastFrameTimeNs() const override { return last_pts_ns_; }

@@ -182,7 +182,8 @@ void ScreenCast::OnSignal(GDBusConnection*, const char*, const char* path, const
         g_variant_get(params, "(u)", &self->added_node_);
         self->node_seen_ = true;
     } else if (signal == "Closed") {
-        self->fail("the desktop ended the screen cast (stopped or revoked)");
+        self->fail(
+            "the desktop closed the screen cast (the compositor stopping, or the cast revoked)");
     } else if (signal == "NameOwnerChanged") {
         const char *name = nullptr, *old_owner = nullptr, *new_owner = nullptr;
         g_variant_get(params, "(&s&s&s)", &name, &old_owner, &new_owner);

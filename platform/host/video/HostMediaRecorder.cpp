@@ -237,6 +237,8 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
         }
         if (ended && trying_) {
             // Another attempt that failed: quietly, as the first failure said it all.
+            HostLogf(kLogDebug, "MediaRecorder: video source %s: still failing: %s",
+                     source_.text.c_str(), why.empty() ? "no picture" : why.c_str());
             live_.reset();
             trying_ = false;
             retryLater(std::min(retry_ms_ * 2, kRetryMaxMs));
@@ -257,6 +259,8 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
             trying_ = true;
             trying_until_ms_ = now + kFirstFrameMs;
         } else {
+            HostLogf(kLogDebug, "MediaRecorder: video source %s: still failing: %s",
+                     source_.text.c_str(), error.c_str());
             retryLater(std::min(retry_ms_ * 2, kRetryMaxMs));
         }
     }
