@@ -6,7 +6,8 @@
 # decodes the stream: the colour, the frame rate of a still screen, a change of colour, and the
 # compositor stopped and started again while a client plays. Runs in its own network namespace.
 #   tools/e2e-wayland.sh [BUILD_DIR]           the check (needs root: namespace, port 554)
-#   tools/e2e-wayland.sh [BUILD_DIR] measure   CPU and memory of the casting, frame rate
+#   tools/e2e-wayland.sh [BUILD_DIR] measure   CPU and memory of the casting, frame rate, and
+#                                              the delay from a picture drawn to it decoded
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
@@ -96,7 +97,7 @@ sleep 0.5
 if [[ $mode == measure ]]; then
   # CPU (user + system) and resident memory of orvex, which runs no child for this screen.
   hz=$(getconf CLK_TCK)
-  for scene in "still:" "moving:pattern=ball"; do
+  for scene in "still:" "ball:pattern=ball" "bars:pattern=smpte horizontal-speed=4"; do
     if [[ -n ${scene#*:} ]]; then
       gst-launch-1.0 -q videotestsrc ${scene#*:} is-live=true \
         ! "video/x-raw,width=1280,height=720,framerate=30/1" ! waylandsink fullscreen=true \
@@ -116,12 +117,23 @@ if [[ $mode == measure ]]; then
     wait "$client" || true
     frames=$(ffprobe -v error -count_frames -select_streams v:0 \
       -show_entries stream=nb_read_frames -of csv=p=0 "$work/video.h264")
-    echo "e2e-wayland: measure: 1280x720@30, ${scene%%:*} 1280x720 Wayland screen:" \
+    [[ -n ${scene#*:} ]] && { kill "$scene_pid"; wait "$scene_pid" 2>/dev/null || true; }
+    echo "e2e-wayland: measure: 1280x720@30, ${scene%%:*} on a 1280x720 Wayland screen:" \
       "orvex CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core, RSS ${rss} MiB," \
       "$(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}') fps, no child process" \
       "(load average $(cut -d' ' -f1 /proc/loadavg) on $(nproc) cores)"
     sleep 2
   done
+  # The delay from a picture drawn to it decoded: the pattern with its capture stamps (in this
+  # machine's monotonic clock) shown full screen, read back from the stream by rtsp_check.py.
+  "$build/orvex-pattern" 1280 720 30 | gst-launch-1.0 -q fdsrc blocksize=1382400 \
+    ! rawvideoparse format=i420 width=1280 height=720 framerate=30/1 ! videoconvert \
+    ! waylandsink fullscreen=true sync=false >"$work/scene.log" 2>&1 &
+  pids+=($!)
+  sleep 3
+  echo "e2e-wayland: measure: delay from the pattern drawn to the picture decoded," \
+    "through a window, mutter, PipeWire, orvex and ffmpeg, 1280x720@30:" \
+    "$(python3 "$top/tools/rtsp_check.py" latency "$(url 1280 720)" 15)"
   exit 0
 fi
 
