@@ -174,17 +174,22 @@ void ScreenCast::OnSignal(GDBusConnection*, const char*, const char* path, const
                           const char* member, GVariant* params, gpointer data) {
     auto* self = static_cast<ScreenCast*>(data);
     const std::string signal(member);
-    if (signal == "Response" && self->request_path_ == path) {
+    // Whatever else is on the bus may send a signal of the same name: only the expected shape
+    // is read.
+    auto shaped = [params](const char* type) {
+        return g_variant_is_of_type(params, G_VARIANT_TYPE(type));
+    };
+    if (signal == "Response" && self->request_path_ == path && shaped("(ua{sv})")) {
         if (self->results_ != nullptr) g_variant_unref(self->results_);
         g_variant_get(params, "(u@a{sv})", &self->response_, &self->results_);
         self->answered_ = true;
-    } else if (signal == "PipeWireStreamAdded") {
+    } else if (signal == "PipeWireStreamAdded" && shaped("(u)")) {
         g_variant_get(params, "(u)", &self->added_node_);
         self->node_seen_ = true;
     } else if (signal == "Closed") {
         self->fail(
             "the desktop closed the screen cast (the compositor stopping, or the cast revoked)");
-    } else if (signal == "NameOwnerChanged") {
+    } else if (signal == "NameOwnerChanged" && shaped("(sss)")) {
         const char *name = nullptr, *old_owner = nullptr, *new_owner = nullptr;
         g_variant_get(params, "(&s&s&s)", &name, &old_owner, &new_owner);
         if (new_owner[0] == '\0') {
@@ -194,6 +199,10 @@ void ScreenCast::OnSignal(GDBusConnection*, const char*, const char* path, const
 }
 
 void ScreenCast::watch(const char* name, const char* session_path, const char* session_interface) {
+    // A portal given up on half way is watched no more once GNOME's service is.
+    for (guint* id : {&subscriptions_[2], &subscriptions_[3]}) {
+        if (*id != 0) g_dbus_connection_signal_unsubscribe(bus_, *id);
+    }
     subscriptions_[2] = g_dbus_connection_signal_subscribe(
         bus_, name, session_interface, "Closed", session_path, nullptr, G_DBUS_SIGNAL_FLAGS_NONE,
         &ScreenCast::OnSignal, this, nullptr);
