@@ -23,6 +23,8 @@ pids=()
 cleanup() {
   for p in "${pids[@]}"; do kill "$p" 2>/dev/null || true; done
   wait 2>/dev/null || true
+  # The desktop portal, started by the bus, mounts its document store in the runtime folder.
+  umount -l "$work/run/doc" 2>/dev/null || true
   [[ -n "${ORVEX_E2E_KEEP:-}" ]] || rm -rf "$work"
 }
 trap cleanup EXIT
