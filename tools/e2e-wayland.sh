@@ -182,6 +182,12 @@ pids+=($(cat "$work/painter"))
 grep -q "video from wayland" "$work/orvex.log" || fail "orvex did not cast the screen"
 ok "the screen came through GNOME's ScreenCast service and PipeWire, in orvex itself"
 painter=$(cat "$work/painter")
+ffprobe -v error -rtsp_transport udp -select_streams v -show_entries \
+  stream=color_range,color_space,color_transfer,color_primaries -of csv=p=0 "$(url 1280 720)" \
+  >"$work/probe" 2>&1 || true
+grep -q "^tv,smpte170m,smpte170m,smpte170m" "$work/probe" || fail "colour description: $(cat "$work/probe")"
+ok "colour description: $(cat "$work/probe") (BT.601, limited range, as converted)"
+sleep 1
 
 # The compositor goes away while a client plays (the window with it) and comes back 4 s later:
 # orvex stays up, the picture goes on ("no signal") at the asked rate, and the screen comes back
