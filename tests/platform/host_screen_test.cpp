@@ -1,15 +1,23 @@
+#include <gio/gio.h>
+#include <gio/gunixfdlist.h>
 #include <gtest/gtest.h>
 
 #include <signal.h>
 #include <spawn.h>
 #include <stdlib.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
+#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <chrono>
+#include <condition_variable>
 #include <cstdint>
 #include <cstdio>
+#include <fstream>
+#include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -89,6 +97,8 @@ protected:
         setenv("XDG_RUNTIME_DIR", runtime_.c_str(), 1);
         setenv("DBUS_SESSION_BUS_ADDRESS", ("unix:path=" + runtime_ + "/bus").c_str(), 1);
         unsetenv("WAYLAND_DISPLAY");
+        // Where a portal's restore token goes (GLib reads it once, at its first use).
+        setenv("XDG_CONFIG_HOME", (runtime_ + "/config").c_str(), 1);
         // A bus that starts no services: a desktop portal started here would mount its
         // document store in the runtime folder.
         const std::string config = runtime_ + "/bus.conf";
@@ -146,6 +156,163 @@ protected:
 std::string HostScreenTest::missing_;
 std::string HostScreenTest::runtime_;
 pid_t HostScreenTest::session_ = -1;
+
+// A desktop portal's ScreenCast interface on the test's bus, answering as a desktop would once
+// the person has chosen: Start declines, or gives `node` with a new restore token. It keeps the
+// restore token each SelectSources brought.
+class FakePortal {
+public:
+    FakePortal(bool decline, uint32_t node) : decline_(decline), node_(node) {
+        context_ = g_main_context_new();
+        loop_ = g_main_loop_new(context_, FALSE);
+        thread_ = std::thread([this] { run(); });
+        std::unique_lock<std::mutex> hold(mutex_);
+        ready_cv_.wait(hold, [this] { return ready_; });
+    }
+    ~FakePortal() {
+        g_main_loop_quit(loop_);
+        thread_.join();
+        g_main_loop_unref(loop_);
+        g_main_context_unref(context_);
+    }
+    bool owned() const { return owned_; }
+    void setNode(uint32_t node) { node_ = node; }
+    std::vector<std::string> tokensSeen() {
+        std::lock_guard<std::mutex> hold(mutex_);
+        return tokens_seen_;
+    }
+
+private:
+    static constexpr const char* kXml =
+        "<node><interface name='org.freedesktop.portal.ScreenCast'>"
+        "<method name='CreateSession'><arg type='a{sv}' direction='in'/>"
+        "<arg type='o' direction='out'/></method>"
+        "<method name='SelectSources'><arg type='o' direction='in'/>"
+        "<arg type='a{sv}' direction='in'/><arg type='o' direction='out'/></method>"
+        "<method name='Start'><arg type='o' direction='in'/><arg type='s' direction='in'/>"
+        "<arg type='a{sv}' direction='in'/><arg type='o' direction='out'/></method>"
+        "<method name='OpenPipeWireRemote'><arg type='o' direction='in'/>"
+        "<arg type='a{sv}' direction='in'/><arg type='h' direction='out'/></method>"
+        "</interface></node>";
+
+    void run() {
+        g_main_context_push_thread_default(context_);
+        gchar* address = g_dbus_address_get_for_bus_sync(G_BUS_TYPE_SESSION, nullptr, nullptr);
+        bus_ = g_dbus_connection_new_for_address_sync(
+            address,
+            static_cast<GDBusConnectionFlags>(G_DBUS_CONNECTION_FLAGS_AUTHENTICATION_CLIENT |
+                                              G_DBUS_CONNECTION_FLAGS_MESSAGE_BUS_CONNECTION),
+            nullptr, nullptr, nullptr);
+        g_free(address);
+        GDBusNodeInfo* info = g_dbus_node_info_new_for_xml(kXml, nullptr);
+        static const GDBusInterfaceVTable vtable = {&FakePortal::OnCall, nullptr, nullptr, {}};
+        if (bus_ != nullptr) {
+            g_dbus_connection_register_object(bus_, "/org/freedesktop/portal/desktop",
+                                              info->interfaces[0], &vtable, this, nullptr, nullptr);
+            GVariant* reply = g_dbus_connection_call_sync(
+                bus_, "org.freedesktop.DBus", "/org/freedesktop/DBus", "org.freedesktop.DBus",
+                "RequestName", g_variant_new("(su)", "org.freedesktop.portal.Desktop", 4u),
+                G_VARIANT_TYPE("(u)"), G_DBUS_CALL_FLAGS_NONE, -1, nullptr, nullptr);
+            if (reply != nullptr) {
+                owned_ = true;
+                g_variant_unref(reply);
+            }
+        }
+        {
+            std::lock_guard<std::mutex> hold(mutex_);
+            ready_ = true;
+        }
+        ready_cv_.notify_all();
+        g_main_loop_run(loop_);
+        if (bus_ != nullptr) {
+            g_dbus_connection_close_sync(bus_, nullptr, nullptr);
+            g_object_unref(bus_);
+        }
+        g_dbus_node_info_unref(info);
+        g_main_context_pop_thread_default(context_);
+    }
+
+    static void OnCall(GDBusConnection* bus, const char* sender, const char*, const char*,
+                       const char* method, GVariant* params, GDBusMethodInvocation* call,
+                       gpointer data) {
+        auto* self = static_cast<FakePortal*>(data);
+        std::string who = sender + 1;
+        for (char& c : who) c = c == '.' ? '_' : c;
+        const std::string name(method);
+        GVariant* options = g_variant_get_child_value(params, g_variant_n_children(params) - 1);
+        if (name == "OpenPipeWireRemote") {
+            g_variant_unref(options);
+            int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+            sockaddr_un addr{};
+            addr.sun_family = AF_UNIX;
+            snprintf(addr.sun_path, sizeof addr.sun_path, "%s/pipewire-0",
+                     getenv("XDG_RUNTIME_DIR"));
+            connect(fd, reinterpret_cast<sockaddr*>(&addr), sizeof addr);
+            GUnixFDList* fds = g_unix_fd_list_new_from_array(&fd, 1);
+            g_dbus_method_invocation_return_value_with_unix_fd_list(call, g_variant_new("(h)", 0),
+                                                                    fds);
+            g_object_unref(fds);
+            return;
+        }
+        const char* token = "";
+        g_variant_lookup(options, "handle_token", "&s", &token);
+        const std::string request = "/org/freedesktop/portal/desktop/request/" + who + "/" + token;
+        g_dbus_method_invocation_return_value(call, g_variant_new("(o)", request.c_str()));
+        uint32_t response = 0;
+        GVariantBuilder results;
+        g_variant_builder_init(&results, G_VARIANT_TYPE_VARDICT);
+        if (name == "CreateSession") {
+            const std::string session = "/org/freedesktop/portal/desktop/session/" + who + "/s";
+            g_variant_builder_add(&results, "{sv}", "session_handle",
+                                  g_variant_new_string(session.c_str()));
+        } else if (name == "SelectSources") {
+            const char* restore = "";
+            g_variant_lookup(options, "restore_token", "&s", &restore);
+            std::lock_guard<std::mutex> hold(self->mutex_);
+            self->tokens_seen_.push_back(restore);
+        } else if (self->decline_) {
+            response = 1;
+        } else {
+            GVariantBuilder streams;
+            g_variant_builder_init(&streams, G_VARIANT_TYPE("a(ua{sv})"));
+            g_variant_builder_add(&streams, "(u@a{sv})", self->node_.load(),
+                                  g_variant_new("a{sv}", nullptr));
+            g_variant_builder_add(&results, "{sv}", "streams", g_variant_builder_end(&streams));
+            const std::string next = "token-" + std::to_string(++self->granted_);
+            g_variant_builder_add(&results, "{sv}", "restore_token",
+                                  g_variant_new_string(next.c_str()));
+        }
+        g_variant_unref(options);
+        g_dbus_connection_emit_signal(bus, sender, request.c_str(),
+                                      "org.freedesktop.portal.Request", "Response",
+                                      g_variant_new("(ua{sv})", response, &results), nullptr);
+    }
+
+    const bool decline_;
+    std::atomic<uint32_t> node_;
+    int granted_ = 0;
+    GMainContext* context_ = nullptr;
+    GMainLoop* loop_ = nullptr;
+    GDBusConnection* bus_ = nullptr;
+    std::atomic<bool> owned_{false};
+    std::thread thread_;
+    std::mutex mutex_;
+    std::condition_variable ready_cv_;
+    bool ready_ = false;
+    std::vector<std::string> tokens_seen_;
+};
+
+// The number PipeWire gave the node of this name, 0 when there is none.
+uint32_t NodeNumber(const std::string& name) {
+    const std::string command =
+        "pw-cli ls Node | awk '/^\\tid /{id=$2+0} /node.name = \"" + name + "\"/{print id}'";
+    FILE* out = popen(command.c_str(), "r");
+    if (out == nullptr) return 0;
+    unsigned number = 0;
+    if (fscanf(out, "%u", &number) != 1) number = 0;
+    pclose(out);
+    return number;
+}
 
 TEST(HostScreenValues, ScreenIsWaylandWhenTheSessionSaysSo) {
     struct Case {
@@ -273,6 +440,61 @@ TEST_F(HostScreenTest, AWaylandScreenWithoutADesktopSaysWhyInOneLine) {
         EXPECT_EQ(lines[0].compare(0, 35, "MediaRecorder: video source wayland"), 0) << lines[0];
     }
     setenv("DBUS_SESSION_BUS_ADDRESS", own.c_str(), 1);
+}
+
+// The desktop portal's way in: a person who declines is one line saying so and what to click;
+// one who shares gives the screen, through the descriptor the portal hands out, and a restore
+// token kept for the owner alone, which the next start brings so that nobody is asked again.
+TEST_F(HostScreenTest, ThePortalAsksOnceAndItsAnswerIsKept) {
+    ASSERT_NO_FATAL_FAILURE(Produce("orvex-desktop", "30/1"));
+    const uint32_t node = NodeNumber("orvex-desktop");
+    ASSERT_NE(node, 0u);
+    {
+        FakePortal portal(true, node);
+        ASSERT_TRUE(portal.owned());
+        properties_.Set("orvex.host.video", "wayland");
+        platform::host::HostCamera camera;
+        camera.unlock();
+        platform::host::HostMediaRecorder r;
+        ASSERT_EQ(r.setCamera(camera), 0);
+        ASSERT_EQ(r.setOutputFormat(101), 0);
+        ASSERT_EQ(r.setVideoEncoder(2), 0);
+        ASSERT_EQ(r.setVideoSize(320, 240), 0);
+        ASSERT_EQ(r.prepare(), 0);
+        EXPECT_EQ(r.release(), 0);
+        EXPECT_EQ(Lines("video source"),
+                  (std::vector<std::string>{
+                      "MediaRecorder: video source wayland cannot start: Start: the person "
+                      "declined to share the screen (allow it in the desktop's screen sharing "
+                      "dialog); showing \"no signal\", trying again in 1 s"}));
+    }
+    const std::string token_file =
+        std::string(getenv("XDG_CONFIG_HOME")) + "/orvex/screencast-token";
+    FakePortal portal(false, node);
+    ASSERT_TRUE(portal.owned());
+    for (int start = 0; start < 2; ++start) {
+        // A screen cast session is a stream of its own each time, as a desktop makes it.
+        if (start > 0) {
+            ASSERT_NO_FATAL_FAILURE(Produce("orvex-desktop-again", "30/1"));
+            portal.setNode(NodeNumber("orvex-desktop-again"));
+        }
+        GstSource live;
+        std::string error;
+        ASSERT_TRUE(live.startScreen("", platform::host::VideoConversion(160, 120), &error))
+            << error;
+        std::vector<uint8_t> picture(160 * 120 * 3 / 2, 0);
+        ASSERT_TRUE(WaitFor([&] { return live.latestFrame(picture.data(), 160, 120); }));
+        EXPECT_NEAR(picture[80 * 60], 81, 6);  // the producer's red
+    }
+    struct stat st {};
+    ASSERT_EQ(stat(token_file.c_str(), &st), 0);
+    EXPECT_EQ(st.st_mode & 0777, 0600u);
+    std::ifstream saved(token_file);
+    std::string token;
+    saved >> token;
+    EXPECT_EQ(token, "token-2");
+    // The first asked with no token (the declined start kept none), the second with the first's.
+    EXPECT_EQ(portal.tokensSeen(), (std::vector<std::string>{"", "token-1"}));
 }
 
 }  // namespace
