@@ -4,8 +4,10 @@
 # orvex.host.audio=pulse), and a stock ffmpeg client that decodes the stream and must find that
 # colour and that tone. Runs in its own network namespace, so port 554 is its own.
 #   tools/e2e-capture.sh [BUILD_DIR]            the check (needs root: namespace, port 554)
-#   tools/e2e-capture.sh [BUILD_DIR] measure    CPU of orvex, bitrate and frame rate while
-#                                               the screen moves, at 720p and 1080p
+#   tools/e2e-capture.sh [BUILD_DIR] measure    CPU of orvex and its capture child, their
+#                                               memory, bitrate and frame rate while the
+#                                               screen moves, at 720p and 1080p (the screen
+#                                               1920x1080, or ORVEX_E2E_SCREEN=WxH)
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
@@ -29,7 +31,10 @@ ok() { echo "e2e-capture: ok: $*"; }
 
 # A virtual screen; Xvfb picks a free display number and writes it to fd 3.
 screen_w=1280 screen_h=720
-[[ $mode == measure ]] && screen_w=1920 screen_h=1080
+if [[ $mode == measure ]]; then
+  screen=${ORVEX_E2E_SCREEN:-1920x1080}
+  screen_w=${screen%x*} screen_h=${screen#*x}
+fi
 Xvfb -displayfd 3 -screen 0 "${screen_w}x${screen_h}x24" -nolisten tcp 3>"$work/display" \
   >"$work/xvfb.log" 2>&1 &
 xvfb=$!
@@ -118,16 +123,23 @@ if [[ $mode == measure ]]; then
         -i "$(url "$1" "$2")" -map 0:v -c copy -t 25 -f h264 "$work/video.h264" </dev/null &
       client=$!
       sleep 8
+      # The screen is captured by a gst-launch child: its share counts too.
+      child=$(pgrep -P "$orvex" gst-launch-1.0 | head -1)
       cpu0=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
+      child0=$(awk '{print $14 + $15}' "/proc/$child/stat" 2>/dev/null || echo 0)
       load0=$(cut -d' ' -f1 /proc/loadavg)
       sleep 10
       cpu1=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
+      child1=$(awk '{print $14 + $15}' "/proc/$child/stat" 2>/dev/null || echo 0)
+      rss=$(awk '/VmRSS/ {print int($2 / 1024)}' "/proc/$orvex/status")
+      child_rss=$(awk '/VmRSS/ {print int($2 / 1024)}' "/proc/$child/status" 2>/dev/null || echo 0)
       wait "$client" || true
       frames=$(ffprobe -v error -count_frames -select_streams v:0 \
         -show_entries stream=nb_read_frames -of csv=p=0 "$work/video.h264")
       bytes=$(stat -c %s "$work/video.h264")
       echo "e2e-capture: measure: ${1}x${2}@30, ${scene%%:*} on a ${screen_w}x${screen_h}" \
-        "screen: orvex CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core," \
+        "screen: orvex CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core" \
+        "+ $(( (child1 - child0) * 100 / hz / 10 ))% in the child, RSS $rss + $child_rss MiB," \
         "$(( bytes * 8 / 25 / 1000 )) kbit/s, $(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}')" \
         "fps (load average $load0 on $(nproc) cores)"
       grep -h 'frames dropped' "$work/orvex.log" | tail -1 | sed 's/.*MediaRecorder::stop: /  /'

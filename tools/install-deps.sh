@@ -4,7 +4,9 @@
 #   install-deps.sh e2e      that, plus the clients of the end-to-end check (ffmpeg, GStreamer,
 #                            a headless chromium for the web viewer, nginx with its RTMP module
 #                            and the SRT tools to publish to)
-#   install-deps.sh capture-e2e  that, plus a virtual screen and a sound server to capture
+#   install-deps.sh capture-e2e  that, plus a virtual screen and a sound server to capture, and a
+#                            headless GNOME compositor with PipeWire and a session bus for the
+#                            Wayland screen
 #   install-deps.sh bench    that, plus the e2e clients and the peer server bench/peer_cost.sh
 #                            serves beside orvex (gst-rtsp-server through Python), and perf
 #   install-deps.sh ci       all of it, plus the sanitizer, fuzzing and 32-bit ARM tool chains
@@ -15,6 +17,7 @@ packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock
           libgstreamer1.0-dev libgstreamer-plugins-base1.0-dev gstreamer1.0-plugins-base
           gstreamer1.0-plugins-good gstreamer1.0-alsa
           gstreamer1.0-x gstreamer1.0-tools  # the screen: ximagesrc, in a gst-launch child
+          gstreamer1.0-pipewire  # a Wayland screen: pipewiresrc
           libmicrohttpd-dev  # the web viewer's HTTP server
           libavformat-dev libavcodec-dev libavutil-dev)  # publishing to media servers
 if [[ "${1:-}" == ci ]]; then
@@ -22,6 +25,10 @@ if [[ "${1:-}" == ci ]]; then
 fi
 if [[ "${1:-}" == ci || "${1:-}" == capture-e2e ]]; then
   packages+=(xvfb gstreamer1.0-x pulseaudio pulseaudio-utils)
+  # A Wayland desktop of its own: the session bus, PipeWire with its session manager (which the
+  # screen tests need too), the portal (which offers no screen cast without a desktop's
+  # backend), GNOME's compositor headless, and gdbus to see it on the bus.
+  packages+=(dbus pipewire wireplumber xdg-desktop-portal mutter libglib2.0-bin)
 fi
 if [[ "${1:-}" == bench ]]; then
   packages+=(gir1.2-gst-rtsp-server-1.0 python3-gi linux-perf iproute2 util-linux)

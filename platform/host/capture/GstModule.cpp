@@ -4,10 +4,12 @@
 
 #include <algorithm>
 #include <cstring>
+#include <memory>
 #include <mutex>
 #include <new>
 
 #include "platform/host/capture/LiveSource.h"
+#include "platform/host/capture/ScreenCast.h"
 
 namespace platform {
 namespace host {
@@ -15,6 +17,11 @@ namespace {
 
 constexpr uint64_t kFirstSampleWaitNs = 3000000000u;
 constexpr uint64_t kPollNs = 50000000u;
+// A still screen sends no pictures; pipewiresrc then sends the last one again this often...
+constexpr int kKeepaliveMs = 1000;
+// ...so a screen silent for this long is gone. pipewiresrc itself reports nothing when the
+// compositor or PipeWire goes away: it just stops.
+constexpr gint64 kSilentUs = 4000000;
 
 bool InitOnce(std::string* error) {
     static std::once_flag once;
@@ -60,8 +67,11 @@ public:
     GstPipelineSource& operator=(const GstPipelineSource&) = delete;
 
     bool start(const std::string& description, bool wait_first, std::string* error) override;
+    bool startScreen(const std::string& node, const std::string& conversion, bool wait_first,
+                     std::string* error) override;
+    bool waiting() const override { return screen_ && pipeline_ == nullptr; }
     void stop() override;
-    bool running() const override { return pipeline_ != nullptr; }
+    bool running() const override { return pipeline_ != nullptr || screen_; }
     bool ended(std::string* why) override;
     bool latestFrame(uint8_t* i420, int width, int height) override;
     uint64_t lastFrameTimeNs() const override { return last_pts_ns_; }
@@ -69,6 +79,17 @@ public:
 
 private:
     GstSample* pull(uint64_t timeout_ns);
+    bool launch(const std::string& description, std::string* error);
+    bool waitFirst(std::string* error);
+    bool launchScreen(const std::string& target, int fd, std::string* error);
+    bool screenEnded(std::string* why);
+
+    // A screen: the session it comes through (none for a PipeWire node named by the
+    // operator), and what turns its pictures into the asked ones.
+    bool screen_ = false;
+    std::unique_ptr<ScreenCast> cast_;
+    std::string conversion_;
+    gint64 last_sample_us_ = 0;
 
     GstElement* pipeline_ = nullptr;
     GstElement* sink_ = nullptr;
@@ -79,7 +100,11 @@ private:
 
 bool GstPipelineSource::start(const std::string& description, bool wait_first, std::string* error) {
     stop();
-    if (!InitOnce(error)) return false;
+    if (!InitOnce(error) || !launch(description, error)) return false;
+    return !wait_first || waitFirst(error);
+}
+
+bool GstPipelineSource::launch(const std::string& description, std::string* error) {
     GError* err = nullptr;
     GstElement* pipeline = gst_parse_launch(description.c_str(), &err);
     if (pipeline == nullptr || err != nullptr) {
@@ -99,26 +124,80 @@ bool GstPipelineSource::start(const std::string& description, bool wait_first, s
     }
     pipeline_ = pipeline;
     sink_ = sink;
-    bool failed = gst_element_set_state(pipeline_, GST_STATE_PLAYING) == GST_STATE_CHANGE_FAILURE;
+    if (gst_element_set_state(pipeline_, GST_STATE_PLAYING) != GST_STATE_CHANGE_FAILURE) {
+        return true;
+    }
+    std::string why;
+    PopEnd(pipeline_, &why);
+    *error = why.empty() ? "the pipeline does not start" : why;
+    stop();
+    return false;
+}
+
+bool GstPipelineSource::waitFirst(std::string* error) {
     std::string why;
     // A pull returns at once at the end of the stream, so the wait is measured, not counted.
     const int64_t until_us = g_get_monotonic_time() + kFirstSampleWaitNs / 1000;
-    while (wait_first && g_get_monotonic_time() < until_us) {
+    while (g_get_monotonic_time() < until_us) {
         if (ended(&why)) {
-            failed = true;
+            *error = why.empty() ? "the pipeline does not start" : why;
+            stop();
+            return false;
+        }
+        if (pipeline_ == nullptr) {
+            g_usleep(kPollNs / 1000);  // the desktop has not answered yet
+            continue;
+        }
+        pending_ = pull(kPollNs);
+        if (pending_ != nullptr) {
+            last_sample_us_ = g_get_monotonic_time();
             break;
         }
-        if (failed) break;
-        pending_ = pull(kPollNs);
-        if (pending_ != nullptr) break;
-    }
-    if (failed && why.empty()) ended(&why);
-    if (failed) {
-        *error = why.empty() ? "the pipeline does not start" : why;
-        stop();
-        return false;
     }
     // A live source that is slow to deliver is not an error: frames come when they come.
+    return true;
+}
+
+bool GstPipelineSource::startScreen(const std::string& node, const std::string& conversion,
+                                    bool wait_first, std::string* error) {
+    stop();
+    if (!InitOnce(error)) return false;
+    screen_ = true;
+    conversion_ = conversion;
+    if (node.empty()) {
+        cast_ = std::make_unique<ScreenCast>();
+    } else {
+        // pipewiresrc takes a node's number as its path, anything else as a name.
+        bool number = node.find_first_not_of("0123456789") == std::string::npos;
+        if (!launchScreen((number ? "path=" : "target-object=") + node, -1, error)) {
+            stop();
+            return false;
+        }
+    }
+    return !wait_first || waitFirst(error);
+}
+
+bool GstPipelineSource::launchScreen(const std::string& target, int fd, std::string* error) {
+    // pipewiresrc makes a copy of the descriptor for itself.
+    std::string head = "pipewiresrc " + target + " keepalive-time=" + std::to_string(kKeepaliveMs);
+    if (fd >= 0) head += " fd=" + std::to_string(fd);
+    last_sample_us_ = g_get_monotonic_time();
+    return launch(head + " ! " + conversion_, error);
+}
+
+bool GstPipelineSource::screenEnded(std::string* why) {
+    if (cast_ != nullptr) {
+        int fd = -1;
+        uint32_t node = 0;
+        ScreenCast::State state = cast_->poll(&fd, &node, why);
+        if (state == ScreenCast::State::kFailed) return true;
+        if (state == ScreenCast::State::kReady && pipeline_ == nullptr &&
+            !launchScreen("path=" + std::to_string(node), fd, why)) {
+            return true;
+        }
+    }
+    if (pipeline_ == nullptr || g_get_monotonic_time() - last_sample_us_ < kSilentUs) return false;
+    *why = "no picture from PipeWire for " + std::to_string(kSilentUs / 1000000) + " s";
     return true;
 }
 
@@ -131,9 +210,12 @@ void GstPipelineSource::stop() {
     if (pipeline_ != nullptr) gst_object_unref(pipeline_);
     sink_ = nullptr;
     pipeline_ = nullptr;
+    cast_.reset();
+    screen_ = false;
 }
 
 bool GstPipelineSource::ended(std::string* why) {
+    if (screen_ && screenEnded(why)) return true;
     if (pipeline_ == nullptr) return false;
     if (PopEnd(pipeline_, why)) return true;
     // A stream that ends before the pipeline plays posts no message; the sink knows.
@@ -155,6 +237,7 @@ bool GstPipelineSource::latestFrame(uint8_t* i420, int width, int height) {
         sample = newer;
     }
     if (sample == nullptr) return false;
+    last_sample_us_ = g_get_monotonic_time();
     bool copied = false;
     GstVideoInfo info;
     GstBuffer* buffer = gst_sample_get_buffer(sample);

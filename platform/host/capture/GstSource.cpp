@@ -32,17 +32,23 @@ bool GstSource::start(const std::string& description, std::string* error, bool w
     return startPipeline(description, error, wait_first);
 }
 
+bool GstSource::startScreen(const std::string& node, const std::string& conversion,
+                            std::string* error, bool wait_first) {
+    stop();
+    return load(error) && live_->startScreen(node, conversion, wait_first, error);
+}
+
+bool GstSource::load(std::string* error) {
+    if (live_ != nullptr) return true;
+    LiveSourceFactory create = LoadModule(error);
+    if (create == nullptr) return false;
+    live_.reset(create());
+    if (live_ == nullptr) *error = "out of memory";
+    return live_ != nullptr;
+}
+
 bool GstSource::startPipeline(const std::string& description, std::string* error, bool wait_first) {
-    if (live_ == nullptr) {
-        LiveSourceFactory create = LoadModule(error);
-        if (create == nullptr) return false;
-        live_.reset(create());
-        if (live_ == nullptr) {
-            *error = "out of memory";
-            return false;
-        }
-    }
-    return live_->start(description, wait_first, error);
+    return load(error) && live_->start(description, wait_first, error);
 }
 
 bool GstSource::startInChild(const std::string& child, int width, int height, int fps,

@@ -34,6 +34,15 @@ public:
     // this process reads from the pipe. Reasons name what the child said.
     bool startInChild(const std::string& child, int width, int height, int fps, std::string* error,
                       bool wait_first = true);
+    // A screen through PipeWire: `node` names a PipeWire video node (its number or name), or
+    // is empty to ask the desktop for a screen cast session first (see ScreenCast), which
+    // goes on after this returns when the desktop is slow to answer. `conversion` is the rest
+    // of the pipeline, from the first converter to the appsink. A screen that has sent
+    // nothing for 4 s, its session ended or refused, ends the source.
+    bool startScreen(const std::string& node, const std::string& conversion, std::string* error,
+                     bool wait_first = true);
+    // Whether a screen is still waiting for the desktop's answer (it may be asking the person).
+    bool waiting() const { return live_ != nullptr && live_->waiting(); }
     // Stops and frees the pipeline; nothing happens when it is not running.
     void stop();
     bool running() const { return live_ != nullptr && live_->running(); }
@@ -55,6 +64,8 @@ public:
     size_t readBytes(uint8_t* out, size_t size, int timeout_ms);
 
 private:
+    // Loads the module and makes the source, once.
+    bool load(std::string* error);
     bool startPipeline(const std::string& description, std::string* error, bool wait_first);
 
     std::unique_ptr<LiveSource> live_;

@@ -1,5 +1,7 @@
 #include "platform/host/capture/HostSources.h"
 
+#include <cstdlib>
+#include <cstring>
 #include <string>
 
 #include "platform/Ports.h"
@@ -79,6 +81,9 @@ constexpr SourceForm kVideoForms[] = {
     {"pattern", SourceChoice::kPattern, false, false, ""},
     {"none", SourceChoice::kNone, false, false, ""},
     {"x11", SourceChoice::kX11, true, false, ""},  // no display: $DISPLAY
+    {"wayland", SourceChoice::kWayland, false, false, ""},
+    {"screen", SourceChoice::kX11, false, false, ""},  // or kWayland: see ParseVideoSource
+    {"pipewire", SourceChoice::kPipeWire, true, true, ""},
     {"v4l2", SourceChoice::kV4l2, true, false, "/dev/video0"},
     {"gst", SourceChoice::kGst, true, true, ""},
 };
@@ -94,7 +99,16 @@ constexpr SourceForm kAudioForms[] = {
 }  // namespace
 
 bool ParseVideoSource(const std::string& value, SourceChoice* out) {
-    return ParseSource(value, kVideoForms, out);
+    if (!ParseSource(value, kVideoForms, out)) return false;
+    if (value == "screen")
+        out->kind = ScreenKind(getenv("WAYLAND_DISPLAY"), getenv("XDG_SESSION_TYPE"));
+    return true;
+}
+
+SourceChoice::Kind ScreenKind(const char* wayland_display, const char* session_type) {
+    bool wayland = (wayland_display != nullptr && wayland_display[0] != '\0') ||
+                   (session_type != nullptr && strcmp(session_type, "wayland") == 0);
+    return wayland ? SourceChoice::kWayland : SourceChoice::kX11;
 }
 
 bool ParseAudioSource(const std::string& value, SourceChoice* out) {
@@ -108,6 +122,18 @@ SourceChoice ChooseVideoSource(bool sub) {
 SourceChoice ChooseAudioSource() { return Choose(kAudioProperty, "tone", &ParseAudioSource); }
 
 namespace {
+
+std::string ConversionTo(int width, int height, int fps, const char* sink) {
+    // BT.601 with limited range, as the pattern: what the encoder's colour description says.
+    // videorate comes after the converters, so that a picture repeated to hold the rate is
+    // converted once.
+    return "videoconvert ! videoscale add-borders=true ! videorate ! "
+           "video/x-raw,format=I420,colorimetry=bt601,width=" +
+           std::to_string(width) + ",height=" + std::to_string(height) +
+           ",framerate=" + std::to_string(fps) + "/1,pixel-aspect-ratio=1/1 ! " + sink;
+}
+
+constexpr char kAppSink[] = "appsink name=orvexsink max-buffers=2 drop=true";
 
 // The head of a video pipeline and its conversion to I420 of exactly width x height at fps,
 // ending in `sink`.
@@ -130,19 +156,22 @@ std::string VideoPipelineTo(const SourceChoice& source, int width, int height, i
         default:
             return std::string();
     }
-    // BT.601 with limited range, as the pattern: what the encoder's colour description says.
-    return head +
-           " ! videoconvert ! videoscale add-borders=true ! videorate ! "
-           "video/x-raw,format=I420,colorimetry=bt601,width=" +
-           std::to_string(width) + ",height=" + std::to_string(height) +
-           ",framerate=" + std::to_string(fps) + "/1,pixel-aspect-ratio=1/1 ! " + sink;
+    return head + " ! " + ConversionTo(width, height, fps, sink);
 }
 
 }  // namespace
 
 std::string VideoPipeline(const SourceChoice& source, int width, int height, int fps) {
-    return VideoPipelineTo(source, width, height, fps,
-                           "appsink name=orvexsink max-buffers=2 drop=true");
+    return VideoPipelineTo(source, width, height, fps, kAppSink);
+}
+
+std::string VideoConversion(int width, int height) {
+    // No videorate: PipeWire sends a picture when the screen changes, often without a time
+    // stamp videorate would accept, and the recorder sends the last picture again anyway.
+    return "videoconvert ! videoscale add-borders=true ! "
+           "video/x-raw,format=I420,colorimetry=bt601,width=" +
+           std::to_string(width) + ",height=" + std::to_string(height) +
+           ",pixel-aspect-ratio=1/1 ! " + kAppSink;
 }
 
 std::string ChildVideoPipeline(const SourceChoice& source, int width, int height, int fps) {

@@ -9,7 +9,7 @@ namespace host {
 // orvex.host.video.sub (sub window) and orvex.host.audio, read at every capture start.
 // Thread contract: a plain value; the functions below may run on any thread.
 struct SourceChoice {
-    enum Kind { kPattern, kTone, kNone, kX11, kV4l2, kPulse, kAlsa, kGst };
+    enum Kind { kPattern, kTone, kNone, kX11, kV4l2, kPulse, kAlsa, kGst, kWayland, kPipeWire };
     Kind kind = kPattern;
     // The part after "kind:" (display, device, pulse source or pipeline); may be empty.
     std::string arg;
@@ -18,15 +18,21 @@ struct SourceChoice {
 
     // Whether GStreamer delivers this source.
     bool live() const { return kind >= kX11; }
+    // Whether its pictures come through PipeWire (GstSource::startScreen).
+    bool throughPipeWire() const { return kind == kWayland || kind == kPipeWire; }
 };
 
 constexpr const char* kVideoProperty = "orvex.host.video";
 constexpr const char* kSubVideoProperty = "orvex.host.video.sub";
 constexpr const char* kAudioProperty = "orvex.host.audio";
 
-// Parses a video value: pattern, x11[:DISPLAY], v4l2[:DEVICE], gst:PIPELINE or none.
-// False when the value is none of those.
+// Parses a video value: pattern, x11[:DISPLAY], wayland, screen (wayland or x11, whichever the
+// session is), pipewire:NODE, v4l2[:DEVICE], gst:PIPELINE or none. False when the value is
+// none of those.
 bool ParseVideoSource(const std::string& value, SourceChoice* out);
+// What "screen" means for a session with these WAYLAND_DISPLAY and XDG_SESSION_TYPE values
+// (either may be null): kWayland when either says Wayland, else kX11.
+SourceChoice::Kind ScreenKind(const char* wayland_display, const char* session_type);
 // Parses an audio value: tone, pulse[:SOURCE], alsa[:DEVICE], gst:PIPELINE or none.
 bool ParseAudioSource(const std::string& value, SourceChoice* out);
 
@@ -43,6 +49,9 @@ std::string VideoPipeline(const SourceChoice& source, int width, int height, int
 // pipeline ending in "fdsink fd=3", to run in a child process (GstSource::startInChild);
 // empty for sources that run in this process.
 std::string ChildVideoPipeline(const SourceChoice& source, int width, int height, int fps);
+// The end of a video pipeline, from the first converter to the appsink, for pictures that come
+// through PipeWire (GstSource::startScreen): I420 of exactly width x height, as they come.
+std::string VideoConversion(int width, int height);
 std::string AudioPipeline(const SourceChoice& source);
 
 }  // namespace host

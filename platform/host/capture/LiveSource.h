@@ -14,6 +14,9 @@ class LiveSource {
 public:
     virtual ~LiveSource() = default;
     virtual bool start(const std::string& description, bool wait_first, std::string* error) = 0;
+    virtual bool startScreen(const std::string& node, const std::string& conversion,
+                             bool wait_first, std::string* error) = 0;
+    virtual bool waiting() const = 0;
     virtual void stop() = 0;
     virtual bool running() const = 0;
     virtual bool ended(std::string* why) = 0;

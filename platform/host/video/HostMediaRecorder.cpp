@@ -182,6 +182,13 @@ int HostMediaRecorder::openSource() {
         return 0;
     }
     HostLogf(kLogDebug, "MediaRecorder: video from %s", source_.text.c_str());
+    if (live_->waiting()) {
+        HostLogf(kLogWarn,
+                 "MediaRecorder: video source %s: waiting for the desktop to allow the screen "
+                 "cast; showing \"no signal\"",
+                 source_.text.c_str());
+        label_ = TestPattern::Label::kNoSignal;
+    }
     return 0;
 }
 
@@ -190,9 +197,15 @@ bool HostMediaRecorder::startLive(bool wait_first, std::string* error) {
     const int w = pattern_->width(), h = pattern_->height();
     auto live = std::make_unique<GstSource>();
     std::string child = ChildVideoPipeline(source_, w, h, fps_);
-    bool started = child.empty()
-                       ? live->start(VideoPipeline(source_, w, h, fps_), error, wait_first)
-                       : live->startInChild(child, w, h, fps_, error, wait_first);
+    bool started = false;
+    if (source_.throughPipeWire()) {
+        started = live->startScreen(source_.kind == SourceChoice::kPipeWire ? source_.arg : "",
+                                    VideoConversion(w, h), error, wait_first);
+    } else if (child.empty()) {
+        started = live->start(VideoPipeline(source_, w, h, fps_), error, wait_first);
+    } else {
+        started = live->startInChild(child, w, h, fps_, error, wait_first);
+    }
     if (!started) return false;
     live_ = std::move(live);
     return true;
@@ -211,17 +224,25 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
         if (!ended) {
             // No new frame since the last one: the last picture is sent again.
             bool fresh = live_->latestFrame(picture_.data(), pattern_->width(), pattern_->height());
-            if (!trying_) return;
-            if (fresh) {
+            if (!trying_) {
+                // Until the desktop lets the screen be seen, "no signal" (drawn below).
+                if (fresh || !live_->waiting()) return;
+            } else if (fresh) {
                 HostLogf(kLogWarn, "MediaRecorder: video source %s is back", source_.text.c_str());
                 trying_ = false;
                 label_ = TestPattern::Label::kNone;
                 return;
+            } else {
+                // A source that opens but never gives a frame; the desktop asking the person
+                // whether to share the screen is no such source.
+                if (live_->waiting()) trying_until_ms_ = now + kFirstFrameMs;
+                ended = now >= trying_until_ms_;
             }
-            ended = now >= trying_until_ms_;  // a source that opens but never gives a frame
         }
         if (ended && trying_) {
             // Another attempt that failed: quietly, as the first failure said it all.
+            HostLogf(kLogDebug, "MediaRecorder: video source %s: still failing: %s",
+                     source_.text.c_str(), why.empty() ? "no picture" : why.c_str());
             live_.reset();
             trying_ = false;
             retryLater(std::min(retry_ms_ * 2, kRetryMaxMs));
@@ -242,6 +263,8 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
             trying_ = true;
             trying_until_ms_ = now + kFirstFrameMs;
         } else {
+            HostLogf(kLogDebug, "MediaRecorder: video source %s: still failing: %s",
+                     source_.text.c_str(), error.c_str());
             retryLater(std::min(retry_ms_ * 2, kRetryMaxMs));
         }
     }

@@ -32,3 +32,9 @@ message(STATUS "OpenH264 is loaded as ${ORVEX_OPENH264_SONAME}")
 target_include_directories(orvex_platform_host PRIVATE ${ORVEX_OPENH264_INCLUDE})
 target_compile_definitions(orvex_platform_host PRIVATE
   ORVEX_OPENH264_SONAME="${ORVEX_OPENH264_SONAME}")
+
+# orvex-pattern writes the pattern, capture stamps included, as raw I420 frames, for a window on
+# a captured screen to show (the delay of screen capture, bench/README.md).
+add_executable(orvex-pattern ${PROJECT_SOURCE_DIR}/tools/orvex_pattern.cpp)
+target_link_libraries(orvex-pattern PRIVATE orvex_platform_host)
+set_target_properties(orvex-pattern PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR})
