@@ -86,6 +86,7 @@ kv.orvex.audiopt=97
 PROP
 export ORVEX_PROP_FILE="$work/orvex.prop"
 export ORVEX_LOG="file:$work/orvex.log"
+export ORVEX_LOG_LEVEL=debug  # the checks read the capture's debug lines
 export ORVEX_BINDER_DIR="$work/binder"
 url() { echo "rtsp://127.0.0.1/skyvo.0?width=$1&height=$2&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"; }
 
