@@ -97,8 +97,11 @@ for _ in $(seq 100); do (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break; s
 kill -0 "$orvex" 2>/dev/null || fail "orvex did not start"
 sleep 0.5
 
-if [[ $mode == measure ]]; then
-  # CPU (user + system) and resident memory of orvex, which runs no child for this screen.
+# CPU (user + system over 10 s) and resident memory of the casting process $1 (no child for
+# this screen) while one client plays $3 at 1280x720@30, for a still screen, a small ball moving
+# and bars scrolling over it all; $2 names the server in the lines.
+measure_scenes() {
+  local server=$1 label=$2 url=$3 hz scene scene_pid client cpu0 cpu1 rss frames
   hz=$(getconf CLK_TCK)
   for scene in "still:" "ball:pattern=ball" "bars:pattern=smpte horizontal-speed=4"; do
     if [[ -n ${scene#*:} ]]; then
@@ -110,23 +113,27 @@ if [[ $mode == measure ]]; then
       sleep 2
     fi
     timeout -k 5 60 ffmpeg -y -hide_banner -nostats -loglevel error -rtsp_transport udp \
-      -i "$(url 1280 720)" -map 0:v -c copy -t 25 -f h264 "$work/video.h264" </dev/null &
+      -i "$url" -map 0:v -c copy -t 25 -f h264 "$work/video.h264" </dev/null &
     client=$!
     sleep 8
-    cpu0=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
+    cpu0=$(awk '{print $14 + $15}' "/proc/$server/stat")
     sleep 10
-    cpu1=$(awk '{print $14 + $15}' "/proc/$orvex/stat")
-    rss=$(awk '/VmRSS/ {print int($2 / 1024)}' "/proc/$orvex/status")
+    cpu1=$(awk '{print $14 + $15}' "/proc/$server/stat")
+    rss=$(awk '/VmRSS/ {print int($2 / 1024)}' "/proc/$server/status")
     wait "$client" || true
     frames=$(ffprobe -v error -count_frames -select_streams v:0 \
       -show_entries stream=nb_read_frames -of csv=p=0 "$work/video.h264")
     [[ -n ${scene#*:} ]] && { kill "$scene_pid"; wait "$scene_pid" 2>/dev/null || true; }
-    echo "e2e-wayland: measure: 1280x720@30, ${scene%%:*} on a 1280x720 Wayland screen:" \
-      "orvex CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core, RSS ${rss} MiB," \
-      "$(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}') fps, no child process" \
+    echo "e2e-wayland: measure: 1280x720@30, ${scene%%:*} on a 1280x720 Wayland screen, $label:" \
+      "CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core, RSS ${rss} MiB," \
+      "$(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}') fps" \
       "(load average $(cut -d' ' -f1 /proc/loadavg) on $(nproc) cores)"
     sleep 2
   done
+}
+
+if [[ $mode == measure ]]; then
+  measure_scenes "$orvex" "orvex (no child process)" "$(url 1280 720)"
   # The delay from a picture drawn to it decoded: the pattern with its capture stamps (in this
   # machine's monotonic clock) shown full screen, read back from the stream by rtsp_check.py.
   "$build/orvex-pattern" 1280 720 30 | gst-launch-1.0 -q fdsrc blocksize=1382400 \
@@ -185,33 +192,7 @@ PEER
   pids+=($peer)
   for _ in $(seq 100); do (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break; sleep 0.1; done
   sleep 1
-  for scene in "still:" "ball:pattern=ball" "bars:pattern=smpte horizontal-speed=4"; do
-    if [[ -n ${scene#*:} ]]; then
-      gst-launch-1.0 -q videotestsrc ${scene#*:} is-live=true \
-        ! "video/x-raw,width=1280,height=720,framerate=30/1" ! waylandsink fullscreen=true \
-        >"$work/scene.log" 2>&1 &
-      scene_pid=$!
-      pids+=($scene_pid)
-      sleep 2
-    fi
-    timeout -k 5 60 ffmpeg -y -hide_banner -nostats -loglevel error -rtsp_transport udp \
-      -i "rtsp://127.0.0.1/skyvo.0" -map 0:v -c copy -t 25 -f h264 "$work/video.h264" </dev/null &
-    client=$!
-    sleep 8
-    cpu0=$(awk '{print $14 + $15}' "/proc/$peer/stat")
-    sleep 10
-    cpu1=$(awk '{print $14 + $15}' "/proc/$peer/stat")
-    rss=$(awk '/VmRSS/ {print int($2 / 1024)}' "/proc/$peer/status")
-    wait "$client" || true
-    frames=$(ffprobe -v error -count_frames -select_streams v:0 \
-      -show_entries stream=nb_read_frames -of csv=p=0 "$work/video.h264")
-    [[ -n ${scene#*:} ]] && { kill "$scene_pid"; wait "$scene_pid" 2>/dev/null || true; }
-    echo "e2e-wayland: measure: 1280x720@30, ${scene%%:*}, gst-rtsp-server with the same" \
-      "encoder: CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core, RSS ${rss} MiB," \
-      "$(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}') fps" \
-      "(load average $(cut -d' ' -f1 /proc/loadavg) on $(nproc) cores)"
-    sleep 2
-  done
+  measure_scenes "$peer" "gst-rtsp-server with the same encoder" "rtsp://127.0.0.1/skyvo.0"
   exit 0
 fi
 
