@@ -8,6 +8,7 @@
 #include <string_view>
 
 #include "auth/Digest.h"
+#include "auth/DigestGate.h"
 #include "auth/Md5.h"
 
 namespace {
@@ -38,6 +39,18 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     const std::string expected = auth::DigestExpectedResponse(ha1, "DESCRIBE", fields);
     if (expected.size() != 32) abort();
     auth::EqualInConstantTime(expected, fields.response);
+
+    // The gate's whole check of it, nonce and count included: a verdict, never a crash.
+    static const auth::DigestGate gate({{"orvex", "orvex", "2f5dc0319c3279451ae1c1d7fd646060"}},
+                                       "s3cret");
+    static auth::NonceCounts counts;
+    const std::string header(value);
+    auth::DigestAnswer answer;
+    if (gate.Check(&header, "DESCRIBE", fields.uri, 1000000, 0x7f000001, &answer) ==
+            auth::DigestVerdict::kOk &&
+        answer.nc != 0) {
+        counts.Take(answer.nonce, answer.nc);
+    }
 
     // An unknown pair first, so every field can follow ", " (and unknown pairs are skipped).
     std::string again = "Digest stale=false";
