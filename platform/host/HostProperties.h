@@ -26,7 +26,7 @@ public:
 
     int Get(const char* key, char* value, const char* default_value) override;
     // The whole value of `key` (Get stops at kPropertyValueMax); false when unset or empty.
-    bool Lookup(const std::string& key, std::string* value);
+    bool Lookup(const std::string& key, std::string* value) override;
     std::vector<std::string> paths() const;
 
     // Parses file text into its key/value pairs (later lines win).

@@ -5,7 +5,6 @@
 #include <string>
 
 #include "platform/Ports.h"
-#include "platform/host/HostProperties.h"
 
 namespace platform {
 namespace host {
@@ -22,11 +21,7 @@ bool Is(const std::string& value, const char* name, std::string* arg) {
 // The property's whole value: a host property file holds pipelines longer than Get can copy.
 std::string WholeProperty(const char* key, const char* default_value) {
     std::string value;
-    auto* host = dynamic_cast<HostProperties*>(&Properties());
-    if (host != nullptr) return host->Lookup(key, &value) ? value : default_value;
-    char text[kPropertyValueMax];
-    Properties().Get(key, text, default_value);
-    return text;
+    return Properties().Lookup(key, &value) ? value : default_value;
 }
 
 std::string Quoted(const std::string& s) {
