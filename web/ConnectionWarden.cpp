@@ -7,15 +7,15 @@ ConnectionWarden::ConnectionWarden(Limits limits, Closer close)
 
 bool ConnectionWarden::Opened(const void* id, int fd, uint32_t address, uint64_t now_ms) {
     thread_mutex::Scoped hold(m_lock);
-    m_entries[id] = Entry{fd, address, now_ms, true, false};
+    m_entries[id] = Entry{fd, address, now_ms, true, false, ++m_arrivals};
     int waiting = 0;
     for (const auto& e : m_entries) waiting += e.second.waiting && !e.second.closing ? 1 : 0;
     if (waiting <= m_limits.waiting_max) return false;
-    Evict();
+    Evict(id);
     return true;
 }
 
-void ConnectionWarden::Evict() {
+void ConnectionWarden::Evict(const void* newcomer) {
     // An address with the most waiting connections gives one up: among those, the oldest, so
     // that a newcomer is never the one to go unless its address is the crowd.
     std::map<uint32_t, int> per_address;
@@ -27,8 +27,10 @@ void ConnectionWarden::Evict() {
     Entry* victim = nullptr;
     for (auto& e : m_entries) {
         Entry& c = e.second;
-        if (c.waiting && !c.closing && per_address[c.address] == most &&
-            (victim == nullptr || c.since_ms < victim->since_ms)) {
+        if (e.first == newcomer || !c.waiting || c.closing || per_address[c.address] != most)
+            continue;
+        if (victim == nullptr || c.since_ms < victim->since_ms ||
+            (c.since_ms == victim->since_ms && c.order < victim->order)) {
             victim = &c;
         }
     }

@@ -43,12 +43,15 @@ private:
         uint32_t address;
         uint64_t since_ms;
         bool waiting;
-        bool closing;  // closed by the warden, not yet gone
+        bool closing;    // closed by the warden, not yet gone
+        uint64_t order;  // when it came, among those of one millisecond too
     };
-    void Evict() ORVEX_REQUIRES(m_lock);
+    // Closes one waiting connection other than `newcomer`.
+    void Evict(const void* newcomer) ORVEX_REQUIRES(m_lock);
 
     const Limits m_limits;
     const Closer m_close;
     mutable thread_mutex m_lock;
     std::map<const void*, Entry> m_entries ORVEX_GUARDED_BY(m_lock);
+    uint64_t m_arrivals ORVEX_GUARDED_BY(m_lock) = 0;
 };

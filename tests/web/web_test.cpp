@@ -431,6 +431,17 @@ TEST(ConnectionWardenTest, TheCrowdGivesWayAndLateRequestsEnd) {
         {kAnswered, 10, 0, 1400, {}},  // keep-alive: waits for its next request from now
         {kSweep, 0, 0, 2399, {15}},
         {kSweep, 0, 0, 2400, {10}},
+        {kClose, 10, 0, 0, {}},
+        {kClose, 13, 0, 0, {}},
+        {kClose, 14, 0, 0, {}},
+        {kClose, 15, 0, 0, {}},
+        // Within one millisecond: an address's answered connection still waiting beside its
+        // next one goes first, never the one that just came.
+        {kOpen, 20, 5, 3000, {}},
+        {kOpen, 21, 6, 3000, {}},
+        {kOpen, 22, 7, 3000, {}},
+        {kOpen, 23, 7, 3000, {22}},
+        {kOpen, 24, 7, 3000, {23}},
     };
     for (const auto& s : steps) {
         closed.clear();
