@@ -78,24 +78,8 @@ paint() {
 }
 paint "$colour"
 
-cp "$top/platform/host/orvex.prop" "$work/orvex.prop"
-cat >>"$work/orvex.prop" <<PROP
-orvex.host.video=wayland
-orvex.host.audio=tone
-kv.orvex.audiopt=97
-PROP
-export ORVEX_PROP_FILE="$work/orvex.prop"
-export ORVEX_LOG="file:$work/orvex.log"
-export ORVEX_LOG_LEVEL=debug  # the checks read the capture's debug lines
-export ORVEX_BINDER_DIR="$work/binder"
-url() { echo "rtsp://127.0.0.1/skyvo.0?width=$1&height=$2&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none&framerate=30"; }
-
-"$build/orvex" >"$work/stdout" 2>&1 &
-orvex=$!
-pids+=($orvex)
-for _ in $(seq 100); do (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break; sleep 0.1; done
-kill -0 "$orvex" 2>/dev/null || fail "orvex did not start"
-sleep 0.5
+source "$top/tools/e2e-capture-start.sh"
+start_capturing wayland tone
 
 # CPU (user + system over 10 s) and resident memory of the casting process $1 (no child for
 # this screen) while one client plays $3 at 1280x720@30, for a still screen, a small ball moving

@@ -24,6 +24,7 @@
 #include "platform/host/video/HostMediaRecorder.h"
 #include "platform/host/video/TestPattern.h"
 #include "tests/platform/HostPortsTest.h"
+#include "tests/platform/WaitFor.h"
 
 // Leaks that belong to the libraries, not to this code: GLib's allocations while it is loaded,
 // and ximagesrc's copy of its display name. Their stacks pass through libraries built without
@@ -41,20 +42,8 @@ using platform::host::HostMediaRecorder;
 using platform::host::LaunchChild;
 using platform::host::SourceChoice;
 using platform::host::TestPattern;
-using Clock = std::chrono::steady_clock;
 
 constexpr char kTag[] = "orvex:::host";
-
-// Polls `done` every 10 ms for at most `seconds`; true once it holds.
-template <typename F>
-bool WaitFor(F done, int seconds = 10) {
-    auto end = Clock::now() + std::chrono::seconds(seconds);
-    while (!done()) {
-        if (Clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    return true;
-}
 
 class HostCaptureTest : public HostPortsTest {
 protected:

@@ -27,6 +27,7 @@
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
 #include "tests/platform/HostPortsTest.h"
+#include "tests/platform/WaitFor.h"
 
 // GLib's allocations while it is loaded belong to the library. Their stacks pass through
 // libraries built without frame pointers, so only the slow unwinder sees far enough.
@@ -40,16 +41,6 @@ namespace {
 using platform::host::GstSource;
 using platform::host::SourceChoice;
 using Clock = std::chrono::steady_clock;
-
-template <typename F>
-bool WaitFor(F done, int seconds = 10) {
-    auto end = Clock::now() + std::chrono::seconds(seconds);
-    while (!done()) {
-        if (Clock::now() > end) return false;
-        std::this_thread::sleep_for(std::chrono::milliseconds(10));
-    }
-    return true;
-}
 
 // `command` run by sh in a process group of its own, so that everything it starts ends with it.
 pid_t Spawn(const std::string& command) {
