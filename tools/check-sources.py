@@ -12,7 +12,8 @@ import pathlib
 import re
 import sys
 
-HOST_ONLY_TARGETS = {"orvex_platform_host", "orvex_platform_fake"}
+# WebRTC playback is built for the host platform only, so far.
+HOST_ONLY_TARGETS = {"orvex_platform_host", "orvex_platform_fake", "orvex_webrtc_dtls"}
 ANDROID_ONLY = re.compile(r"^platform/android/")
 
 # Android.bp defaults module -> the CMake targets whose sources it lists, in pairs of

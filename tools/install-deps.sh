@@ -19,7 +19,8 @@ packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock
           gstreamer1.0-x gstreamer1.0-tools  # the screen: ximagesrc, in a gst-launch child
           gstreamer1.0-pipewire  # a Wayland screen: pipewiresrc
           libmicrohttpd-dev  # the web viewer's HTTP server
-          libavformat-dev libavcodec-dev libavutil-dev)  # publishing to media servers
+          libavformat-dev libavcodec-dev libavutil-dev  # publishing to media servers
+          libssl-dev libsrtp2-dev libopus-dev)  # WebRTC playback: DTLS-SRTP, Opus sound
 if [[ "${1:-}" == ci ]]; then
   packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
 fi
