@@ -155,6 +155,40 @@ TEST_F(DtlsSrtpTest, NackResendsWithinTheWindowProtectAgain) {
     EXPECT_FALSE(protect(100, &p)) << "a whole window behind";
 }
 
+// What the browser's address sends after the handshake is outside bytes too.
+TEST_F(DtlsSrtpTest, MalformedPacketsAreRefusedWhenConnected) {
+    DtlsTestClient client(kBoth);
+    DtlsSrtpSession session(*cert_, client.Fingerprint());
+    Handshake(session, client);
+    ASSERT_EQ(session.state(), DtlsSrtpSession::State::kConnected) << session.why();
+    const struct {
+        const char* name;
+        std::vector<uint8_t> bytes;
+    } srtcp[] = {
+        {"empty", {}},
+        {"a header alone", {0x80, 0xc9, 0x00, 0x01}},
+        {"a receiver report without tag or index", {0x80, 0xc9, 0x00, 0x01, 0, 0, 0, 1}},
+        {"a tag's worth of zeros", std::vector<uint8_t>(8 + kSrtpMaxTrailer, 0)},
+        {"a whole packet with a forged tag", std::vector<uint8_t>(100, 0x81)},
+    };
+    for (const auto& c : srtcp) {
+        SCOPED_TRACE(c.name);
+        std::vector<uint8_t> p = c.bytes;
+        p.reserve(1);
+        size_t len = p.size();
+        EXPECT_FALSE(session.UnprotectRtcp(p.data(), &len));
+    }
+    uint8_t rtp[64] = {0x80, 0x60, 0, 1, 0, 0, 0, 0, 0x12, 0x34, 0x56, 0x78};
+    size_t len = 11;  // one short of a fixed header
+    EXPECT_FALSE(session.ProtectRtp(rtp, &len, sizeof(rtp)));
+    len = 12 + 1;
+    EXPECT_FALSE(session.ProtectRtp(rtp, &len, len + kSrtpMaxTrailer - 1)) << "no room for a tag";
+    EXPECT_EQ(len, 13u);
+    rtp[0] = 0x8f;  // fifteen CSRCs the packet does not hold
+    len = 20;
+    EXPECT_FALSE(session.ProtectRtp(rtp, &len, sizeof(rtp)));
+}
+
 TEST_F(DtlsSrtpTest, PeersThatMustNotConnect) {
     DtlsTestClient other(kBoth);
     const struct {
