@@ -23,8 +23,8 @@ constexpr size_t kSrtpMaxTrailer = 16 + 4;
 constexpr size_t kDtlsMtu = 1200;
 
 // How far behind the newest sent sequence number a packet may still be protected (a NACK
-// resend) and how far behind the newest received one SRTCP may arrive: 2048 packets is about
-// 1.2 s at 16 Mbit/s in 1200-byte packets (16e6 / 8 / 1200 = 1667 a second).
+// resend): 2048 packets is about 1.2 s at 16 Mbit/s in 1200-byte packets (16e6 / 8 / 1200 =
+// 1667 a second). libsrtp keeps 2048 bits for it per SSRC; SRTCP's window is its own (128).
 constexpr unsigned long kSrtpReplayWindow = 2048;
 
 // One viewer's DTLS association (server side, RFC 5763/5764) and the SRTP contexts keyed from it.
@@ -47,6 +47,8 @@ public:
     // into this session. Returns the state after it.
     State Feed(const uint8_t* p, size_t n, const Send& send);
     // Handshake retransmissions: call when NextTimeoutMs() has passed (DTLSv1_handle_timeout).
+    // OpenSSL waits 1 s, doubling to 60 s, and gives up (kFailed) after twelve; a caller that
+    // ends sessions whose ICE consent lapses needs no limit of its own.
     int NextTimeoutMs() const;  // -1 none
     State OnTimeout(const Send& send);
     // Sends close_notify when connected; the session is kFailed ("closed") after it.
