@@ -3,6 +3,8 @@
 #include <openssl/evp.h>
 #include <openssl/x509.h>
 
+#include <sys/time.h>
+
 #include <cstring>
 
 namespace webrtc::test {
@@ -80,6 +82,21 @@ Datagrams DtlsTestClient::Step(const Datagrams& in) {
         closed_by_peer_ = closed_by_peer_ || (SSL_get_shutdown(ssl_) & SSL_RECEIVED_SHUTDOWN);
     }
     if (in.empty() && !connected_) connected_ = SSL_do_handshake(ssl_) == 1;
+    return Drain();
+}
+
+int DtlsTestClient::NextTimeoutMs() {
+    timeval left;
+    if (DTLSv1_get_timeout(ssl_, &left) != 1) return -1;
+    return static_cast<int>(left.tv_sec * 1000 + (left.tv_usec + 999) / 1000);
+}
+
+Datagrams DtlsTestClient::OnTimeout() {
+    DTLSv1_handle_timeout(ssl_);
+    return Drain();
+}
+
+Datagrams DtlsTestClient::Drain() {
     // The memory BIO runs the records together; a record header (RFC 6347 §4.1) holds its
     // length in bytes 11 and 12.
     char* p = nullptr;

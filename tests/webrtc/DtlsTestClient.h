@@ -29,6 +29,9 @@ public:
     // Feeds the server's datagrams (none to start), steps the handshake and returns what the
     // client sends, one record a datagram as a datagram socket would carry them.
     Datagrams Step(const Datagrams& in);
+    // Its retransmission timer: milliseconds left (-1: none), and what it sends again when due.
+    int NextTimeoutMs();
+    Datagrams OnTimeout();
     bool connected() const { return connected_; }
     bool closed_by_peer() const { return closed_by_peer_; }
     SSL* ssl() { return ssl_; }
@@ -40,6 +43,8 @@ public:
     bool ProtectRtcp(std::vector<uint8_t>* packet);
 
 private:
+    Datagrams Drain();
+
     EVP_PKEY* key_ = nullptr;
     X509* cert_ = nullptr;
     SSL_CTX* ctx_ = nullptr;
