@@ -13,7 +13,8 @@ import re
 import sys
 
 # WebRTC playback is built for the host platform only, so far.
-HOST_ONLY_TARGETS = {"orvex_platform_host", "orvex_platform_fake", "orvex_webrtc_dtls"}
+HOST_ONLY_TARGETS = {"orvex_platform_host", "orvex_platform_fake", "orvex_webrtc_dtls",
+                     "orvex_webrtc_proto"}
 ANDROID_ONLY = re.compile(r"^platform/android/")
 
 # Android.bp defaults module -> the CMake targets whose sources it lists, in pairs of
