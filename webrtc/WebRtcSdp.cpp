@@ -306,7 +306,8 @@ bool ReadWebRtcOffer(std::string_view sdp, int profile_idc, int constraints, Web
     // We answer a=setup:passive; an offer that is passive itself leaves nobody to start DTLS.
     if (out->setup == "passive") return Fail(why, "The offer's DTLS role is passive, as ours.");
 
-    bool video = false, audio = false, video_unreceived = false;
+    bool video = false, audio = false;
+    const char* video_problem = "The offer has no video in H.264 with packetization-mode=1.";
     out->rtcp_mux = true;
     for (size_t i = 0; i < out->media.size(); ++i) {
         WebRtcOffer::Media& m = out->media[i];
@@ -314,18 +315,24 @@ bool ReadWebRtcOffer(std::string_view sdp, int profile_idc, int constraints, Web
         bool* taken = m.kind == "video" ? &video : &audio;
         if (*taken) continue;
         if (!Receives(m)) {
-            if (m.kind == "video") video_unreceived = true;
+            if (m.kind == "video") {
+                video_problem =
+                    "The offer's H.264 video does not receive (neither recvonly nor sendrecv).";
+            }
+            continue;
+        }
+        // The mid names the section in the BUNDLE group and in every RTP packet (RFC 8843).
+        if (m.mid.empty() || m.mid.find_first_of(" \t") != std::string::npos) {
+            if (m.kind == "video") video_problem = "The offer's H.264 video has no usable a=mid.";
             continue;
         }
         m.accepted = *taken = true;
         out->rtcp_mux = out->rtcp_mux && usable[i].rtcp_mux;
     }
-    if (!video) {
-        return Fail(why, video_unreceived
-                             ? "The offer's H.264 video does not receive (neither recvonly nor "
-                               "sendrecv)."
-                             : "The offer has no video in H.264 with packetization-mode=1.");
-    }
+    if (!video) return Fail(why, video_problem);
+    // One port carries everything: RTCP must come with RTP (RFC 5761).
+    if (!out->rtcp_mux)
+        return Fail(why, "The offer does not multiplex RTCP with RTP (a=rtcp-mux).");
     return true;
 }
 
@@ -334,11 +341,13 @@ std::string WriteWebRtcAnswer(const WebRtcOffer& offer, const WebRtcAnswerParams
     s.reserve(1024 + 512 * offer.media.size());
     s += "v=0\r\no=- " + std::to_string(p.session_id) + " 1 IN IP4 0.0.0.0\r\ns=-\r\nt=0 0\r\n";
     s += "a=ice-lite\r\n";
-    std::string bundle = "a=group:BUNDLE";
-    for (const WebRtcOffer::Media& m : offer.media) {
-        if (m.accepted) bundle += " " + m.mid;
+    if (offer.bundle) {  // an answer may only keep a group that was offered (RFC 8843 §7.3)
+        std::string bundle = "a=group:BUNDLE";
+        for (const WebRtcOffer::Media& m : offer.media) {
+            if (m.accepted) bundle += " " + m.mid;
+        }
+        s += bundle + "\r\n";
     }
-    s += bundle + "\r\n";
     const std::string candidate = "a=candidate:1 1 udp 2130706431 " + p.address + " " +
                                   std::to_string(p.port) + " typ host\r\n";
     for (const WebRtcOffer::Media& m : offer.media) {

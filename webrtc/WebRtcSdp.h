@@ -36,16 +36,17 @@ struct WebRtcOffer {
         int mid_extension = -1;  // urn:ietf:params:rtp-hdrext:sdes:mid
     };
     std::vector<Media> media;  // in offer order, every m= line
-    bool bundle = false;
-    bool rtcp_mux = false;  // on every accepted section
+    bool bundle = false;       // a=group:BUNDLE offered; the answer groups the accepted sections
+    bool rtcp_mux = false;     // on every accepted section (an offer without it is refused)
 };
 
 // `profile_idc`/`constraints` from the stream's own SPS choose among the offered H.264 types:
 // the packetization-mode=1 type whose profile-level-id has the same profile_idc and whose
 // constraint flags the stream meets (an exact match first) wins; else the constrained baseline
 // one (42e0xx); else any mode-1 type. False with `why` (one short sentence for an HTTP 400 body
-// and the log) on anything unusable: not SDP, over 64 KiB, no ice-ufrag/pwd, no sha-256
-// fingerprint, a passive DTLS role, no video with H.264 mode 1, no receiving direction.
+// and the log) on anything unusable: not SDP, over 64 KiB, control characters, no
+// ice-ufrag/pwd, no sha-256 fingerprint, a passive DTLS role, no video with H.264 mode 1, no
+// receiving direction, no mid, no rtcp-mux.
 bool ReadWebRtcOffer(std::string_view sdp, int profile_idc, int constraints, WebRtcOffer* out,
                      std::string* why);
 

@@ -355,6 +355,10 @@ TEST(WebRtcSdpTest, OfferShapes) {
          "The offer has no video in H.264 with packetization-mode=1."},
         {"video refused by the offerer (port 0)", Replace(m, "m=video 9", "m=video 0"),
          "The offer has no video in H.264 with packetization-mode=1."},
+        {"video without a mid", Replace(m, "a=mid:v\r\n", ""),
+         "The offer's H.264 video has no usable a=mid."},
+        {"RTCP on its own port", Replace(m, "a=rtcp-mux\r\n", ""),
+         "The offer does not multiplex RTCP with RTP (a=rtcp-mux)."},
         {"video that only sends", Replace(m, "a=recvonly", "a=sendonly"),
          "The offer's H.264 video does not receive (neither recvonly nor sendrecv)."},
     };
@@ -372,6 +376,18 @@ TEST(WebRtcSdpTest, OfferShapes) {
         }
         EXPECT_EQ(described, c.media);
     }
+}
+
+TEST(WebRtcSdpTest, AnswerGroupsOnlyWhenTheOfferDid) {
+    WebRtcOffer offer;
+    std::string why;
+    ASSERT_TRUE(webrtc::ReadWebRtcOffer(Replace(kMinimal, "a=group:BUNDLE v a\r\n", ""), 0x42, 0xe0,
+                                        &offer, &why))
+        << why;
+    EXPECT_FALSE(offer.bundle);
+    const std::string answer = webrtc::WriteWebRtcAnswer(offer, Params());
+    EXPECT_EQ(answer.substr(0, answer.find("m=")),
+              "v=0\r\no=- 1234567890123 1 IN IP4 0.0.0.0\r\ns=-\r\nt=0 0\r\na=ice-lite\r\n");
 }
 
 }  // namespace
