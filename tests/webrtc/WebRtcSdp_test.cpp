@@ -11,88 +11,19 @@ namespace {
 using webrtc::WebRtcAnswerParams;
 using webrtc::WebRtcOffer;
 
-// Chromium 156's offer for addTransceiver('video', {direction: 'recvonly'}) and the same for
-// audio, captured once: VP8, VP9, H.264 in four profiles each in modes 0 and 1, AV1, each
-// with its rtx; extmap 5 playout-delay and 9 mid.
-std::string ChromiumOffer() {
-    std::ifstream in(ORVEX_WEBRTC_TESTDATA "/chromium-156-offer.sdp", std::ios::binary);
+// Test files beside this one: Chromium 156's offer for addTransceiver('video', {direction:
+// 'recvonly'}) and the same for audio, captured once (VP8, VP9, H.264 in four profiles each in
+// modes 0 and 1, AV1, each with its rtx; extmap 5 playout-delay and 9 mid); a Firefox-shaped
+// one written by hand (session-level fingerprint, a=fmtp and a=rtcp-fb before the a=rtpmap
+// they qualify, extmap with a direction, a data channel, LF line ends); and the answers.
+std::string TestFile(const char* name) {
+    std::ifstream in(std::string(ORVEX_WEBRTC_TESTDATA "/") + name, std::ios::binary);
     std::stringstream s;
     s << in.rdbuf();
     return s.str();
 }
 
-// Written by hand in Firefox's order: session-level fingerprint, a=fmtp and a=rtcp-fb before
-// the a=rtpmap they qualify, extmap with a direction, a data channel, LF line ends.
-const char kFirefoxShaped[] =
-    "v=0\n"
-    "o=mozilla...THIS_IS_SDPARTA-128.0 4294967296 0 IN IP4 0.0.0.0\n"
-    "s=-\n"
-    "t=0 0\n"
-    "a=fingerprint:sha-256 "
-    "7D:1C:35:A9:3A:05:11:94:6B:C8:A7:D2:AF:14:F5:5B:4D:1E:8E:9C:23:2C:31:F8:0E:14:22:6A:9B:04:"
-    "51:AE\n"
-    "a=group:BUNDLE 0 1 2\n"
-    "a=ice-options:trickle\n"
-    "a=msid-semantic:WMS *\n"
-    "m=video 9 UDP/TLS/RTP/SAVPF 120 124 126 127 97 98\n"
-    "c=IN IP4 0.0.0.0\n"
-    "a=recvonly\n"
-    "a=extmap:3 urn:ietf:params:rtp-hdrext:sdes:mid\n"
-    "a=extmap:4 http://www.webrtc.org/experiments/rtp-hdrext/abs-send-time\n"
-    "a=extmap:6/recvonly http://www.webrtc.org/experiments/rtp-hdrext/playout-delay\n"
-    "a=fmtp:126 profile-level-id=42e01f;level-asymmetry-allowed=1;packetization-mode=1\n"
-    "a=fmtp:97 profile-level-id=42e01f;level-asymmetry-allowed=1\n"
-    "a=fmtp:120 max-fs=12288;max-fr=60\n"
-    "a=fmtp:124 apt=120\n"
-    "a=fmtp:127 apt=126\n"
-    "a=fmtp:98 apt=97\n"
-    "a=ice-pwd:4ba1d5e1b6f14b0e3c4b27a5f8e2c9d1\n"
-    "a=ice-ufrag:9c2f1e0a\n"
-    "a=mid:0\n"
-    "a=rtcp-fb:120 nack\n"
-    "a=rtcp-fb:120 nack pli\n"
-    "a=rtcp-fb:120 ccm fir\n"
-    "a=rtcp-fb:126 nack\n"
-    "a=rtcp-fb:126 nack pli\n"
-    "a=rtcp-fb:126 ccm fir\n"
-    "a=rtcp-fb:126 goog-remb\n"
-    "a=rtcp-fb:126 transport-cc\n"
-    "a=rtcp-mux\n"
-    "a=rtcp-rsize\n"
-    "a=rtpmap:120 VP8/90000\n"
-    "a=rtpmap:124 rtx/90000\n"
-    "a=rtpmap:126 H264/90000\n"
-    "a=rtpmap:127 rtx/90000\n"
-    "a=rtpmap:97 H264/90000\n"
-    "a=rtpmap:98 rtx/90000\n"
-    "a=setup:actpass\n"
-    "a=ssrc:2815117532 cname:{0a4e9b7d-3b2c-4f7e-9d1a-5c6b7a8e9f00}\n"
-    "m=audio 9 UDP/TLS/RTP/SAVPF 109 9 0 8 101\n"
-    "c=IN IP4 0.0.0.0\n"
-    "a=recvonly\n"
-    "a=extmap:1 urn:ietf:params:rtp-hdrext:ssrc-audio-level\n"
-    "a=extmap:3 urn:ietf:params:rtp-hdrext:sdes:mid\n"
-    "a=fmtp:109 maxplaybackrate=48000;stereo=1;useinbandfec=1\n"
-    "a=fmtp:101 0-15\n"
-    "a=ice-pwd:4ba1d5e1b6f14b0e3c4b27a5f8e2c9d1\n"
-    "a=ice-ufrag:9c2f1e0a\n"
-    "a=mid:1\n"
-    "a=rtcp-mux\n"
-    "a=rtpmap:109 opus/48000/2\n"
-    "a=rtpmap:9 G722/8000/1\n"
-    "a=rtpmap:0 PCMU/8000\n"
-    "a=rtpmap:8 PCMA/8000\n"
-    "a=rtpmap:101 telephone-event/8000\n"
-    "a=setup:actpass\n"
-    "m=application 9 UDP/DTLS/SCTP webrtc-datachannel\n"
-    "c=IN IP4 0.0.0.0\n"
-    "a=sendrecv\n"
-    "a=ice-pwd:4ba1d5e1b6f14b0e3c4b27a5f8e2c9d1\n"
-    "a=ice-ufrag:9c2f1e0a\n"
-    "a=mid:2\n"
-    "a=setup:actpass\n"
-    "a=sctp-port:5000\n"
-    "a=max-message-size:1073741823\n";
+std::string ChromiumOffer() { return TestFile("chromium-156-offer.sdp"); }
 
 WebRtcAnswerParams Params() {
     WebRtcAnswerParams p;
@@ -170,73 +101,44 @@ TEST(WebRtcSdpTest, H264TypeFollowsTheStreamsProfile) {
     }
 }
 
-TEST(WebRtcSdpTest, ChromiumAnswer) {
-    WebRtcOffer offer;
-    std::string why;
-    ASSERT_TRUE(webrtc::ReadWebRtcOffer(ChromiumOffer(), 0x42, 0xe0, &offer, &why)) << why;
-    WebRtcAnswerParams p = Params();
-    p.rtx_ssrc = 0x99aabbcc;
-    EXPECT_EQ(
-        webrtc::WriteWebRtcAnswer(offer, p),
-        "v=0\r\n"
-        "o=- 1234567890123 1 IN IP4 0.0.0.0\r\n"
-        "s=-\r\n"
-        "t=0 0\r\n"
-        "a=ice-lite\r\n"
-        "a=group:BUNDLE 0 1\r\n"
-        "m=video 9 UDP/TLS/RTP/SAVPF 108 109\r\n"
-        "c=IN IP4 0.0.0.0\r\n"
-        "a=ice-ufrag:orvx\r\n"
-        "a=ice-pwd:0123456789abcdefghijklmn\r\n"
-        "a=fingerprint:sha-256 "
-        "AB:CD:EF:01:23:45:67:89:AB:CD:EF:01:23:45:67:89:AB:CD:EF:01:23:45:67:89:AB:CD:EF:"
-        "01:23:45:67:89\r\n"
-        "a=setup:passive\r\n"
-        "a=mid:0\r\n"
-        "a=extmap:5 http://www.webrtc.org/experiments/rtp-hdrext/playout-delay\r\n"
-        "a=extmap:9 urn:ietf:params:rtp-hdrext:sdes:mid\r\n"
-        "a=sendonly\r\n"
-        "a=msid:orvex video\r\n"
-        "a=rtcp-mux\r\n"
-        "a=rtcp-rsize\r\n"
-        "a=rtpmap:108 H264/90000\r\n"
-        "a=rtcp-fb:108 nack\r\n"
-        "a=rtcp-fb:108 nack pli\r\n"
-        "a=rtcp-fb:108 ccm fir\r\n"
-        "a=fmtp:108 level-asymmetry-allowed=1;packetization-mode=1;profile-level-id=42e01f\r\n"
-        "a=rtpmap:109 rtx/90000\r\n"
-        "a=fmtp:109 apt=108\r\n"
-        "a=ssrc-group:FID 287454020 2578103244\r\n"
-        "a=ssrc:287454020 cname:orvex\r\n"
-        "a=ssrc:2578103244 cname:orvex\r\n"
-        "a=candidate:1 1 udp 2130706431 192.168.1.20 8443 typ host\r\n"
-        "a=end-of-candidates\r\n"
-        "m=audio 9 UDP/TLS/RTP/SAVPF 111\r\n"
-        "c=IN IP4 0.0.0.0\r\n"
-        "a=ice-ufrag:orvx\r\n"
-        "a=ice-pwd:0123456789abcdefghijklmn\r\n"
-        "a=fingerprint:sha-256 "
-        "AB:CD:EF:01:23:45:67:89:AB:CD:EF:01:23:45:67:89:AB:CD:EF:01:23:45:67:89:AB:CD:EF:"
-        "01:23:45:67:89\r\n"
-        "a=setup:passive\r\n"
-        "a=mid:1\r\n"
-        "a=extmap:9 urn:ietf:params:rtp-hdrext:sdes:mid\r\n"
-        "a=sendonly\r\n"
-        "a=msid:orvex audio\r\n"
-        "a=rtcp-mux\r\n"
-        "a=rtcp-rsize\r\n"
-        "a=rtpmap:111 opus/48000/2\r\n"
-        "a=fmtp:111 minptime=10;stereo=1;sprop-stereo=1\r\n"
-        "a=ssrc:1432778632 cname:orvex\r\n"
-        "a=candidate:1 1 udp 2130706431 192.168.1.20 8443 typ host\r\n"
-        "a=end-of-candidates\r\n");
+TEST(WebRtcSdpTest, Answers) {
+    struct Case {
+        const char* name;
+        const char* offer;
+        int profile_idc, constraints;
+        const char* address;
+        uint32_t rtx_ssrc;
+        const char* answer;
+    };
+    const Case cases[] = {
+        {"chromium: constrained baseline 108 with rtx 109 and its FID group",
+         "chromium-156-offer.sdp", 0x42, 0xe0, "192.168.1.20", 0x99aabbcc,
+         "chromium-156-answer.sdp"},
+        {"firefox-shaped: the data channel refused, IPv6, rtx without an SSRC",
+         "firefox-shaped-offer.sdp", 0x64, 0x00, "fd00::20", 0, "firefox-shaped-answer.sdp"},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.name);
+        WebRtcOffer offer;
+        std::string why;
+        ASSERT_TRUE(
+            webrtc::ReadWebRtcOffer(TestFile(c.offer), c.profile_idc, c.constraints, &offer, &why))
+            << why;
+        WebRtcAnswerParams p = Params();
+        p.address = c.address;
+        p.rtx_ssrc = c.rtx_ssrc;
+        EXPECT_EQ(webrtc::WriteWebRtcAnswer(offer, p), TestFile(c.answer));
+    }
 }
 
-TEST(WebRtcSdpTest, FirefoxShapedAnswerRefusesTheDataChannel) {
+TEST(WebRtcSdpTest, FirefoxShapedOfferRead) {
     WebRtcOffer offer;
     std::string why;
-    ASSERT_TRUE(webrtc::ReadWebRtcOffer(kFirefoxShaped, 0x64, 0x00, &offer, &why)) << why;
+    ASSERT_TRUE(
+        webrtc::ReadWebRtcOffer(TestFile("firefox-shaped-offer.sdp"), 0x64, 0x00, &offer, &why))
+        << why;
     EXPECT_EQ(offer.ice_ufrag, "9c2f1e0a");
+    EXPECT_EQ(offer.fingerprint[0], 0x7d);
     ASSERT_EQ(offer.media.size(), 3u);
     EXPECT_EQ(Describe(offer.media[0]),
               "video mid=0 recvonly accepted pt=126 rtx=127 plid=42e01f nack pli fir rsize "
@@ -245,34 +147,8 @@ TEST(WebRtcSdpTest, FirefoxShapedAnswerRefusesTheDataChannel) {
               "audio mid=1 recvonly accepted pt=109 rtx=-1 plid= delay=-1 midx=3");
     EXPECT_EQ(Describe(offer.media[2]),
               "application mid=2 sendrecv pt=-1 rtx=-1 plid= delay=-1 midx=-1");
-    WebRtcAnswerParams p = Params();
-    p.address = "fd00::20";
-    p.h264_profile_level_id = "640028";
-    const std::string answer = webrtc::WriteWebRtcAnswer(offer, p);
-    // Without an rtx SSRC the rtx type is answered but no FID group announced.
-    EXPECT_EQ(answer.substr(0, answer.find("m=video")),
-              "v=0\r\no=- 1234567890123 1 IN IP4 0.0.0.0\r\ns=-\r\nt=0 0\r\na=ice-lite\r\n"
-              "a=group:BUNDLE 0 1\r\n");
-    const size_t fmtp = answer.find("a=fmtp:126");
-    EXPECT_EQ(
-        answer.substr(fmtp, answer.find("m=audio") - fmtp),
-        "a=fmtp:126 level-asymmetry-allowed=1;packetization-mode=1;profile-level-id=640028\r\n"
-        "a=rtpmap:127 rtx/90000\r\n"
-        "a=fmtp:127 apt=126\r\n"
-        "a=ssrc:287454020 cname:orvex\r\n"
-        "a=candidate:1 1 udp 2130706431 fd00::20 8443 typ host\r\n"
-        "a=end-of-candidates\r\n");
-    EXPECT_NE(answer.find("a=extmap:6 http://www.webrtc.org/experiments/rtp-hdrext/"
-                          "playout-delay\r\na=extmap:3 urn:ietf:params:rtp-hdrext:sdes:mid\r\n"),
-              std::string::npos);
-    EXPECT_EQ(answer.substr(answer.find("m=application")),
-              "m=application 0 UDP/DTLS/SCTP webrtc-datachannel\r\n"
-              "c=IN IP4 0.0.0.0\r\n"
-              "a=mid:2\r\n"
-              "a=inactive\r\n");
 }
 
-// Offers built from a minimal one by replacing one line, each refused or answered in part.
 const char kMinimal[] =
     "v=0\r\n"
     "o=- 1 2 IN IP4 127.0.0.1\r\n"
