@@ -101,9 +101,10 @@ PayloadType* TypeOf(Section* s, std::string_view* value) {
     return n >= 0 && n < kPayloadTypes ? &s->types[n] : nullptr;
 }
 
-// How well an offered mode-1 H.264 type suits a stream of `profile_idc`/`constraints`.
+// How well an offered mode-1 H.264 type suits a stream of `profile_idc`/`constraints`; 0 (never
+// chosen) when its profile-level-id is not the 6 hex digits of RFC 6184 §8.1.
 int H264Score(std::string_view profile_level_id, int profile_idc, int constraints) {
-    if (profile_level_id.size() != 6) return 1;
+    if (profile_level_id.size() != 6) return 0;
     int bytes[3];
     for (int i = 0; i < 3; ++i) {
         const int hi = HexDigit(profile_level_id[2 * i]),

@@ -227,6 +227,8 @@ TEST(WebRtcSdpTest, OfferShapes) {
          "The offer's DTLS role is passive, as ours."},
         {"H.264 in mode 0 only", Replace(m, "packetization-mode=1", "packetization-mode=0"),
          "The offer has no video in H.264 with packetization-mode=1."},
+        {"profile-level-id not 6 hex digits", Replace(m, "42e01f", "42e01"),
+         "The offer has no video in H.264 with packetization-mode=1."},
         {"VP8 only", Replace(m, "H264/90000", "VP8/90000"),
          "The offer has no video in H.264 with packetization-mode=1."},
         {"video refused by the offerer (port 0)", Replace(m, "m=video 9", "m=video 0"),
