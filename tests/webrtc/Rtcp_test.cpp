@@ -189,6 +189,88 @@ TEST(WebRtcRtcpTest, ReadCompoundPackets) {
     }
 }
 
+// What Chromium 156 sent (encryption off, a test flag) while it received H.264 slices it could
+// not decode, two packets of every ten left out, from SSRC 0x11223344: reduced-size compounds of
+// a receiver report with PLI, NACK and REMB.
+TEST(WebRtcRtcpTest, ReadChromiumFeedback) {
+    struct Case {
+        const char* name;
+        std::string bytes;
+        std::vector<uint16_t> nacked;
+        bool pli;
+        bool has_report;
+        uint8_t fraction_lost = 0;
+        int32_t cumulative_lost = 0;
+        uint32_t highest_sequence = 0, jitter = 0;
+    };
+    const Case cases[] = {
+        {"empty report, PLI", "80c90001 00000001 81ce0002 00000001 11223344", {}, true, false},
+        {"report, PLI",
+         "81c90007 00000001 11223344 00000000 000003ec 0000003c 00000000 00000000 "
+         "81ce0002 00000001 11223344",
+         {},
+         true,
+         true,
+         0,
+         0,
+         1004,
+         60},
+        {"report, NACK of 1010 and 1011",
+         "81c90007 00000001 11223344 00000000 000003f1 00000074 00000000 00000000 "
+         "81cd0003 00000001 11223344 03f20001",
+         {1010, 1011},
+         false,
+         true,
+         0,
+         0,
+         1009,
+         116},
+        {"report, PLI, REMB",
+         "81c90007 00000001 11223344 00000006 0000040e 000000f8 00000000 00000000 "
+         "81ce0002 00000001 11223344 8fce0005 00000001 00000000 52454d42 010036d8 11223344",
+         {},
+         true,
+         true,
+         0,
+         6,
+         1038,
+         248},
+        {"report, NACK of 1034 and 1035, REMB",
+         "81c90007 00000001 11223344 00000006 0000040e 000000f8 00000000 00000000 "
+         "81cd0003 00000001 11223344 040a0001 8fce0005 00000001 00000000 52454d42 010036d8 "
+         "11223344",
+         {1034, 1035},
+         false,
+         true,
+         0,
+         6,
+         1038,
+         248},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.name);
+        const std::vector<uint8_t> m = Hex(c.bytes);
+        RtcpFeedback f;
+        ASSERT_TRUE(webrtc::ReadRtcp(m.data(), m.size(), &f));
+        EXPECT_EQ(std::vector<uint16_t>(f.nacked, f.nacked + f.nacked_count), c.nacked);
+        if (!c.nacked.empty()) {
+            EXPECT_EQ(f.nack_media_ssrc, 0x11223344u);
+        }
+        EXPECT_EQ(f.pli, c.pli);
+        EXPECT_FALSE(f.fir);
+        if (c.pli) {
+            EXPECT_EQ(f.keyframe_media_ssrc, 0x11223344u);
+        }
+        EXPECT_EQ(f.has_report, c.has_report);
+        if (!c.has_report) continue;
+        EXPECT_EQ(f.report_ssrc, 0x11223344u);
+        EXPECT_EQ(f.fraction_lost, c.fraction_lost);
+        EXPECT_EQ(f.cumulative_lost, c.cumulative_lost);
+        EXPECT_EQ(f.highest_sequence, c.highest_sequence);
+        EXPECT_EQ(f.jitter, c.jitter);
+    }
+}
+
 TEST(WebRtcRtcpTest, NackListStopsAtItsCapacity) {
     // 16 FCIs with all 16 BLP bits: 272 numbers asked, the first 256 kept in order.
     const std::vector<uint8_t> m = Hex(ManyNacks(16));
