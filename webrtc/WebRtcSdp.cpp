@@ -7,6 +7,8 @@ namespace webrtc {
 namespace {
 
 constexpr size_t kMaxOffer = 64 * 1024;
+// Browsers offer a handful; a bound keeps the work and the answer small whatever comes.
+constexpr size_t kMaxMedia = 32;
 constexpr int kPayloadTypes = 128;  // 7 bits in the RTP header
 constexpr char kPlayoutDelayUri[] = "http://www.webrtc.org/experiments/rtp-hdrext/playout-delay";
 constexpr char kMidUri[] = "urn:ietf:params:rtp-hdrext:sdes:mid";
@@ -240,6 +242,9 @@ bool ReadWebRtcOffer(std::string_view sdp, int profile_idc, int constraints, Web
         if (line.find('\r') != std::string_view::npos) return Fail(why, "The offer is not SDP.");
         if (StartsWith(line, "m=")) {
             FinishSection(section.get(), profile_idc, constraints, &usable);
+            if (out->media.size() == kMaxMedia) {
+                return Fail(why, "The offer has more than 32 media sections.");
+            }
             *section = Section();
             out->media.emplace_back();
             WebRtcOffer::Media* m = &out->media.back();

@@ -44,7 +44,7 @@ struct WebRtcOffer {
 // the packetization-mode=1 type whose profile-level-id has the same profile_idc and whose
 // constraint flags the stream meets (an exact match first) wins; else the constrained baseline
 // one (42e0xx); else any mode-1 type. False with `why` (one short sentence for an HTTP 400 body
-// and the log) on anything unusable: not SDP, over 64 KiB, control characters, no
+// and the log) on anything unusable: not SDP, over 64 KiB or 32 m= lines, control characters, no
 // ice-ufrag/pwd, no sha-256 fingerprint, a passive DTLS role, no video with H.264 mode 1, no
 // receiving direction, no mid, no rtcp-mux.
 bool ReadWebRtcOffer(std::string_view sdp, int profile_idc, int constraints, WebRtcOffer* out,

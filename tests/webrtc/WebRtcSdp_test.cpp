@@ -180,12 +180,23 @@ std::string Replace(std::string s, const std::string& from, const std::string& t
     return s;
 }
 
+std::string Repeat(const std::string& s, int times) {
+    std::string out;
+    for (int i = 0; i < times; ++i) out += s;
+    return out;
+}
+
+// The minimal offer with `extra` data channel sections after its two.
+std::string WithDataChannels(int extra) {
+    return kMinimal + Repeat("m=application 9 UDP/DTLS/SCTP webrtc-datachannel\r\n", extra);
+}
+
 TEST(WebRtcSdpTest, OfferShapes) {
     struct Case {
         const char* name;
         std::string sdp;
         const char* why;         // empty: accepted
-        const char* media = "";  // Describe of each section, "|" between, when accepted
+        std::string media = "";  // Describe of each section, "|" between, when accepted
     };
     const std::string m = kMinimal;
     const Case cases[] = {
@@ -209,6 +220,11 @@ TEST(WebRtcSdpTest, OfferShapes) {
          "",
          "video mid=v recvonly accepted pt=96 rtx=-1 plid=42e01f nack delay=-1 midx=-1|"
          "audio mid=a recvonly pt=-1 rtx=-1 plid= delay=-1 midx=-1"},
+        {"32 media sections", WithDataChannels(30), "",
+         "video mid=v recvonly accepted pt=96 rtx=-1 plid=42e01f nack delay=-1 midx=-1|"
+         "audio mid=a recvonly pt=-1 rtx=-1 plid= delay=-1 midx=-1" +
+             Repeat("|application mid= sendrecv pt=-1 rtx=-1 plid= delay=-1 midx=-1", 30)},
+        {"33 media sections", WithDataChannels(31), "The offer has more than 32 media sections."},
         {"not SDP", "GET / HTTP/1.1\r\n\r\n", "The offer is not SDP."},
         {"empty", "", "The offer is not SDP."},
         {"over 64 KiB", m + std::string(65536, 'x'), "The offer is larger than 64 KiB."},
