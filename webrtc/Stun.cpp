@@ -3,14 +3,18 @@
 #include <netinet/in.h>
 #include <sys/socket.h>
 
-#include <cstring>
+#include <openssl/hmac.h>
+#include <zlib.h>
 
-#include "webrtc/Sha1.h"
+#include <cstring>
 
 namespace webrtc {
 namespace {
 
 constexpr size_t kHeaderSize = 20;
+constexpr size_t kHmacSize = 20;  // HMAC-SHA1
+// Larger checks than this are not hashed: a browser's are about 100 bytes.
+constexpr size_t kMaxHashed = 1500;
 constexpr uint32_t kMagicCookie = 0x2112a442;
 constexpr uint16_t kBindingRequest = 0x0001;
 constexpr uint16_t kBindingSuccess = 0x0101;
@@ -24,7 +28,7 @@ constexpr uint16_t kFingerprint = 0x8028;
 constexpr uint16_t kIceControlled = 0x8029;
 constexpr uint16_t kIceControlling = 0x802a;
 
-constexpr size_t kIntegritySize = 4 + Sha1::kDigestSize;
+constexpr size_t kIntegritySize = 4 + kHmacSize;
 constexpr size_t kFingerprintSize = 4 + 4;
 constexpr uint32_t kFingerprintXor = 0x5354554e;  // "STUN", RFC 5389 §15.5
 constexpr size_t kMaxUsername = 512;              // RFC 5389 §15.3: less than 513 bytes
@@ -42,23 +46,9 @@ void Put32(uint8_t* p, uint32_t v) {
     Put16(p + 2, uint16_t(v));
 }
 
-// CRC-32 of ISO 3309 / ITU-T V.42 (the reflected polynomial 0xedb88320), as zlib's crc32.
-struct CrcTable {
-    uint32_t v[256];
-    constexpr CrcTable() : v() {
-        for (uint32_t i = 0; i < 256; ++i) {
-            uint32_t c = i;
-            for (int k = 0; k < 8; ++k) c = (c & 1) ? 0xedb88320 ^ (c >> 1) : c >> 1;
-            v[i] = c;
-        }
-    }
-};
-constexpr CrcTable kCrc;
-
+// CRC-32 of ISO 3309 / ITU-T V.42, as RFC 5389 §15.5 asks: zlib's.
 uint32_t Crc32(const uint8_t* p, size_t n) {
-    uint32_t c = 0xffffffff;
-    for (size_t i = 0; i < n; ++i) c = kCrc.v[(c ^ p[i]) & 0xff] ^ (c >> 8);
-    return c ^ 0xffffffff;
+    return static_cast<uint32_t>(crc32(0, p, static_cast<uInt>(n)));
 }
 
 // One attribute at `offset` in a message of `n` bytes whose header has been checked; false when
@@ -83,15 +73,15 @@ bool AttributeAt(const uint8_t* p, size_t n, size_t offset, Attribute* a) {
 // The keyed hash of RFC 5389 §15.4 over the message's first `upto` bytes (a header and whole
 // attributes), as though its length field ended the message right after a MESSAGE-INTEGRITY
 // attribute placed at `upto`.
-void IntegrityOf(const uint8_t* p, size_t upto, std::string_view password,
-                 uint8_t mac[Sha1::kDigestSize]) {
-    uint8_t header[kHeaderSize];
-    memcpy(header, p, kHeaderSize);
-    Put16(header + 2, uint16_t(upto - kHeaderSize + kIntegritySize));
-    HmacSha1 h(reinterpret_cast<const uint8_t*>(password.data()), password.size());
-    h.Update(header, kHeaderSize);
-    h.Update(p + kHeaderSize, upto - kHeaderSize);
-    h.Final(mac);
+bool IntegrityOf(const uint8_t* p, size_t upto, std::string_view password, uint8_t mac[kHmacSize]) {
+    if (upto < kHeaderSize || upto > kMaxHashed) return false;
+    uint8_t message[kMaxHashed];
+    memcpy(message, p, upto);
+    Put16(message + 2, uint16_t(upto - kHeaderSize + kIntegritySize));
+    unsigned len = 0;
+    return HMAC(EVP_sha1(), password.data(), static_cast<int>(password.size()), message, upto, mac,
+                &len) != nullptr &&
+           len == kHmacSize;
 }
 
 }  // namespace
@@ -129,7 +119,7 @@ StunRead ReadStunBindingRequest(const uint8_t* p, size_t n, StunBindingRequest* 
                 out->username = {reinterpret_cast<const char*>(a.value), a.size};
                 break;
             case kMessageIntegrity:
-                if (a.size != Sha1::kDigestSize) return StunRead::kMalformed;
+                if (a.size != kHmacSize) return StunRead::kMalformed;
                 out->has_integrity = true;
                 break;
             case kPriority:
@@ -165,11 +155,11 @@ bool CheckStunIntegrity(const uint8_t* p, size_t n, std::string_view password) {
     for (size_t offset = kHeaderSize; offset < n; offset = a.next) {
         if (!AttributeAt(p, n, offset, &a)) return false;
         if (a.type != kMessageIntegrity) continue;
-        if (a.size != Sha1::kDigestSize) return false;
-        uint8_t mac[Sha1::kDigestSize];
-        IntegrityOf(p, offset, password, mac);
+        if (a.size != kHmacSize) return false;
+        uint8_t mac[kHmacSize];
+        if (!IntegrityOf(p, offset, password, mac)) return false;
         uint8_t differ = 0;
-        for (size_t i = 0; i < Sha1::kDigestSize; ++i) differ |= mac[i] ^ a.value[i];
+        for (size_t i = 0; i < kHmacSize; ++i) differ |= mac[i] ^ a.value[i];
         return differ == 0;
     }
     return false;
@@ -214,8 +204,8 @@ size_t WriteStunBindingSuccess(const StunBindingRequest& req, const sockaddr* fr
     w += 4 + mapped_size;
 
     Put16(w, kMessageIntegrity);
-    Put16(w + 2, Sha1::kDigestSize);
-    IntegrityOf(out, size_t(w - out), password, w + 4);
+    Put16(w + 2, kHmacSize);
+    if (!IntegrityOf(out, size_t(w - out), password, w + 4)) return 0;
     w += kIntegritySize;
 
     Put16(w, kFingerprint);
