@@ -20,7 +20,7 @@ packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock
           gstreamer1.0-pipewire  # a Wayland screen: pipewiresrc
           libmicrohttpd-dev  # the web viewer's HTTP server
           libavformat-dev libavcodec-dev libavutil-dev  # publishing to media servers
-          libssl-dev libsrtp2-dev libopus-dev)  # WebRTC playback: DTLS-SRTP, Opus sound
+          libssl-dev zlib1g-dev libsrtp2-dev libopus-dev)  # WebRTC playback: DTLS-SRTP, Opus sound
 if [[ "${1:-}" == ci ]]; then
   packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
 fi
