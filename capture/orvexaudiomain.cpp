@@ -16,6 +16,7 @@
 #include "platform/VoAacApi.h"
 #include "server/DumpSwitches.h"
 #include "server/skyvo_rtsp.h"
+#include "stream/FrameTap.h"
 #include "service/GlobalConfig.h"
 #include "service/OrvexLog.h"
 #include "service/ThreadName.h"
@@ -234,6 +235,7 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
             }
             continue;
         }
+        TapAudioPcm(input, kPcmBlockBytes, GetTimeStampMillsec());
         VO_CODECBUFFER in{input, kPcmBlockBytes, 0};
         api.SetInputData(codec, &in);
         for (int unknown = 0; unknown < kUnknownResultsMax;) {

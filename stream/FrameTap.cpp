@@ -61,3 +61,14 @@ void TapAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) {
     if (time_ms == 0) time_ms = GetTimeStampMillsec();
     Dispatch([&](EncodedFrameSink* sink) { sink->OnAudioFrame(data, len, time_ms); });
 }
+
+void TapAudioPcm(const uint8_t* data, size_t len, uint32_t time_ms) {
+    constexpr size_t kFrameBytes = 2 * 2;  // 16-bit samples, two channels
+    if (data == nullptr || len < kFrameBytes || !AnySink()) return;
+    if (time_ms == 0) time_ms = GetTimeStampMillsec();
+    // The encoder's blocks are 16-bit aligned; an odd pointer would be a caller's fault.
+    if (reinterpret_cast<uintptr_t>(data) % alignof(int16_t) != 0) return;
+    const auto* samples = reinterpret_cast<const int16_t*>(data);
+    Dispatch(
+        [&](EncodedFrameSink* sink) { sink->OnAudioPcm(samples, len / kFrameBytes, time_ms); });
+}

@@ -17,6 +17,12 @@ public:
     // samples, with the producer's time stamp (the monotonic clock when the producer gave
     // none). Called on the AAC encoder thread.
     virtual void OnAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms) = 0;
+    // The PCM the AAC encoder takes (16-bit little-endian, interleaved at kAudioRate and
+    // kAudioChannels of StreamFacts.h), for a consumer that encodes the sound its own way; one
+    // block per call, on the AAC encoder thread. Most consumers want the AAC frames only.
+    virtual void OnAudioPcm(const int16_t* samples, size_t frames, uint32_t time_ms) {
+        (void)samples, (void)frames, (void)time_ms;
+    }
 };
 
 // Any thread. At most kMaxFrameSinks sinks; false when full or already added.
@@ -28,3 +34,5 @@ void RemoveFrameSink(EncodedFrameSink* sink);
 // Called by the server's frame entry points. With no sink added they cost one atomic load.
 void TapVideoFrame(const uint8_t* data, size_t len);
 void TapAudioFrame(const uint8_t* data, size_t len, uint32_t time_ms);
+// `len` bytes of interleaved 16-bit PCM; a trailing odd sample is left out.
+void TapAudioPcm(const uint8_t* data, size_t len, uint32_t time_ms);

@@ -5,7 +5,7 @@
 #include "service/OrvexLog.h"
 #include "web/WebViewer.h"
 
-void StartWebViewer(stream::CaptureDemand*, auth::AccessGate*) {
+void StartWebViewer(stream::CaptureDemand*, auth::AccessGate*, WhepEndpoint*) {
     char value[platform::kPropertyValueMax] = {};
     platform::Properties().Get("kv.orvex.http", value, "");
     if (value[0] == '\0') return;

@@ -92,7 +92,18 @@ std::string RefusedSize(const std::string& query) {
 // (the Digest answer names it so, query included).
 struct Request {
     std::string uri;
+    bool headers_seen = false;  // a POST's first call: its body comes in the next ones
+    std::string body;
+    bool body_too_large = false;
 };
+
+// An SDP offer is a few kilobytes; anything much larger is not one.
+constexpr size_t kMaxOfferBytes = 64 * 1024;
+
+std::string LocalAddressText(const sockaddr_storage& local) {
+    if (local.ss_family != AF_INET) return "?";
+    return AddressText(reinterpret_cast<const sockaddr*>(&local));
+}
 
 }  // namespace
 
@@ -143,7 +154,9 @@ struct WebViewerCalls {
     }
 
     static void* Uri(void*, const char* uri, MHD_Connection*) {
-        return new Request{uri != nullptr ? uri : ""};
+        auto* request = new Request;
+        request->uri = uri != nullptr ? uri : "";
+        return request;
     }
 
     static void Completed(void* cls, MHD_Connection* connection, void** request,
@@ -162,26 +175,47 @@ struct WebViewerCalls {
     }
 
     static MHD_Result Handle(void* cls, MHD_Connection* connection, const char* url,
-                             const char* method, const char*, const char*, size_t* upload_size,
-                             void** context) {
+                             const char* method, const char*, const char* upload_data,
+                             size_t* upload_size, void** context) {
         auto* self = static_cast<WebViewer*>(cls);
         self->m_warden.Answering(connection);
-        if (*upload_size != 0) {  // a body nobody asked for: read and dropped
+        auto* request = static_cast<Request*>(*context);
+        if (*upload_size != 0) {  // kept for a POST (an offer), else read and dropped
+            if (request != nullptr && request->headers_seen) {
+                if (request->body.size() + *upload_size > kMaxOfferBytes) {
+                    request->body_too_large = true;
+                } else {
+                    request->body.append(upload_data, *upload_size);
+                }
+            }
             *upload_size = 0;
             return MHD_YES;
         }
-        auto* request = static_cast<Request*>(*context);
+        if (request != nullptr && !request->headers_seen &&
+            strcmp(method, MHD_HTTP_METHOD_POST) == 0) {
+            request->headers_seen = true;
+            return MHD_YES;
+        }
         const std::string uri = request != nullptr && !request->uri.empty() ? request->uri : url;
-        return Answer(self, connection, uri, method);
+        return Answer(self, connection, uri, method, request);
     }
 
     static MHD_Result Answer(WebViewer* self, MHD_Connection* connection, const std::string& uri,
-                             const char* method) {
+                             const char* method, Request* body) {
         if (self->m_stopping.load()) return Reply(connection, 503, "The service is stopping.\n");
         const bool head = strcmp(method, MHD_HTTP_METHOD_HEAD) == 0;
-        if (!head && strcmp(method, MHD_HTTP_METHOD_GET) != 0) {
-            return Reply(connection, 405, "Only GET and HEAD.\n", MHD_HTTP_HEADER_ALLOW,
-                         "GET, HEAD");
+        const std::string target = uri.substr(0, uri.find('?'));
+        const bool whep_offer = self->m_whep != nullptr && target == "/whep";
+        const bool whep_session =
+            self->m_whep != nullptr && target.size() > 6 && target.compare(0, 6, "/whep/") == 0;
+        const bool whep = whep_offer || whep_session;
+        const char* allowed = whep_offer ? "POST" : whep_session ? "DELETE" : "GET, HEAD";
+        const bool method_ok =
+            whep ? strcmp(method, allowed) == 0 : head || strcmp(method, MHD_HTTP_METHOD_GET) == 0;
+        if (!method_ok) {
+            // PATCH included: every candidate is in the answer, there is nothing to trickle.
+            return Reply(connection, 405, std::string("Only ") + allowed + ".\n",
+                         MHD_HTTP_HEADER_ALLOW, allowed);
         }
         const sockaddr* peer = PeerOf(connection);
         const std::string peer_text = AddressText(peer);
@@ -239,14 +273,28 @@ struct WebViewerCalls {
             return result;
         }
         if (path == "/stream.mp4") return ServeStream(self, connection, peer_text, query);
+        if (whep_offer) return ServeOffer(self, connection, peer_text, query, body);
+        if (whep_session) {
+            if (!self->m_whep->End(path.substr(6)))
+                return Reply(connection, 404, "No such session.\n");
+            return Reply(connection, 200, "");
+        }
         return Reply(connection, 404, "404 Not Found\n");
     }
 
-    static MHD_Result ServeStream(WebViewer* self, MHD_Connection* connection,
-                                  const std::string& peer, const std::string& query) {
+    // POST /whep: an SDP offer in, the answer out, the session counted among the viewers.
+    static MHD_Result ServeOffer(WebViewer* self, MHD_Connection* connection,
+                                 const std::string& peer, const std::string& query,
+                                 Request* request) {
+        const char* type =
+            MHD_lookup_connection_value(connection, MHD_HEADER_KIND, MHD_HTTP_HEADER_CONTENT_TYPE);
+        if (type == nullptr || strncasecmp(type, "application/sdp", 15) != 0)
+            return Reply(connection, 415, "An offer is sent as application/sdp.\n");
+        if (request == nullptr || request->body_too_large)
+            return Reply(connection, 413, "The offer is too large.\n", nullptr, nullptr, true);
         const int max = self->m_options.max_viewers;
-        if (self->m_viewers.fetch_add(1) >= max) {
-            self->m_viewers.fetch_sub(1);
+        if (self->m_viewers->fetch_add(1) >= max) {
+            self->m_viewers->fetch_sub(1);
             OrvexLogPriority(platform::kLogWarn, kTag,
                              "web viewer %s refused: %d viewers already watch (kv.orvex.http.max)",
                              peer.c_str(), max);
@@ -254,7 +302,53 @@ struct WebViewerCalls {
         }
         const std::string refused = RefusedSize(query);
         if (!refused.empty()) {
-            self->m_viewers.fetch_sub(1);
+            self->m_viewers->fetch_sub(1);
+            return Reply(connection, 400, refused);
+        }
+        sockaddr_storage local{};
+        socklen_t local_len = sizeof local;
+        const MHD_ConnectionInfo* fd =
+            MHD_get_connection_info(connection, MHD_CONNECTION_INFO_CONNECTION_FD);
+        if (fd == nullptr ||
+            getsockname(fd->connect_fd, reinterpret_cast<sockaddr*>(&local), &local_len) != 0) {
+            self->m_viewers->fetch_sub(1);
+            return Reply(connection, 500, "The server's own address is unknown.\n");
+        }
+        std::shared_ptr<std::atomic<int>> viewers = self->m_viewers;
+        WhepEndpoint::OfferRequest offer{std::move(request->body), query,
+                                         reinterpret_cast<const sockaddr*>(&local), peer,
+                                         [viewers] { viewers->fetch_sub(1); }};
+        WhepEndpoint::Reply reply = self->m_whep->Offer(std::move(offer));
+        if (reply.status != 201) {
+            self->m_viewers->fetch_sub(1);
+            return Reply(connection, reply.status, reply.body);
+        }
+        MHD_Response* response = MHD_create_response_from_buffer(
+            reply.body.size(), const_cast<char*>(reply.body.data()), MHD_RESPMEM_MUST_COPY);
+        if (response == nullptr) return MHD_NO;
+        MHD_add_response_header(response, MHD_HTTP_HEADER_CONTENT_TYPE, "application/sdp");
+        MHD_add_response_header(response, MHD_HTTP_HEADER_CACHE_CONTROL, "no-store");
+        MHD_add_response_header(response, MHD_HTTP_HEADER_LOCATION, reply.location.c_str());
+        MHD_Result result = MHD_queue_response(connection, 201, response);
+        MHD_destroy_response(response);
+        OrvexLog(kTag, "web viewer %s watching by WebRTC (%d of %d) from %s\n", peer.c_str(),
+                 self->m_viewers->load(), max, LocalAddressText(local).c_str());
+        return result;
+    }
+
+    static MHD_Result ServeStream(WebViewer* self, MHD_Connection* connection,
+                                  const std::string& peer, const std::string& query) {
+        const int max = self->m_options.max_viewers;
+        if (self->m_viewers->fetch_add(1) >= max) {
+            self->m_viewers->fetch_sub(1);
+            OrvexLogPriority(platform::kLogWarn, kTag,
+                             "web viewer %s refused: %d viewers already watch (kv.orvex.http.max)",
+                             peer.c_str(), max);
+            return Reply(connection, 503, "Too many viewers; try again later.\n");
+        }
+        const std::string refused = RefusedSize(query);
+        if (!refused.empty()) {
+            self->m_viewers->fetch_sub(1);
             OrvexLogPriority(platform::kLogWarn, kTag, "web viewer %s refused: %.*s", peer.c_str(),
                              static_cast<int>(refused.size() - 1), refused.c_str());
             return Reply(connection, 400, refused);
@@ -288,7 +382,7 @@ struct WebViewerCalls {
         MHD_Result result = MHD_queue_response(connection, 200, response);
         MHD_destroy_response(response);  // the connection keeps it; End runs when it is done
         OrvexLog(kTag, "web viewer %s watching (%d of %d) %s\n", peer.c_str(),
-                 self->m_viewers.load(), max, type.c_str());
+                 self->m_viewers->load(), max, type.c_str());
         return result;
     }
 
@@ -319,18 +413,20 @@ struct WebViewerCalls {
                      viewer->end_reason, viewer->reader.skips);
         }
         if (self->m_transport != nullptr) self->m_transport->ReleaseCapture();
-        self->m_viewers.fetch_sub(1);
+        self->m_viewers->fetch_sub(1);
         delete viewer;
     }
 };
 
-WebViewer::WebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, Options options)
+WebViewer::WebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, Options options,
+                     WhepEndpoint* whep)
     : m_transport(transport),
       m_options(options),
       m_ring(options.ring_bytes),
       m_muxer(&m_ring),
       m_own_gate(gate == nullptr ? std::make_unique<auth::AccessGate>() : nullptr),
       m_gate(gate != nullptr ? gate : m_own_gate.get()),
+      m_whep(whep),
       m_warden({options.waiting_max, options.request_deadline_ms},
                // The connection's own thread sees its socket end and closes it.
                [](int fd) { shutdown(fd, SHUT_RDWR); }) {}
@@ -411,7 +507,7 @@ namespace {
 std::unique_ptr<WebViewer> g_web_viewer;
 }
 
-void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate) {
+void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, WhepEndpoint* whep) {
     char value[platform::kPropertyValueMax] = {};
     platform::Properties().Get("kv.orvex.http", value, "");
     if (value[0] == '\0') return;  // the television's default: no web viewer, no port
@@ -434,7 +530,7 @@ void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate) {
     options.max_viewers = static_cast<int>(max);
     platform::Properties().Get("kv.orvex.bind", value, "");
     options.bind = value;
-    auto viewer = std::make_unique<WebViewer>(transport, gate, options);
+    auto viewer = std::make_unique<WebViewer>(transport, gate, options, whep);
     if (viewer->Start()) g_web_viewer = std::move(viewer);
 }
 

@@ -11,6 +11,7 @@
 #include "web/ConnectionWarden.h"
 #include "web/FragmentRing.h"
 #include "web/LiveMuxer.h"
+#include "web/WhepEndpoint.h"
 
 struct MHD_Daemon;
 struct MHD_Connection;
@@ -39,8 +40,10 @@ public:
     };
 
     // `gate`: who may watch, shared with the RTSP side; null makes the viewer a gate of its own,
-    // read from the properties at Start.
-    WebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, Options options);
+    // read from the properties at Start. `whep`: WebRTC playback offered at /whep (null: none);
+    // it must outlive the viewer's Stop.
+    WebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, Options options,
+              WhepEndpoint* whep = nullptr);
     ~WebViewer();
     WebViewer(const WebViewer&) = delete;
     WebViewer& operator=(const WebViewer&) = delete;
@@ -50,7 +53,7 @@ public:
     bool Start();
     void Stop();
 
-    int viewers() const { return m_viewers.load(std::memory_order_relaxed); }
+    int viewers() const { return m_viewers->load(std::memory_order_relaxed); }
     unsigned port() const { return m_options.port; }
 
 private:
@@ -64,7 +67,9 @@ private:
     bool m_tapped = false;
     std::unique_ptr<auth::AccessGate> m_own_gate;  // only without a shared one
     auth::AccessGate* m_gate;
-    std::atomic<int> m_viewers{0};
+    // Shared with the WebRTC sessions, which may end after the viewer has stopped.
+    std::shared_ptr<std::atomic<int>> m_viewers = std::make_shared<std::atomic<int>>(0);
+    WhepEndpoint* m_whep;
     std::atomic<bool> m_stopping{false};
     ConnectionWarden m_warden;
     std::thread m_sweeper;  // closes connections that did not send their request in time
@@ -75,7 +80,8 @@ private:
 
 // The service's web viewer, started when kv.orvex.http names a port (unset: none, no port is
 // opened). kv.orvex.http.max: viewers at once (default 16). Main thread.
-void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate);
+void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate,
+                    WhepEndpoint* whep = nullptr);
 void StopWebViewer();
 // The port the service's web viewer listens on; 0 when there is none.
 unsigned WebViewerPort();

@@ -732,3 +732,76 @@ TEST_F(WebViewerTest, OneLockoutForRtspAndHttpAnsweredWithRetryAfter) {
 }
 
 }  // namespace
+
+// --- WHEP ----------------------------------------------------------------------------------
+
+// Records the offers it is given; answers 201 unless the offer says "refuse".
+class RecordingWhep final : public WhepEndpoint {
+public:
+    Reply Offer(OfferRequest request) override {
+        offers.push_back(request.sdp + "|" + request.query);
+        if (request.sdp == "refuse") return {400, "The offer cannot be answered: no H.264\n", ""};
+        ends.push_back(std::move(request.end));
+        return {201, "v=0 answer", "/whep/s" + std::to_string(ends.size())};
+    }
+    bool End(const std::string& id) override { return id == "s1"; }
+    std::vector<std::string> offers;
+    std::vector<std::function<void()>> ends;
+};
+
+std::string Post(const char* path, const char* type, const std::string& body) {
+    return std::string("POST ") + path +
+           " HTTP/1.1\r\nHost: t\r\nConnection: close\r\nContent-Type: " + type +
+           "\r\nContent-Length: " + std::to_string(body.size()) + "\r\n\r\n" + body;
+}
+
+TEST_F(WebViewerTest, OffersWebRtcAtWhepAndCountsItsSessionsAmongTheViewers) {
+    RecordingWhep whep;
+    WebViewer::Options options;
+    options.port = 0;
+    options.max_viewers = 2;
+    viewer_ = std::make_unique<WebViewer>(nullptr, nullptr, options, &whep);
+    ASSERT_TRUE(viewer_->Start());
+    struct Case {
+        std::string request;
+        const char* status;
+        const char* header;  // "Name: value" that the answer carries
+        const char* says;
+    } cases[] = {
+        {Post("/whep?width=1280&height=720", "application/sdp", "v=0 offer"), "HTTP/1.1 201",
+         "Location: /whep/s1", "v=0 answer"},
+        {Post("/whep", "application/sdp", "refuse"), "HTTP/1.1 400", "", "no H.264"},
+        {Post("/whep", "text/plain", "v=0"), "HTTP/1.1 415", "", "application/sdp"},
+        {"GET /whep HTTP/1.1\r\nHost: t\r\nConnection: close\r\n\r\n", "HTTP/1.1 405",
+         "Allow: POST", ""},
+        {"PATCH /whep/s1 HTTP/1.1\r\nHost: t\r\nConnection: close\r\nContent-Length: 0\r\n\r\n",
+         "HTTP/1.1 405", "Allow: DELETE", ""},
+        {"DELETE /whep/s1 HTTP/1.1\r\nHost: t\r\nConnection: close\r\n\r\n", "HTTP/1.1 200", "",
+         ""},
+        {"DELETE /whep/s9 HTTP/1.1\r\nHost: t\r\nConnection: close\r\n\r\n", "HTTP/1.1 404", "",
+         "No such session"},
+        {"DELETE /whepx HTTP/1.1\r\nHost: t\r\nConnection: close\r\n\r\n", "HTTP/1.1 405",
+         "Allow: GET, HEAD", ""},
+        {Post("/whep", "application/sdp", std::string(70 * 1024, 'v')), "HTTP/1.1 413", "", ""},
+        // The session answered first still counts, so one more fits and the next does not.
+        {Post("/whep", "application/sdp", "v=0 second"), "HTTP/1.1 201", "Location: /whep/s2", ""},
+        {Post("/whep", "application/sdp", "v=0 third"), "HTTP/1.1 503", "", "Too many viewers"},
+    };
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.request.substr(0, 40));
+        const std::string answer = Ask(viewer_->port(), c.request);
+        EXPECT_EQ(answer.compare(0, strlen(c.status), c.status), 0) << answer.substr(0, 80);
+        if (c.header[0] != '\0') {
+            const std::string header = c.header;
+            const size_t colon = header.find(": ");
+            EXPECT_EQ(Header(answer, header.substr(0, colon)), header.substr(colon + 2));
+        }
+        EXPECT_NE(answer.find(c.says), std::string::npos) << answer;
+    }
+    EXPECT_EQ(whep.offers, (std::vector<std::string>{"v=0 offer|?width=1280&height=720", "refuse|",
+                                                     "v=0 second|"}))
+        << "the third is refused before it reaches the endpoint";
+    EXPECT_EQ(viewer_->viewers(), 2);
+    for (auto& end : whep.ends) end();  // the sessions end: their places are free again
+    EXPECT_EQ(viewer_->viewers(), 0);
+}
