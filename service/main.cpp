@@ -20,6 +20,7 @@
 #include "service/OrvexLog.h"
 #include "service/OrvexSystemService.h"
 #include "web/WebViewer.h"
+#include "webrtc/WebRtc.h"
 
 namespace {
 
@@ -129,7 +130,10 @@ int main(int argc, char** argv) {
         return result;
     }
     // only when kv.orvex.http names a port; one gate judges RTSP and HTTP alike
-    StartWebViewer(skyvo_rtsp_service()->listener(), &skyvo_rtsp_service()->listener()->access());
+    // WebRTC playback (kv.orvex.webrtc) is offered on the web viewer's server.
+    WhepEndpoint* whep = StartWebRtc(skyvo_rtsp_service()->listener());
+    StartWebViewer(skyvo_rtsp_service()->listener(), &skyvo_rtsp_service()->listener()->access(),
+                   whep);
     StartPublishing(skyvo_rtsp_service()->listener());  // only when kv.orvex.publish names servers
     start_orvex_system_service();
     platform::AnnounceService(
@@ -155,6 +159,7 @@ int main(int argc, char** argv) {
     // hold capture through the listener, so they go first.
     StopPublishing();
     StopWebViewer();
+    StopWebRtc();  // after the viewer: no offer is under way any more
     skyvo_rtsp_sever_close();
     close_orvex_system_service();
     timeval now{};

@@ -14,7 +14,7 @@ import sys
 
 # WebRTC playback is built for the host platform only, so far.
 HOST_ONLY_TARGETS = {"orvex_platform_host", "orvex_platform_fake", "orvex_webrtc_dtls",
-                     "orvex_webrtc_proto"}
+                     "orvex_webrtc_proto", "orvex_webrtc"}
 ANDROID_ONLY = re.compile(r"^platform/android/")
 
 # Android.bp defaults module -> the CMake targets whose sources it lists, in pairs of

@@ -66,7 +66,11 @@ class Browser:
                "--disable-background-networking", "--disable-component-update",
                "--disable-dev-shm-usage", "--disable-background-timer-throttling",
                "--disable-renderer-backgrounding", "--disable-backgrounding-occluded-windows",
-               "--window-size=1280,860", "about:blank"]
+               "--window-size=1280,860",
+               # WebRTC on loopback and inside a network namespace: without these chromium
+               # gathers no address to check from (or waits for an mDNS name forever).
+               "--allow-loopback-in-peer-connection",
+               "--disable-features=WebRtcHideLocalIpsWithMdns", "about:blank"]
         try:
             # Its own process group: the renderer and GPU children go down with it at the end.
             # Nothing else leaks in without close_fds: Python opens every descriptor
@@ -279,9 +283,10 @@ def play(args):
         audio = -1  # a browser that does not count decoded sound
     fps = frames / elapsed
     print("frames=%d fps=%.1f audio_bytes=%d errors=%d size=%dx%d reconnects=%d jumps=%d "
-          "delay_ms=%d" % (frames, fps, audio, len(last["errors"]), last["width"], last["height"],
-                           last["reconnects"] - first["reconnects"],
-                           last["jumps"] - first["jumps"], last["delayMs"]))
+          "delay_ms=%d transport=%s" % (frames, fps, audio, len(last["errors"]), last["width"],
+                                        last["height"], last["reconnects"] - first["reconnects"],
+                                        last["jumps"] - first["jumps"], last["delayMs"],
+                                        last.get("transport", "mse")))
     for error in last["errors"]:
         print("web_check: page error: %s" % error, file=sys.stderr)
     failures = []

@@ -15,7 +15,7 @@ const std::vector<std::string>& KnownPropertyKeys() {
         "kv.orvex.audiopt",    "kv.orvex.auth",        "kv.orvex.bind",
         "kv.orvex.dumptosd",   "kv.orvex.http",        "kv.orvex.http.max",
         "kv.orvex.join",       "kv.orvex.latency",     "kv.orvex.log",
-        "kv.orvex.publish",    "kv.orvex.sdp",         "kv.orvex.wake",
+        "kv.orvex.publish",    "kv.orvex.sdp",         "kv.orvex.wake",  "kv.orvex.webrtc",
         "orvex.host.audio",    "orvex.host.log",       "orvex.host.log.level",
         "orvex.host.video",    "orvex.host.video.sub", "ro.board.platform",
     };

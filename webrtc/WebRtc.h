@@ -1,0 +1,10 @@
+#pragma once
+
+#include "stream/CaptureChoice.h"
+#include "web/WhepEndpoint.h"
+
+// The service's WebRTC playback, started when kv.orvex.webrtc names a UDP port (unset: none,
+// nothing is opened; a build without it says so in one line). Main thread: Start before the
+// web viewer, which offers it at /whep, and Stop after the web viewer has stopped.
+WhepEndpoint* StartWebRtc(stream::CaptureDemand* demand);
+void StopWebRtc();
