@@ -11,7 +11,7 @@ listed_file = top / "platform/host/KnownProperties.cpp"
 listed = set(key.findall(listed_file.read_text()))
 read = set()
 for folder in ("auth", "capture", "media", "platform", "publish", "rtp", "rtsp", "server", "service",
-               "web"):
+               "web", "webrtc"):
     for path in (top / folder).rglob("*.[ch]*"):
         if path != listed_file and path.suffix in (".cpp", ".h"):
             read |= set(key.findall(path.read_text(errors="replace")))
