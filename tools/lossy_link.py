@@ -4,10 +4,11 @@
     tools/lossy_link.py NS_A ADDR_A NS_B ADDR_B [--loss PERCENT] [--delay MS] [--jitter MS]
 
 Makes a TUN device in each of the two named namespaces (`ip netns add`), gives them the two
-addresses (one /30 between them) and carries every IP packet across, each way on its own:
+addresses (a point-to-point pair) and carries every IP packet across, each way on its own:
 PERCENT of them are dropped, the rest delivered after DELAY +- JITTER ms (uniform, so packets
 overtake one another as they do on a real jittery link). TCP and UDP alike, so a stream over
-TCP and one over UDP cross the same link. Runs until killed; needs root.
+TCP and one over UDP cross the same link; --drop-udp lets TCP only through.
+Runs until killed; needs root.
 """
 import argparse
 import ctypes
@@ -63,6 +64,8 @@ def main():
     p.add_argument("--delay", type=float, default=15.0, help="one-way delay, ms")
     p.add_argument("--jitter", type=float, default=5.0, help="+- this many ms, uniform")
     p.add_argument("--seed", type=int, default=None)
+    p.add_argument("--drop-udp", action="store_true",
+                   help="lose every UDP datagram (a network that lets only TCP through)")
     args = p.parse_args()
     rng = random.Random(args.seed)
     home = os.open("/proc/self/ns/net", os.O_RDONLY)
@@ -93,7 +96,9 @@ def main():
                         packet = os.read(fd, 65536)
                     except BlockingIOError:
                         break
-                    if rng.random() * 100 < args.loss:
+                    # IPv4's protocol field: 17 is UDP.
+                    udp = len(packet) > 9 and packet[0] >> 4 == 4 and packet[9] == 17
+                    if (args.drop_udp and udp) or rng.random() * 100 < args.loss:
                         counts["dropped"] += 1
                         continue
                     delay = max(0.0, args.delay + rng.uniform(-args.jitter, args.jitter)) / 1000

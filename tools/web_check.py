@@ -392,8 +392,12 @@ def latency(args):
 
     def pct(p):
         return delays[min(len(delays) - 1, int(p * len(delays)))]
-    print("frames=%d stamped=%d latency_ms p50=%d p95=%d max=%d" %
-          (record["frames"], len(delays), pct(0.50), pct(0.95), delays[-1]))
+    # A freeze: more than 200 ms between two pictures shown, as a viewer sees a stall.
+    shown = [s for _, s in record["stamps"]]
+    pauses = [b - a for a, b in zip(shown, shown[1:])]
+    print("frames=%d stamped=%d latency_ms p50=%d p95=%d max=%d freezes=%d longest_gap_ms=%d" %
+          (record["frames"], len(delays), pct(0.50), pct(0.95), delays[-1],
+           sum(1 for p in pauses if p > 200), max(pauses, default=0)))
     return 0
 
 
