@@ -37,7 +37,8 @@ fi
 if [[ "${1:-}" == ci || "${1:-}" == e2e || "${1:-}" == capture-e2e || "${1:-}" == bench ]]; then
   packages+=(ffmpeg gstreamer1.0-tools gstreamer1.0-plugins-base gstreamer1.0-plugins-good
              gstreamer1.0-plugins-bad gstreamer1.0-libav python3 chromium
-             nginx libnginx-mod-rtmp srt-tools)  # a media server to publish to
+             nginx libnginx-mod-rtmp srt-tools  # a media server to publish to
+             curl iproute2)  # WHEP offers by hand; namespaces and the lossy link
 fi
 
 missing=()
