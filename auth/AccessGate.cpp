@@ -10,10 +10,10 @@
 #include <random>
 #include <sstream>
 
+#include "base/OrvexLog.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
-#include "service/OrvexLog.h"
 
 namespace auth {
 

@@ -11,7 +11,7 @@
 
 #include "auth/AddressRules.h"
 #include "auth/DigestGate.h"
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
 namespace auth {
 

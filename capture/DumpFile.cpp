@@ -1,6 +1,6 @@
 #include "capture/DumpFile.h"
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 DumpFile::DumpFile(const char* tag, std::string internal, std::string external, long limit,
                    Texts texts, const std::atomic<bool>* quiet_unless)

@@ -4,7 +4,7 @@
 #include <cstdio>
 #include <string>
 
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
 // A debug dump: opened on the first write, in the removable-storage folder or the internal
 // one; only the internal one has a size limit, past which the file starts over empty.

@@ -3,13 +3,13 @@
 #include <cstdio>
 #include <memory>
 
+#include "base/OrvexLog.h"
 #include "capture/CameraParameters.h"
 #include "capture/LivecameraResolution.h"
 #include "capture/livepipmanager.h"
 #include "platform/Ports.h"
 #include "server/DumpSwitches.h"
 #include "service/GlobalConfig.h"
-#include "service/OrvexLog.h"
 
 namespace {
 

@@ -5,11 +5,11 @@
 #include <cstring>
 #include <memory>
 
+#include "base/OrvexLog.h"
 #include "capture/livepipmanager.h"
-#include "media/TLock.h"
 #include "platform/Ports.h"
 #include "server/DumpSwitches.h"
-#include "service/OrvexLog.h"
+#include "sync/TLock.h"
 
 namespace {
 

@@ -2,10 +2,10 @@
 
 #include <memory>
 
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
+#include "base/OrvexLog.h"
 #include "platform/Ports.h"
-#include "service/OrvexLog.h"
 
 std::atomic<unsigned> g_pip_stop_flag{0};
 std::atomic<unsigned> g_follow_main_flag{0};

@@ -1,7 +1,7 @@
 #include "capture/orvexAudioRecord.h"
 
+#include "base/OrvexLog.h"
 #include "platform/Ports.h"
-#include "service/OrvexLog.h"
 
 namespace {
 constexpr const char* kTag = "orvex:::orvexAudioRecord";

@@ -1,6 +1,6 @@
 #include "capture/orvexPIPCfg.h"
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 namespace {
 constexpr const char* kTag = "orvex:::orvexPIPCfg";

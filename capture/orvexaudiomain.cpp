@@ -7,6 +7,8 @@
 #include <memory>
 #include <vector>
 
+#include "base/OrvexLog.h"
+#include "base/ThreadName.h"
 #include "capture/AudioSampleClock.h"
 #include "capture/DumpFile.h"
 #include "capture/LivecameraResolution.h"
@@ -18,8 +20,6 @@
 #include "server/skyvo_rtsp.h"
 #include "stream/FrameTap.h"
 #include "service/GlobalConfig.h"
-#include "service/OrvexLog.h"
-#include "service/ThreadName.h"
 
 namespace {
 

@@ -4,7 +4,7 @@
 #include <vector>
 
 #include "media/MediaSession.h"
-#include "media/TLock.h"
+#include "sync/TLock.h"
 
 // The served presentations by name. Owns them.
 // Thread contract: every operation may be called from any thread (one lock).

@@ -3,8 +3,8 @@
 #include <memory>
 #include <string>
 
-#include "media/TLock.h"
 #include "rtp/Rtp.h"
+#include "sync/TLock.h"
 
 // Stream kinds.
 constexpr int kMediaTypeH264 = 201;

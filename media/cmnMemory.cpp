@@ -3,7 +3,7 @@
 #include <cstdlib>
 #include <cstring>
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 // The texts spell "cmnMemmory"; they are kept as operators know them.
 extern "C" {

@@ -3,8 +3,8 @@
 #include <chrono>
 #include <cstring>
 
-#include "service/Clocks.h"
-#include "service/OrvexLog.h"
+#include "base/Clocks.h"
+#include "base/OrvexLog.h"
 
 namespace {
 constexpr const char* kTag = "orvex:::cycle_buffer";

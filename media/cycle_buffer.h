@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <mutex>
 
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
 // Largest payload of one framed item (one encoded frame).
 constexpr int kFrameSizeMax = 1000000;

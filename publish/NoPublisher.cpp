@@ -2,10 +2,10 @@
 // muxing library): a kv.orvex.publish that asks for it is answered with one line.
 #include <cstring>
 
+#include "base/OrvexLog.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "publish/Publisher.h"
-#include "service/OrvexLog.h"
 
 void StartPublishing(stream::CaptureDemand*) {
     char value[platform::kPropertyValueMax] = {};

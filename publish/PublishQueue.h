@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <vector>
 
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
 // The frames waiting for one media server: a byte ring allocated once, so that the frame tap
 // only copies. It holds at most `bytes` and at most `span_ms` of stream time; a frame that

@@ -4,12 +4,12 @@
 #include <cstring>
 #include <thread>
 
+#include "base/OrvexLog.h"
+#include "base/ThreadName.h"
 #include "media/AnnexB.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "publish/PublishQueue.h"
-#include "service/OrvexLog.h"
-#include "service/ThreadName.h"
 #include "stream/CaptureChoice.h"
 #include "stream/KeyFrames.h"
 #include "stream/StreamFacts.h"

@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "media/TLock.h"
+#include "sync/TLock.h"
 
 // One client destination of a send session.
 struct DestSocketInfo {

@@ -4,7 +4,7 @@
 
 #include <cstring>
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 void WriteRtpHeader(unsigned char* p, bool marker, unsigned payload_type, uint16_t sequence,
                     uint32_t timestamp, uint32_t ssrc) {

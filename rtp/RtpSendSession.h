@@ -7,9 +7,9 @@
 #include <cstdint>
 #include <string>
 
-#include "media/TLock.h"
 #include "media/cycle_buffer.h"
 #include "rtp/DestSocketTable.h"
+#include "sync/TLock.h"
 
 // What the video and audio senders share: the input ring (attached by the server, not owned),
 // the client destinations, the send thread's start and stop, and the item time that playing

@@ -5,7 +5,8 @@
 
 #include <memory>
 
-#include "media/LazyInstance.h"
+#include "base/OrvexLog.h"
+#include "base/ThreadName.h"
 #include "platform/UniqueFd.h"
 #include "rtp/Base64.h"
 #include "rtp/FrameLatency.h"
@@ -13,8 +14,7 @@
 #include "rtp/SendLoopState.h"
 #include "rtp/h264_sps.h"
 #include "service/GlobalConfig.h"
-#include "service/OrvexLog.h"
-#include "service/ThreadName.h"
+#include "sync/LazyInstance.h"
 
 namespace {
 

@@ -6,13 +6,13 @@
 
 #include <memory>
 
-#include "media/LazyInstance.h"
+#include "base/OrvexLog.h"
+#include "base/ThreadName.h"
 #include "platform/UniqueFd.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
 #include "service/GlobalConfig.h"
-#include "service/OrvexLog.h"
-#include "service/ThreadName.h"
+#include "sync/LazyInstance.h"
 
 namespace {
 

@@ -3,7 +3,7 @@
 #include <cstring>
 #include <vector>
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 namespace {
 

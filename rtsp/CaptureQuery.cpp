@@ -2,10 +2,10 @@
 
 #include <cctype>
 
+#include "base/OrvexLog.h"
 #include "capture/LivecameraResolution.h"
 #include "rtsp/KeyWordValue.h"
 #include "rtsp/RequestFields.h"
-#include "service/OrvexLog.h"
 
 namespace {
 

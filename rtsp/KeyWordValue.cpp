@@ -3,7 +3,7 @@
 #include <cstring>
 #include <vector>
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 int kmp(const char* text, const char* pattern) {
     if (text == nullptr || pattern == nullptr) return -1;

@@ -2,8 +2,8 @@
 
 #include <cstdlib>
 
+#include "base/OrvexLog.h"
 #include "rtsp/RequestFields.h"
-#include "service/OrvexLog.h"
 
 namespace {
 // A line longer than this is cut: a peer must not make us hold unbounded memory.

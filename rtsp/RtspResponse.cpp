@@ -3,7 +3,7 @@
 #include <atomic>
 #include <cstdio>
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 namespace {
 

@@ -1,9 +1,9 @@
 // Request parsing of RtspResponse: lenient and substring-based by design. The order of the
 // searches decides ambiguous requests and is part of the behaviour.
 
+#include "base/OrvexLog.h"
 #include "rtsp/RequestFields.h"
 #include "rtsp/RtspResponse.h"
-#include "service/OrvexLog.h"
 
 namespace {
 

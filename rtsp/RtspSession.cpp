@@ -7,6 +7,7 @@
 #include <cstdlib>
 #include <cstring>
 
+#include "base/OrvexLog.h"
 #include "capture/LivecameraResolution.h"
 #include "platform/LogPort.h"
 #include "rtp/SendH264Rtp.h"
@@ -14,7 +15,6 @@
 #include "rtsp/CaptureQuery.h"
 #include "rtsp/RequestFields.h"
 #include "service/GlobalConfig.h"
-#include "service/OrvexLog.h"
 #include "stream/KeyFrames.h"
 
 std::atomic<unsigned char> g_url_check_switch{0};

@@ -10,6 +10,9 @@
 #include <cstring>
 #include <vector>
 
+#include "base/Clocks.h"
+#include "base/OrvexLog.h"
+#include "base/ThreadName.h"
 #include "capture/LivecameraResolution.h"
 #include "capture/livepipmanager.h"
 #include "platform/LogPort.h"
@@ -19,10 +22,7 @@
 #include "rtsp/RtspResponse.h"
 #include "rtsp/RtspSession.h"
 #include "server/QuitFlag.h"
-#include "service/Clocks.h"
 #include "service/GlobalConfig.h"
-#include "service/OrvexLog.h"
-#include "service/ThreadName.h"
 
 std::atomic<int> g_capture_running{0};
 std::atomic<unsigned> g_accepts_without_clients{0};

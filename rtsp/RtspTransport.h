@@ -12,10 +12,10 @@
 
 #include "media/MediaSessionList.h"
 #include "media/cycle_buffer.h"
-#include "media/thread_mutex.h"
 #include "platform/UniqueFd.h"
 #include "rtsp/RtspAccess.h"
 #include "stream/CaptureChoice.h"
+#include "sync/thread_mutex.h"
 
 class RtspSession;
 

@@ -8,7 +8,7 @@
 #include <atomic>
 #include <cerrno>
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 namespace {
 std::atomic<int> g_wait_ms{10000};

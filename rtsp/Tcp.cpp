@@ -3,7 +3,7 @@
 #include <arpa/inet.h>
 #include <sys/socket.h>
 
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 Tcp::Tcp() : Socket(1500) {}
 

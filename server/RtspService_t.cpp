@@ -1,12 +1,12 @@
 #include "server/RtspService_t.h"
 
 #include "auth/AddressRules.h"
+#include "base/OrvexLog.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
-#include "service/OrvexLog.h"
 
 namespace {
 

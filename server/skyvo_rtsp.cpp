@@ -4,9 +4,9 @@
 #include <memory>
 #include <thread>
 
+#include "base/OrvexLog.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_service.h"
-#include "service/OrvexLog.h"
 #include "stream/FrameTap.h"
 #include "stream/StreamFacts.h"
 

@@ -2,9 +2,9 @@
 
 #include <cstring>
 
-#include "media/LazyInstance.h"
+#include "base/OrvexLog.h"
 #include "platform/Ports.h"
-#include "service/OrvexLog.h"
+#include "sync/LazyInstance.h"
 
 namespace {
 

@@ -4,9 +4,9 @@
 #include <cstdint>
 #include <string>
 
+#include "base/Clocks.h"  // the program's two clocks live with the configuration
 #include "capture/orvexPIPCfg.h"
-#include "media/TLock.h"
-#include "service/Clocks.h"  // the program's two clocks live with the configuration
+#include "sync/TLock.h"
 
 // The process-wide configuration: stream parameters, readiness, pause and sub-stream state,
 // the capture callbacks and the two send threads' playing positions.

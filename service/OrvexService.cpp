@@ -1,12 +1,12 @@
 #include "service/OrvexService.h"
 
+#include "base/OrvexLog.h"
 #include "capture/DumpFile.h"
 #include "capture/LivecameraResolution.h"
 #include "media/AnnexB.h"
 #include "platform/Ports.h"
 #include "server/DumpSwitches.h"
 #include "server/skyvo_rtsp.h"
-#include "service/OrvexLog.h"
 
 namespace {
 

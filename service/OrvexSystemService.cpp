@@ -6,13 +6,13 @@
 #include <cerrno>
 #include <chrono>
 
-#include "media/thread_mutex.h"
+#include "base/OrvexLog.h"
+#include "base/ThreadName.h"
 #include "platform/Ports.h"
 #include "server/QuitFlag.h"
 #include "service/GlobalConfig.h"
-#include "service/OrvexLog.h"
 #include "service/OrvexService.h"
-#include "service/ThreadName.h"
+#include "sync/thread_mutex.h"
 
 namespace {
 

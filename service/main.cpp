@@ -9,6 +9,7 @@
 #include <atomic>
 #include <cstring>
 
+#include "base/OrvexLog.h"
 #include "capture/Livecamera.h"
 #include "capture/orvexaudiomain.h"
 #include "platform/Ports.h"
@@ -17,7 +18,6 @@
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
 #include "service/GlobalConfig.h"
-#include "service/OrvexLog.h"
 #include "service/OrvexSystemService.h"
 #include "web/WebViewer.h"
 #include "webrtc/WebRtc.h"

@@ -1,9 +1,9 @@
 #include "stream/FrameTap.h"
 
 #include <atomic>
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
-#include "service/Clocks.h"
+#include "base/Clocks.h"
 
 namespace {
 

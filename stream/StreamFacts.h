@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <string>
 
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
 namespace stream {
 

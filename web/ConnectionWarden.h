@@ -4,7 +4,7 @@
 #include <functional>
 #include <map>
 
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
 // Keeps connections that have not become viewers from crowding out those that would: a
 // connection waiting for its request (connected, or between requests) must send it whole

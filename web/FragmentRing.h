@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "media/thread_mutex.h"
+#include "sync/thread_mutex.h"
 
 // The live fMP4 stream as every web viewer gets it: one ring of fragments that the muxer
 // writes once and each viewer copies out at its own pace, so memory stays the same whatever

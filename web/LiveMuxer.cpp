@@ -3,9 +3,9 @@
 #include <cstdlib>
 #include <string>
 
+#include "base/OrvexLog.h"
 #include "media/AnnexB.h"
 #include "platform/LogPort.h"
-#include "service/OrvexLog.h"
 #include "stream/StreamFacts.h"
 #include "web/Fmp4.h"
 

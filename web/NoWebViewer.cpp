@@ -1,8 +1,8 @@
 // The web viewer's entry points in a build without it (the television's default, which has
 // no HTTP library): a kv.orvex.http that asks for it is answered with one line, not a port.
+#include "base/OrvexLog.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
-#include "service/OrvexLog.h"
 #include "web/WebViewer.h"
 
 void StartWebViewer(stream::CaptureDemand*, auth::AccessGate*, WhepEndpoint*) {

@@ -15,12 +15,12 @@
 #include <cstdlib>
 
 #include "auth/DigestGate.h"
+#include "base/Clocks.h"
+#include "base/OrvexLog.h"
 #include "capture/LivecameraResolution.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
-#include "service/Clocks.h"
-#include "service/OrvexLog.h"
 #include "web/WebPage.h"
 
 namespace {

@@ -6,8 +6,8 @@
 #include <thread>
 
 #include "auth/AccessGate.h"
-#include "media/thread_mutex.h"
 #include "stream/CaptureChoice.h"
+#include "sync/thread_mutex.h"
 #include "web/ConnectionWarden.h"
 #include "web/FragmentRing.h"
 #include "web/LiveMuxer.h"

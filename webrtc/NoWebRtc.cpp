@@ -1,9 +1,9 @@
 // WebRTC playback's entry points in a build without it (the television's default, which has
 // neither OpenSSL's DTLS, libsrtp nor libopus): a kv.orvex.webrtc that asks for it is answered
 // with one line, not a port.
+#include "base/OrvexLog.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
-#include "service/OrvexLog.h"
 #include "webrtc/WebRtc.h"
 
 WhepEndpoint* StartWebRtc(stream::CaptureDemand*) {

@@ -12,12 +12,12 @@
 
 #include <cstdlib>
 
+#include "base/Clocks.h"
+#include "base/OrvexLog.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
 #include "rtp/RtpPackets.h"
-#include "service/Clocks.h"
-#include "service/OrvexLog.h"
 #include "stream/KeyFrames.h"
 #include "stream/StreamFacts.h"
 #include "webrtc/DtlsCertificate.h"

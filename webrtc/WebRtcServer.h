@@ -8,9 +8,9 @@
 #include <thread>
 
 #include "media/AccessUnitGatherer.h"
-#include "media/thread_mutex.h"
 #include "stream/CaptureChoice.h"
 #include "stream/FrameTap.h"
+#include "sync/thread_mutex.h"
 #include "web/WhepEndpoint.h"
 #include "webrtc/OpusTrack.h"
 

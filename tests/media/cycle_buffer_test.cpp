@@ -11,8 +11,8 @@
 #include <thread>
 #include <vector>
 
+#include "base/Clocks.h"
 #include "platform/fake/FakePlatform.h"
-#include "service/Clocks.h"
 
 namespace {
 

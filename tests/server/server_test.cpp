@@ -12,6 +12,8 @@
 #include <vector>
 
 #include "auth/Digest.h"
+#include "base/Clocks.h"
+#include "base/OrvexLog.h"
 #include "capture/LivecameraResolution.h"
 #include "capture/livepipmanager.h"
 #include "platform/fake/FakePlatform.h"
@@ -22,8 +24,6 @@
 #include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
-#include "service/Clocks.h"
-#include "service/OrvexLog.h"
 #include "stream/FrameTap.h"
 #include "tests/rtp/UdpReceiver.h"
 #include "tests/server/RtspClient.h"

@@ -1,4 +1,4 @@
-#include "service/Clocks.h"
+#include "base/Clocks.h"
 
 #include <time.h>
 

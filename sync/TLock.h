@@ -2,7 +2,7 @@
 
 #include <pthread.h>
 
-#include "media/ThreadAnnotations.h"
+#include "sync/ThreadAnnotations.h"
 
 // Plain non-recursive lock with virtual Lock/UnLock. Thread contract: Lock/UnLock from any
 // thread; locking twice from one thread deadlocks. The destructor waits for a current holder.

@@ -4,8 +4,8 @@
 #include <chrono>
 #include <thread>
 
-#include "media/TLock.h"
-#include "media/thread_mutex.h"
+#include "sync/TLock.h"
+#include "sync/thread_mutex.h"
 
 namespace {
 

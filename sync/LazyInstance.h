@@ -2,7 +2,7 @@
 
 #include <atomic>
 
-#include "media/TLock.h"
+#include "sync/TLock.h"
 
 // The singletons' creation: a lock-free read of the published pointer, and creation checked
 // again under the owner's lock, so two first callers make one object.

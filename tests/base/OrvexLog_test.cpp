@@ -1,4 +1,4 @@
-#include "service/OrvexLog.h"
+#include "base/OrvexLog.h"
 
 #include <gtest/gtest.h>
 

@@ -5,7 +5,7 @@
 
 #include <chrono>
 
-#include "media/ThreadAnnotations.h"
+#include "sync/ThreadAnnotations.h"
 
 // Plain non-recursive mutex. Thread contract: lock/unlock from any thread; locking twice from
 // one thread deadlocks. The destructor waits for a current holder before destroying.
