@@ -4,7 +4,7 @@
 #include <cstring>
 
 #include "capture/LivecameraResolution.h"
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
 #include "rtp/RtpPackets.h"

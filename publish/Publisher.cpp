@@ -6,7 +6,7 @@
 
 #include "base/OrvexLog.h"
 #include "base/ThreadName.h"
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "publish/PublishQueue.h"

@@ -7,7 +7,7 @@
 #include <string>
 #include <vector>
 
-#include "media/AccessUnitGatherer.h"
+#include "codec/AccessUnitGatherer.h"
 #include "publish/PublishUrl.h"
 #include "stream/CaptureChoice.h"
 #include "stream/FrameTap.h"

@@ -7,12 +7,12 @@
 
 #include "base/OrvexLog.h"
 #include "base/ThreadName.h"
+#include "codec/Base64.h"
+#include "codec/h264_sps.h"
 #include "platform/UniqueFd.h"
-#include "rtp/Base64.h"
 #include "rtp/FrameLatency.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
-#include "rtp/h264_sps.h"
 #include "service/GlobalConfig.h"
 #include "sync/LazyInstance.h"
 
@@ -52,6 +52,8 @@ void H264RtpTransportSession::InspectParameterSets(const Buffer_Item& item) {
     if (!m_sps_seen && type == 7) {
         h264_sps_t sps;
         m_time_scale = h264_parse_sps(item.data + 5, n - 1, m_time_scale, &sps);
+        char complaint[64];
+        if (h264_sps_complaint(sps, complaint, sizeof complaint)) OrvexPrint("%s", complaint);
         if (m_time_scale == 0) {
             OrvexPrint("The SPS's time_scale field info is error!");
         } else {

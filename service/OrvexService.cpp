@@ -3,7 +3,7 @@
 #include "base/OrvexLog.h"
 #include "capture/DumpFile.h"
 #include "capture/LivecameraResolution.h"
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 #include "platform/Ports.h"
 #include "server/DumpSwitches.h"
 #include "server/skyvo_rtsp.h"

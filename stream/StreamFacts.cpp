@@ -3,9 +3,9 @@
 #include <chrono>
 #include <cstdio>
 
-#include "media/AnnexB.h"
-#include "rtp/Base64.h"
-#include "rtp/h264_sps.h"
+#include "codec/AnnexB.h"
+#include "codec/Base64.h"
+#include "codec/h264_sps.h"
 
 namespace stream {
 

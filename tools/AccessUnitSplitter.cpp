@@ -1,6 +1,6 @@
 #include "tools/AccessUnitSplitter.h"
 
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 
 namespace tools {
 namespace {

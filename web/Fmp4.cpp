@@ -2,7 +2,7 @@
 
 #include <cstring>
 
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 
 namespace fmp4 {
 namespace {

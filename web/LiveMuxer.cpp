@@ -4,7 +4,7 @@
 #include <string>
 
 #include "base/OrvexLog.h"
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 #include "platform/LogPort.h"
 #include "stream/StreamFacts.h"
 #include "web/Fmp4.h"

@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <vector>
 
-#include "media/AccessUnitGatherer.h"
+#include "codec/AccessUnitGatherer.h"
 #include "stream/FrameTap.h"
 #include "web/FragmentRing.h"
 

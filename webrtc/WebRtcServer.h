@@ -7,7 +7,7 @@
 #include <string>
 #include <thread>
 
-#include "media/AccessUnitGatherer.h"
+#include "codec/AccessUnitGatherer.h"
 #include "stream/CaptureChoice.h"
 #include "stream/FrameTap.h"
 #include "sync/thread_mutex.h"

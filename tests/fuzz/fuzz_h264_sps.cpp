@@ -4,7 +4,7 @@
 #include <cstddef>
 #include <cstdint>
 
-#include "rtp/h264_sps.h"
+#include "codec/h264_sps.h"
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     if (size < 1 || size > 65536) return 0;

@@ -13,11 +13,11 @@
 #include <thread>
 #include <vector>
 
+#include "codec/h264_sps.h"
 #include "platform/Ports.h"
 #include "platform/host/video/HostCamera.h"
 #include "platform/host/video/HostMediaRecorder.h"
 #include "platform/host/video/TestPattern.h"
-#include "rtp/h264_sps.h"
 
 namespace {
 

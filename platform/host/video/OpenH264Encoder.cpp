@@ -8,7 +8,7 @@
 #include <mutex>
 #include <string>
 
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 #include "platform/host/HostLog.h"
 #include "platform/host/video/BitBudget.h"
 

@@ -1,4 +1,4 @@
-#include "rtp/Base64.h"
+#include "codec/Base64.h"
 
 void Base64Encode(const unsigned char* data, unsigned int length, std::string& out) {
     static const char kAlphabet[] =

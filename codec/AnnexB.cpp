@@ -1,4 +1,4 @@
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 
 size_t FindStartCode(const uint8_t* data, size_t size, size_t from) {
     for (size_t i = from; i + 3 <= size; ++i) {

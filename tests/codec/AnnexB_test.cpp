@@ -1,4 +1,4 @@
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 
 #include <gtest/gtest.h>
 

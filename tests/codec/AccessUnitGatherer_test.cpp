@@ -1,6 +1,6 @@
 // The picture gatherer: which calls deliver which pictures, byte for byte, and when a picture
 // is sent before its end is seen.
-#include "media/AccessUnitGatherer.h"
+#include "codec/AccessUnitGatherer.h"
 
 #include <gtest/gtest.h>
 

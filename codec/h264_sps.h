@@ -108,10 +108,14 @@ void h264_decode_hrd_parameters(bs_s* s, h264_hrd_t* hrd);
 
 // Parses an SPS given without its NAL header byte (emulation prevention still in place).
 // Returns the time_scale to keep: the SPS's own when it carries timing information, else
-// `previous_time_scale`. Complaints (sps_id over 31, more than 16 reorder frames) are printed
-// and do not stop the caller.
+// `previous_time_scale`. Complaints (sps_id over 31, more than 16 reorder frames) do not stop
+// it; h264_sps_complaint words them for the caller's trace, which keeps this layer pure.
 uint32_t h264_parse_sps(const uint8_t* data, unsigned size, uint32_t previous_time_scale,
                         h264_sps_t* sps);
+
+// The complaint about an SPS h264_parse_sps filled, written into `text` (cut to `size`).
+// False, with `text` empty, when there is none.
+bool h264_sps_complaint(const h264_sps_t& sps, char* text, size_t size);
 
 // The picture's displayed size from an SPS given with its NAL header byte (4:2:0 cropping).
 // False when the SPS is too short or gives a size over 16384 or cropped to nothing.

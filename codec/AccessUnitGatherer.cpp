@@ -1,9 +1,9 @@
-#include "media/AccessUnitGatherer.h"
+#include "codec/AccessUnitGatherer.h"
 
 #include <algorithm>
 #include <iterator>
 
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 
 namespace {
 

@@ -4,7 +4,7 @@
 #include <cstdint>
 #include <vector>
 
-#include "media/AnnexB.h"
+#include "codec/AnnexB.h"
 
 // Gathers the NAL units a recorder hands over (one or a few per call) into pictures for the
 // consumers beside the RTP rings, which send whole access units. A picture ends where the next

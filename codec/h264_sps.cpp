@@ -1,9 +1,9 @@
-#include "rtp/h264_sps.h"
+#include "codec/h264_sps.h"
 
 #include <cstring>
 #include <vector>
 
-#include "base/OrvexLog.h"
+#include <cstdio>
 
 namespace {
 
@@ -159,10 +159,7 @@ uint32_t h264_parse_sps(const uint8_t* data, unsigned size, uint32_t previous_ti
     sps->constraint_flags = bs_read(&s, 8);
     sps->level_idc = bs_read(&s, 8);
     sps->seq_parameter_set_id = bs_read_ue(&s);
-    if (sps->seq_parameter_set_id >= 32) {
-        OrvexPrint("invalid SPS (sps_id=%d)", static_cast<int>(sps->seq_parameter_set_id));
-        return previous_time_scale;
-    }
+    if (sps->seq_parameter_set_id >= 32) return previous_time_scale;
     // Every profile from 100 up carries the chroma and scaling fields here.
     if (sps->profile_idc >= 100) {
         sps->chroma_format_idc = bs_read_ue(&s);
@@ -206,10 +203,22 @@ uint32_t h264_parse_sps(const uint8_t* data, unsigned size, uint32_t previous_ti
     }
     sps->vui_parameters_present_flag = bs_read1(&s);
     if (sps->vui_parameters_present_flag) ReadVui(&s, sps);
-    if (sps->num_reorder_frames > 16) {
-        OrvexPrint("illegal num_reorder_frames %d\n", static_cast<int>(sps->num_reorder_frames));
-    }
     return sps->timing_info_present_flag ? sps->time_scale : previous_time_scale;
+}
+
+bool h264_sps_complaint(const h264_sps_t& sps, char* text, size_t size) {
+    int n = 0;
+    if (sps.seq_parameter_set_id >= 32) {
+        n = snprintf(text, size, "invalid SPS (sps_id=%d)",
+                     static_cast<int>(sps.seq_parameter_set_id));
+    } else if (sps.num_reorder_frames > 16) {
+        // The trailing newline is the television's text, printed inside the framing one.
+        n = snprintf(text, size, "illegal num_reorder_frames %d\n",
+                     static_cast<int>(sps.num_reorder_frames));
+    } else if (size > 0) {
+        text[0] = '\0';
+    }
+    return n > 0;
 }
 
 bool h264_picture_size(const uint8_t* sps, size_t size, uint16_t* width, uint16_t* height) {
