@@ -5,9 +5,9 @@
 
 #include "capture/LivecameraResolution.h"
 #include "codec/AnnexB.h"
+#include "codec/H264Packetiser.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
-#include "rtp/RtpPackets.h"
 #include "service/GlobalConfig.h"
 #include "stream/StreamFacts.h"
 

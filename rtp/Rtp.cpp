@@ -2,7 +2,7 @@
 
 #include <cstring>
 
-#include "rtp/RtpPackets.h"
+#include "codec/H264Packetiser.h"
 
 namespace {
 

@@ -5,8 +5,11 @@
 #include <cstdint>
 #include <vector>
 
-// The RTP packets of the system as pure functions over bytes, shared by the send sessions and
-// by the tracks' own transports, and the fan-out that sends each packet to every client.
+#include "codec/H264Packetiser.h"
+
+// The RTP packets of the send sessions as pure functions over bytes (the H.264 cutting itself is
+// codec/H264Packetiser's, shared with every other sender), and the fan-out that sends each
+// packet to every client.
 
 constexpr unsigned kRtpPacketMax = 1500;
 constexpr uint32_t kRtpSsrc = 10;  // every packet of every client
@@ -25,34 +28,6 @@ public:
     virtual ~PacketSink() = default;
     virtual void Send(const unsigned char* packet, unsigned length) = 0;
 };
-
-// RFC 3550 §5.1 header, V=2 and no CSRC. The low 8 bits of `payload_type` are ORed under the
-// marker bit unmasked (a type above 127 sets it); callers that want 7 bits mask.
-void WriteRtpHeader(unsigned char* p, bool marker, unsigned payload_type, uint16_t sequence,
-                    uint32_t timestamp, uint32_t ssrc);
-
-// How NAL units are cut into RTP payloads (RFC 6184).
-struct H264Packing {
-    unsigned single_max;    // the largest unit sent whole, as a single NAL unit packet
-    unsigned fragment_max;  // bytes of the unit carried by one FU-A fragment
-    bool clear_forbidden;   // F bit cleared in the single packet and in the FU indicator
-    // Fragments counted over the whole unit, header byte included, as the send sessions do: a
-    // unit of k * fragment_max + 1 bytes then ends with a fragment without payload.
-    bool count_header;
-};
-
-// Receives each RTP payload of a unit, built at packet + 12 so that the caller can write the
-// header in front. `end` marks the unit's last payload.
-class H264PayloadSink {
-public:
-    virtual ~H264PayloadSink() = default;
-    virtual void Payload(unsigned char* packet, unsigned length, bool end) = 0;
-};
-
-// Cuts one NAL unit (header byte first, `size` >= 1) into RTP payloads built one after another
-// in `packet`, which holds 12 + max(single_max, fragment_max + 2) bytes.
-void PacketiseH264Nal(const unsigned char* nal, unsigned size, const H264Packing& packing,
-                      unsigned char* packet, H264PayloadSink& sink);
 
 // One ring item (4-byte start code, then one NAL unit) as RTP (RFC 6184): a single NAL unit
 // packet up to 1400 bytes, else FU-A fragments of 1400 (§5.8). Each packet takes *sequence

@@ -14,10 +14,10 @@
 
 #include "base/Clocks.h"
 #include "base/OrvexLog.h"
+#include "codec/H264Packetiser.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
-#include "rtp/RtpPackets.h"
 #include "stream/KeyFrames.h"
 #include "stream/StreamFacts.h"
 #include "webrtc/DtlsCertificate.h"
