@@ -11,9 +11,9 @@
 #include <thread>
 #include <vector>
 
+#include "config/GlobalConfig.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendH264Rtp.h"
-#include "service/GlobalConfig.h"
 
 namespace {
 

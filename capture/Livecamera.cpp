@@ -5,11 +5,11 @@
 
 #include "base/OrvexLog.h"
 #include "capture/CameraParameters.h"
-#include "capture/LivecameraResolution.h"
-#include "capture/livepipmanager.h"
+#include "config/DumpSwitches.h"
+#include "config/GlobalConfig.h"
+#include "config/LivecameraResolution.h"
+#include "config/livepipmanager.h"
 #include "platform/Ports.h"
-#include "server/DumpSwitches.h"
-#include "service/GlobalConfig.h"
 
 namespace {
 

@@ -11,15 +11,15 @@
 #include "base/ThreadName.h"
 #include "capture/AudioSampleClock.h"
 #include "capture/DumpFile.h"
-#include "capture/LivecameraResolution.h"
 #include "capture/orvexAudioRecord.h"
+#include "config/DumpSwitches.h"
+#include "config/GlobalConfig.h"
+#include "config/LivecameraResolution.h"
 #include "media/cmnMemory.h"
 #include "platform/Ports.h"
 #include "platform/VoAacApi.h"
-#include "server/DumpSwitches.h"
 #include "server/skyvo_rtsp.h"
 #include "stream/FrameTap.h"
-#include "service/GlobalConfig.h"
 
 namespace {
 

@@ -3,12 +3,12 @@
 #include <cstdio>
 #include <cstring>
 
-#include "capture/LivecameraResolution.h"
 #include "codec/AnnexB.h"
 #include "codec/H264Packetiser.h"
+#include "config/GlobalConfig.h"
+#include "config/LivecameraResolution.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
-#include "service/GlobalConfig.h"
 #include "stream/StreamFacts.h"
 
 MediaStreamH264::MediaStreamH264(const char* name) : MediaStream(name, kMediaTypeH264) {}

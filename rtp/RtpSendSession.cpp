@@ -1,8 +1,8 @@
 #include "rtp/RtpSendSession.h"
 
 #include "base/OrvexLog.h"
+#include "config/GlobalConfig.h"
 #include "platform/LogPort.h"
-#include "service/GlobalConfig.h"
 
 namespace {
 // Only a lost wake-up would need it: writes and CloseSendThread end the wait.

@@ -9,11 +9,11 @@
 #include "base/ThreadName.h"
 #include "codec/Base64.h"
 #include "codec/h264_sps.h"
+#include "config/GlobalConfig.h"
 #include "platform/UniqueFd.h"
 #include "rtp/FrameLatency.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
-#include "service/GlobalConfig.h"
 #include "sync/LazyInstance.h"
 
 namespace {

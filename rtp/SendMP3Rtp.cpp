@@ -8,10 +8,10 @@
 
 #include "base/OrvexLog.h"
 #include "base/ThreadName.h"
+#include "config/GlobalConfig.h"
 #include "platform/UniqueFd.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
-#include "service/GlobalConfig.h"
 #include "sync/LazyInstance.h"
 
 namespace {

@@ -3,7 +3,7 @@
 #include <cctype>
 
 #include "base/OrvexLog.h"
-#include "capture/LivecameraResolution.h"
+#include "config/LivecameraResolution.h"
 #include "rtsp/KeyWordValue.h"
 #include "rtsp/RequestFields.h"
 

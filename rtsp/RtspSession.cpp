@@ -8,13 +8,13 @@
 #include <cstring>
 
 #include "base/OrvexLog.h"
-#include "capture/LivecameraResolution.h"
+#include "config/GlobalConfig.h"
+#include "config/LivecameraResolution.h"
 #include "platform/LogPort.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
 #include "rtsp/CaptureQuery.h"
 #include "rtsp/RequestFields.h"
-#include "service/GlobalConfig.h"
 #include "stream/KeyFrames.h"
 
 std::atomic<unsigned char> g_url_check_switch{0};

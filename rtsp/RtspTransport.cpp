@@ -13,16 +13,16 @@
 #include "base/Clocks.h"
 #include "base/OrvexLog.h"
 #include "base/ThreadName.h"
-#include "capture/LivecameraResolution.h"
-#include "capture/livepipmanager.h"
+#include "config/GlobalConfig.h"
+#include "config/LivecameraResolution.h"
+#include "config/QuitFlag.h"
+#include "config/livepipmanager.h"
 #include "platform/LogPort.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
 #include "rtsp/CaptureQuery.h"
 #include "rtsp/RtspResponse.h"
 #include "rtsp/RtspSession.h"
-#include "server/QuitFlag.h"
-#include "service/GlobalConfig.h"
 
 std::atomic<int> g_capture_running{0};
 std::atomic<unsigned> g_accepts_without_clients{0};

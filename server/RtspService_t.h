@@ -2,11 +2,11 @@
 
 #include <memory>
 
+#include "config/GlobalConfig.h"
 #include "media/MediaSession.h"
 #include "media/MediaStreamH264.h"
 #include "media/MediaStreamMP4A.h"
 #include "rtsp/RtspTransport.h"
-#include "service/GlobalConfig.h"
 
 // The process-wide streaming server behind the skyvo_* functions: the RTSP listener and the
 // presentation "skyvo" with its tracks "h264" and "aac".

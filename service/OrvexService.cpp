@@ -2,10 +2,10 @@
 
 #include "base/OrvexLog.h"
 #include "capture/DumpFile.h"
-#include "capture/LivecameraResolution.h"
 #include "codec/AnnexB.h"
+#include "config/DumpSwitches.h"
+#include "config/LivecameraResolution.h"
 #include "platform/Ports.h"
-#include "server/DumpSwitches.h"
 #include "server/skyvo_rtsp.h"
 
 namespace {

@@ -8,9 +8,9 @@
 
 #include "base/OrvexLog.h"
 #include "base/ThreadName.h"
+#include "config/GlobalConfig.h"
+#include "config/QuitFlag.h"
 #include "platform/Ports.h"
-#include "server/QuitFlag.h"
-#include "service/GlobalConfig.h"
 #include "service/OrvexService.h"
 #include "sync/thread_mutex.h"
 

@@ -17,7 +17,7 @@
 #include "auth/DigestGate.h"
 #include "base/Clocks.h"
 #include "base/OrvexLog.h"
-#include "capture/LivecameraResolution.h"
+#include "config/LivecameraResolution.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"

@@ -6,9 +6,9 @@
 #include <string>
 #include <vector>
 
-#include "capture/LivecameraResolution.h"
+#include "config/GlobalConfig.h"
+#include "config/LivecameraResolution.h"
 #include "platform/fake/FakePlatform.h"
-#include "service/GlobalConfig.h"
 
 namespace {
 

@@ -11,12 +11,12 @@
 
 #include "capture/DumpFile.h"
 #include "capture/orvexaudiomain.h"
+#include "config/DumpSwitches.h"
+#include "config/GlobalConfig.h"
 #include "platform/fake/FakePlatform.h"
-#include "server/DumpSwitches.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
-#include "service/GlobalConfig.h"
 
 namespace {
 

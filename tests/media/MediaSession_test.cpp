@@ -6,13 +6,13 @@
 #include <string>
 #include <vector>
 
-#include "capture/LivecameraResolution.h"
+#include "config/GlobalConfig.h"
+#include "config/LivecameraResolution.h"
 #include "media/MediaSession.h"
 #include "media/MediaSessionList.h"
 #include "media/MediaStreamH264.h"
 #include "media/MediaStreamMP4A.h"
 #include "platform/fake/FakePlatform.h"
-#include "service/GlobalConfig.h"
 
 namespace {
 

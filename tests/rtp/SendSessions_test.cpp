@@ -5,10 +5,10 @@
 #include <thread>
 #include <vector>
 
+#include "config/GlobalConfig.h"
 #include "platform/fake/FakePlatform.h"
 #include "rtp/SendH264Rtp.h"
 #include "rtp/SendMP3Rtp.h"
-#include "service/GlobalConfig.h"
 #include "tests/rtp/UdpReceiver.h"
 
 namespace {

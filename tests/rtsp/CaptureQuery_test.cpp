@@ -2,7 +2,7 @@
 
 #include <gtest/gtest.h>
 
-#include "capture/LivecameraResolution.h"
+#include "config/LivecameraResolution.h"
 #include "platform/fake/FakePlatform.h"
 
 namespace {

@@ -6,13 +6,13 @@
 #include <string>
 #include <vector>
 
+#include "config/GlobalConfig.h"
 #include "platform/fake/FakePlatform.h"
 #include "rtp/RtpPackets.h"
 #include "rtsp/RtspTransport.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_rtsp.h"
 #include "server/skyvo_service.h"
-#include "service/GlobalConfig.h"
 #include "tools/AccessUnitSplitter.h"
 
 namespace {

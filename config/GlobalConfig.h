@@ -5,7 +5,7 @@
 #include <string>
 
 #include "base/Clocks.h"  // the program's two clocks live with the configuration
-#include "capture/orvexPIPCfg.h"
+#include "config/orvexPIPCfg.h"
 #include "sync/TLock.h"
 
 // The process-wide configuration: stream parameters, readiness, pause and sub-stream state,

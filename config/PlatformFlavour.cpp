@@ -1,4 +1,4 @@
-#include "capture/PlatformFlavour.h"
+#include "config/PlatformFlavour.h"
 
 #include <cstring>
 

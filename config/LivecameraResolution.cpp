@@ -1,4 +1,4 @@
-#include "capture/LivecameraResolution.h"
+#include "config/LivecameraResolution.h"
 
 #include <cstdio>
 #include <cstdlib>
@@ -6,9 +6,9 @@
 #include <memory>
 
 #include "base/OrvexLog.h"
-#include "capture/livepipmanager.h"
+#include "config/DumpSwitches.h"
+#include "config/livepipmanager.h"
 #include "platform/Ports.h"
-#include "server/DumpSwitches.h"
 #include "sync/TLock.h"
 
 namespace {

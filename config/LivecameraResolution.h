@@ -3,7 +3,7 @@
 #include <atomic>
 #include <string>
 
-#include "capture/PlatformFlavour.h"
+#include "config/PlatformFlavour.h"
 
 // The capture parameters a client chose, the platform facts they are checked against, and the
 // table of capture sizes the television's camera accepts.

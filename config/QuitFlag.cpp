@@ -1,4 +1,4 @@
-#include "server/QuitFlag.h"
+#include "config/QuitFlag.h"
 
 #include <atomic>
 

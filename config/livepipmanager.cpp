@@ -1,4 +1,4 @@
-#include "capture/livepipmanager.h"
+#include "config/livepipmanager.h"
 
 #include <memory>
 

@@ -1,4 +1,4 @@
-#include "service/GlobalConfig.h"
+#include "config/GlobalConfig.h"
 
 #include <cstring>
 

@@ -1,13 +1,13 @@
-#include "capture/LivecameraResolution.h"
+#include "config/LivecameraResolution.h"
 
 #include <gtest/gtest.h>
 
 #include <string>
 #include <vector>
 
-#include "capture/livepipmanager.h"
+#include "config/DumpSwitches.h"
+#include "config/livepipmanager.h"
 #include "platform/fake/FakePlatform.h"
-#include "server/DumpSwitches.h"
 
 namespace {
 

@@ -3,9 +3,9 @@
 #include <string>
 #include <vector>
 
-#include "capture/PlatformFlavour.h"
-#include "capture/livepipmanager.h"
-#include "capture/orvexPIPCfg.h"
+#include "config/PlatformFlavour.h"
+#include "config/livepipmanager.h"
+#include "config/orvexPIPCfg.h"
 #include "platform/fake/FakePlatform.h"
 
 namespace {

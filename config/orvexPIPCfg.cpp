@@ -1,4 +1,4 @@
-#include "capture/orvexPIPCfg.h"
+#include "config/orvexPIPCfg.h"
 
 #include "base/OrvexLog.h"
 

@@ -1,4 +1,4 @@
-#include "server/DumpSwitches.h"
+#include "config/DumpSwitches.h"
 
 #include <atomic>
 

@@ -4,7 +4,7 @@
 #include <memory>
 #include <string>
 
-#include "capture/PlatformFlavour.h"
+#include "config/PlatformFlavour.h"
 #include "platform/AudioManagerPort.h"
 #include "platform/PipManagerPort.h"
 
