@@ -3,7 +3,7 @@
 #include <cstdint>
 
 #include "media/Buffer.h"
-#include "rtp/Udp.h"
+#include "net/Udp.h"
 
 // RTP header size (RFC 3550 §5.1, no CSRC, no extension).
 constexpr int kRtpHeaderSize = 12;

@@ -3,7 +3,7 @@
 #include <list>
 #include <string>
 
-#include "rtsp/Tcp.h"
+#include "net/Tcp.h"
 
 // RTSP text lines over a Tcp connection: reads request lines, writes header lines with their
 // CR LF, queues the header fields of the next answer and splits rtsp:// URLs. With debug

@@ -1,4 +1,4 @@
-#include "rtsp/Socket.h"
+#include "net/Socket.h"
 
 #include <arpa/inet.h>
 #include <poll.h>

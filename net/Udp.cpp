@@ -1,4 +1,4 @@
-#include "rtp/Udp.h"
+#include "net/Udp.h"
 
 #include <arpa/inet.h>
 #include <sys/socket.h>

@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "rtsp/Socket.h"
+#include "net/Socket.h"
 
 // A stream socket: opened (created and bound), connected, or wrapping an accepted connection.
 // Thread contract: NOT thread safe; used by its connection's thread.

@@ -1,12 +1,12 @@
-#include "rtsp/Socket.h"
+#include "net/Socket.h"
 
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
 
 #include <thread>
 
+#include "net/Tcp.h"
 #include "rtsp/Rtsp.h"
-#include "rtsp/Tcp.h"
 #include "tests/rtsp/SocketPair.h"
 
 namespace {

@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "rtsp/Socket.h"
+#include "net/Socket.h"
 
 // A datagram socket: binds the server side of an RTP port pair, joins a multicast group when
 // the address asks for it, and can be connected to one peer.

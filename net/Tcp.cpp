@@ -1,4 +1,4 @@
-#include "rtsp/Tcp.h"
+#include "net/Tcp.h"
 
 #include <arpa/inet.h>
 #include <sys/socket.h>
