@@ -5,7 +5,7 @@
 #include <cmath>
 #include <vector>
 
-#include "media/cmnMemory.h"
+#include "buffers/cmnMemory.h"
 #include "platform/VoAacApi.h"
 #include "platform/host/HostAudio.h"
 

@@ -6,7 +6,7 @@
 #include <memory>
 #include <vector>
 
-#include "media/cycle_buffer.h"
+#include "buffers/cycle_buffer.h"
 
 namespace {
 

@@ -3,7 +3,7 @@
 #include <atomic>
 #include <cstddef>
 
-#include "media/cycle_buffer.h"
+#include "buffers/cycle_buffer.h"
 
 // The television's sound: a PCM thread reads the platform's audio record into the PCM ring,
 // an encoder thread encodes 20 ms blocks to AAC (ADTS) with the platform's loadable encoder

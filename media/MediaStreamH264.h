@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "media/Buffer.h"
+#include "buffers/Buffer.h"
 #include "media/MediaStream.h"
 
 // The H.264 track: SDP with the fixed parameter sets chosen by the capture width, and an

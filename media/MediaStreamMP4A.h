@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <string>
 
-#include "media/Buffer.h"
+#include "buffers/Buffer.h"
 #include "media/MediaStream.h"
 
 // The AAC track: SDP (MPEG4-GENERIC, AAC-hbr) and an RFC 3640 packetiser for ADTS frames.

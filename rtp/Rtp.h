@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "media/Buffer.h"
+#include "buffers/Buffer.h"
 #include "net/Udp.h"
 
 // RTP header size (RFC 3550 §5.1, no CSRC, no extension).

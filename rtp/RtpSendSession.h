@@ -7,7 +7,7 @@
 #include <cstdint>
 #include <string>
 
-#include "media/cycle_buffer.h"
+#include "buffers/cycle_buffer.h"
 #include "rtp/DestSocketTable.h"
 #include "sync/TLock.h"
 

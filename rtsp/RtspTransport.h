@@ -10,8 +10,8 @@
 #include <set>
 #include <string>
 
+#include "buffers/cycle_buffer.h"
 #include "media/MediaSessionList.h"
-#include "media/cycle_buffer.h"
 #include "platform/UniqueFd.h"
 #include "rtsp/RtspAccess.h"
 #include "stream/CaptureChoice.h"
@@ -28,7 +28,7 @@ void CloseVideoAndAudioDecodeAndSend();
 // the rules that start capture with the first PLAY and stop it when a client goes away.
 // A client whose connection becomes readable is served exclusively until it leaves.
 // Thread contract: Open and CloseAll from the controlling thread; the add_* producers from any
-// threads (the rings' producer contract, media/cycle_buffer.h); HoldCapture, ReleaseCapture and
+// threads (the rings' producer contract, buffers/cycle_buffer.h); HoldCapture, ReleaseCapture and
 // Wake from any thread; everything else runs on the listener thread.
 class RtspTransport : public MediaSessionList, public stream::CaptureDemand {
 public:

@@ -4,7 +4,7 @@
 // Pointers are the caller's and are not kept, except the quit flag (set_live_quit_flag_var),
 // which must outlive the server. Thread contract: init, open, close, the configuration and
 // the registrations from the main thread; skyvo_add_h264_data and skyvo_add_mp3_data from any
-// threads at any time (the rings' producer contract: media/cycle_buffer.h; close waits for the
+// threads at any time (the rings' producer contract: buffers/cycle_buffer.h; close waits for the
 // calls under way).
 
 #ifdef __cplusplus

@@ -11,7 +11,7 @@ namespace android {
 // encoded H.264 frame: int32 length, the frame in place (Annex B, starting 00 00 00 01), an
 // int32 that is ignored. Parameter-set buffers are split into their NAL units first.
 // Thread contract: onTransact runs on any binder pool thread, several at once; each frame lands
-// whole in the video ring (its producer contract: media/cycle_buffer.h) in the order the calls
+// whole in the video ring (its producer contract: buffers/cycle_buffer.h) in the order the calls
 // reach it, which is the recorder's order since it sends one frame after another.
 class OrvexService : public platform::BinderService {
 public:

@@ -1,4 +1,4 @@
-#include "media/Buffer.h"
+#include "buffers/Buffer.h"
 
 #include <cstring>
 

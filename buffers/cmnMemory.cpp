@@ -1,4 +1,4 @@
-#include "media/cmnMemory.h"
+#include "buffers/cmnMemory.h"
 
 #include <cstdlib>
 #include <cstring>

@@ -1,4 +1,4 @@
-#include "media/cycle_buffer.h"
+#include "buffers/cycle_buffer.h"
 
 #include <chrono>
 #include <cstring>

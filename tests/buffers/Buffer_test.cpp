@@ -1,11 +1,11 @@
-#include "media/Buffer.h"
+#include "buffers/Buffer.h"
 
 #include <gtest/gtest.h>
 
 #include <cstring>
 #include <string>
 
-#include "media/cmnMemory.h"
+#include "buffers/cmnMemory.h"
 
 namespace {
 
