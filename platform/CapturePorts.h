@@ -27,6 +27,10 @@ public:
     virtual int setParameters(const std::string& flattened) = 0;
     virtual int unlock() = 0;
     virtual int lock() = 0;
+    // Whether the camera's own process still holds it (no unlock since the last lock): a
+    // recorder cannot record from such a camera. False where the platform cannot tell; its
+    // recorder then judges for itself.
+    virtual bool locked() { return false; }
 };
 
 class CameraPort {

@@ -110,6 +110,24 @@ TEST(HostSourceValues, ParseEveryFormAndRefuseTheRest) {
     }
 }
 
+// The recorder asks the camera port whether its owner still holds it, whatever camera it is
+// handed: the host's own, or another platform's (here a stand-in that is always held).
+TEST_F(HostCaptureTest, ARecorderRefusesACameraItsOwnerStillHolds) {
+    struct HeldCamera final : platform::Camera {
+        std::string getParameters() override { return ""; }
+        int setParameters(const std::string&) override { return 0; }
+        int unlock() override { return 0; }
+        int lock() override { return 0; }
+        bool locked() override { return true; }
+    };
+    HostCamera host;
+    HeldCamera held;
+    EXPECT_EQ(HostMediaRecorder().setCamera(host), HostMediaRecorder::kInvalidOperation);
+    EXPECT_EQ(HostMediaRecorder().setCamera(held), HostMediaRecorder::kInvalidOperation);
+    host.unlock();
+    EXPECT_EQ(HostMediaRecorder().setCamera(host), 0);
+}
+
 TEST_F(HostCaptureTest, UnknownValuesAreReportedAndTheDefaultIsUsed) {
     properties_.Set("orvex.host.video", "webcam");
     properties_.Set("orvex.host.video.sub", "x11");

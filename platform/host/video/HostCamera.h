@@ -21,8 +21,8 @@ public:
     int unlock() override;
     int lock() override;
 
-    // Whether the camera's own process holds it (true until unlock hands it to a recorder).
-    bool locked();
+    // True until unlock hands it to a recorder.
+    bool locked() override;
 
 private:
     std::mutex mutex_;

@@ -17,7 +17,6 @@
 #include "platform/Ports.h"
 #include "platform/host/HostLog.h"
 #include "platform/host/capture/GstSource.h"
-#include "platform/host/video/HostCamera.h"
 
 namespace platform {
 namespace host {
@@ -61,8 +60,7 @@ int HostMediaRecorder::settable() const { return state_ == State::kIdle ? 0 : kI
 int HostMediaRecorder::setCamera(Camera& camera) {
     if (int rc = settable()) return rc;
     // The platform's recorder cannot record from a camera its owner still holds.
-    auto* host_camera = dynamic_cast<HostCamera*>(&camera);
-    if (host_camera != nullptr && host_camera->locked()) return kInvalidOperation;
+    if (camera.locked()) return kInvalidOperation;
     sub_ = SubWindow(camera.getParameters());
     return 0;
 }
