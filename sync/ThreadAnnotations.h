@@ -13,3 +13,6 @@
 #define ORVEX_ACQUIRE(...) ORVEX_TSA(acquire_capability(__VA_ARGS__))
 #define ORVEX_RELEASE(...) ORVEX_TSA(release_capability(__VA_ARGS__))
 #define ORVEX_REQUIRES(...) ORVEX_TSA(requires_capability(__VA_ARGS__))
+// For a function the analysis cannot follow, such as a predicate a waiter calls under its lock;
+// its contract says which lock it runs under.
+#define ORVEX_NO_THREAD_SAFETY_ANALYSIS ORVEX_TSA(no_thread_safety_analysis)

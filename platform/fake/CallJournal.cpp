@@ -1,20 +1,22 @@
 #include "platform/fake/CallJournal.h"
 
+#include "sync/thread_mutex.h"
+
 namespace platform {
 namespace fake {
 
 void CallJournal::Add(std::string call) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     calls_.push_back(std::move(call));
 }
 
 std::vector<std::string> CallJournal::Calls() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     return calls_;
 }
 
 void CallJournal::Clear() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     calls_.clear();
 }
 

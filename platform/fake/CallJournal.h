@@ -1,8 +1,9 @@
 #pragma once
 
-#include <mutex>
 #include <string>
 #include <vector>
+
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace fake {
@@ -17,8 +18,8 @@ public:
     void Clear();
 
 private:
-    std::mutex mutex_;
-    std::vector<std::string> calls_;
+    thread_mutex mutex_;
+    std::vector<std::string> calls_ ORVEX_GUARDED_BY(mutex_);
 };
 
 }  // namespace fake

@@ -4,6 +4,8 @@
 
 #include <cstring>
 
+#include "sync/thread_mutex.h"
+
 namespace platform {
 namespace fake {
 namespace {
@@ -114,18 +116,18 @@ private:
 }  // namespace
 
 void FakeResults::Set(const std::string& call, int result) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     results_[call] = result;
 }
 
 int FakeResults::Get(const std::string& call) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     auto it = results_.find(call);
     return it == results_.end() ? 0 : it->second;
 }
 
 void FakeResults::Clear() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     results_.clear();
 }
 
@@ -214,7 +216,7 @@ int FakeBinder::initWithDriver(const char* driver) {
 
 int FakeBinder::addService(const char* name, std::shared_ptr<BinderService> service) {
     journal_.Add(std::string("addService(") + name + ")");
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     services_[name] = std::move(service);
     return 0;
 }
@@ -229,7 +231,7 @@ int FakeBinder::transact(const char* service, uint32_t code, const ParcelWriter&
 }
 
 std::shared_ptr<BinderService> FakeBinder::service(const std::string& name) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     auto it = services_.find(name);
     return it == services_.end() ? nullptr : it->second;
 }

@@ -4,13 +4,13 @@
 
 #include <map>
 #include <memory>
-#include <mutex>
 #include <string>
 
 #include "platform/AudioPorts.h"
 #include "platform/BinderPort.h"
 #include "platform/CapturePorts.h"
 #include "platform/fake/CallJournal.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace fake {
@@ -25,8 +25,8 @@ public:
     void Clear();
 
 private:
-    std::mutex mutex_;
-    std::map<std::string, int> results_;
+    thread_mutex mutex_;
+    std::map<std::string, int> results_ ORVEX_GUARDED_BY(mutex_);
 };
 
 // Camera, recorder, TV manager and PX audio output that record every call with its arguments.
@@ -137,8 +137,8 @@ public:
 
 private:
     CallJournal& journal_;
-    std::mutex mutex_;
-    std::map<std::string, std::shared_ptr<BinderService>> services_;
+    thread_mutex mutex_;
+    std::map<std::string, std::shared_ptr<BinderService>> services_ ORVEX_GUARDED_BY(mutex_);
 };
 
 }  // namespace fake

@@ -1,10 +1,10 @@
 #pragma once
 
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "platform/LogPort.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace fake {
@@ -28,8 +28,8 @@ public:
     void Clear();
 
 private:
-    std::mutex mutex_;
-    std::vector<Entry> entries_;
+    thread_mutex mutex_;
+    std::vector<Entry> entries_ ORVEX_GUARDED_BY(mutex_);
 };
 
 }  // namespace fake

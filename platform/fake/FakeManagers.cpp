@@ -2,6 +2,8 @@
 
 #include <string>
 
+#include "sync/thread_mutex.h"
+
 namespace platform {
 namespace fake {
 namespace {
@@ -27,7 +29,7 @@ public:
     explicit FakePipClient(FakePipManager& owner) : owner_(owner) {}
     int setListener(std::shared_ptr<PipManagerListener> listener) override {
         owner_.journal_.Add("PipManager::setListener");
-        std::lock_guard<std::mutex> hold(owner_.mutex_);
+        thread_mutex::Scoped hold(owner_.mutex_);
         owner_.listener_ = std::move(listener);
         return owner_.listener_result_;
     }
@@ -44,7 +46,7 @@ std::shared_ptr<PipManagerClient> FakePipManager::connect() {
 }
 
 std::shared_ptr<PipManagerListener> FakePipManager::listener() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     return listener_;
 }
 

@@ -2,11 +2,11 @@
 
 #include <atomic>
 #include <memory>
-#include <mutex>
 
 #include "platform/AudioManagerPort.h"
 #include "platform/PipManagerPort.h"
 #include "platform/fake/CallJournal.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace fake {
@@ -30,8 +30,8 @@ private:
     CallJournal& journal_;
     std::atomic<bool> connectable_{true};
     std::atomic<int> listener_result_{0};
-    std::mutex mutex_;
-    std::shared_ptr<PipManagerListener> listener_;
+    thread_mutex mutex_;
+    std::shared_ptr<PipManagerListener> listener_ ORVEX_GUARDED_BY(mutex_);
 };
 
 // Audio manager that records its calls in the journal.

@@ -2,13 +2,15 @@
 
 #include <cstring>
 
+#include "sync/thread_mutex.h"
+
 namespace platform {
 namespace fake {
 
 int FakeProperties::Get(const char* key, char* value, const char* default_value) {
     std::string text = default_value != nullptr ? default_value : "";
     {
-        std::lock_guard<std::mutex> hold(mutex_);
+        thread_mutex::Scoped hold(mutex_);
         auto it = key != nullptr ? values_.find(key) : values_.end();
         if (it != values_.end() && !it->second.empty()) text = it->second;
     }
@@ -19,12 +21,12 @@ int FakeProperties::Get(const char* key, char* value, const char* default_value)
 }
 
 void FakeProperties::Set(const std::string& key, const std::string& value) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     values_[key] = value;
 }
 
 void FakeProperties::Clear() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     values_.clear();
 }
 

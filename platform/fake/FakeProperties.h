@@ -1,10 +1,10 @@
 #pragma once
 
 #include <map>
-#include <mutex>
 #include <string>
 
 #include "platform/PropertyPort.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace fake {
@@ -18,8 +18,8 @@ public:
     void Clear();
 
 private:
-    std::mutex mutex_;
-    std::map<std::string, std::string> values_;
+    thread_mutex mutex_;
+    std::map<std::string, std::string> values_ ORVEX_GUARDED_BY(mutex_);
 };
 
 }  // namespace fake

@@ -1,5 +1,7 @@
 #include "platform/fake/FakePublish.h"
 
+#include "sync/thread_mutex.h"
+
 namespace platform {
 namespace fake {
 
@@ -21,7 +23,7 @@ private:
 };
 
 std::unique_ptr<PublishSession> FakePublish::Open(const PublishTarget& target, std::string* error) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     ++attempts_;
     changed_.notify_all();
     if (refuse_) {
@@ -36,11 +38,11 @@ std::unique_ptr<PublishSession> FakePublish::Open(const PublishTarget& target, s
 
 bool FakePublish::Record(int session, bool video, bool key, int64_t pts, const uint8_t* data,
                          size_t len, const std::atomic<bool>* stop) {
-    std::unique_lock<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     // A stalled server: the write waits as a full socket would, until the stall ends or the
     // owner stops (polled, as the host's interrupt callback polls the flag).
     while (stall_ && (stop == nullptr || !stop->load())) {
-        changed_.wait_for(hold, std::chrono::milliseconds(5));
+        changed_.wait_for(mutex_, std::chrono::milliseconds(5));
     }
     if (drop_ || (stop != nullptr && stop->load())) return false;
     writes_.push_back(Write{session, video, key, pts, std::vector<uint8_t>(data, data + len)});
@@ -49,33 +51,33 @@ bool FakePublish::Record(int session, bool video, bool key, int64_t pts, const u
 }
 
 void FakePublish::SetRefuse(bool refuse) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     refuse_ = refuse;
 }
 
 void FakePublish::DropConnection() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     drop_ = true;
 }
 
 void FakePublish::SetStall(bool stall) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     stall_ = stall;
     changed_.notify_all();
 }
 
 int FakePublish::attempts() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     return attempts_;
 }
 
 std::vector<PublishTarget> FakePublish::opened() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     return opened_;
 }
 
 std::vector<FakePublish::Write> FakePublish::writes() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     return writes_;
 }
 

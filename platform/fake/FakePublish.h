@@ -2,13 +2,12 @@
 
 #include <atomic>
 #include <chrono>
-#include <condition_variable>
 #include <cstdint>
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "platform/PublishPort.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace fake {
@@ -42,29 +41,37 @@ public:
     // Waits up to `ms` for `pred()` to hold, under the fake's lock.
     template <typename Pred>
     bool WaitFor(int ms, Pred pred) {
-        std::unique_lock<std::mutex> hold(mutex_);
-        return changed_.wait_for(hold, std::chrono::milliseconds(ms), [&] { return pred(*this); });
+        const auto until = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
+        thread_mutex::Scoped hold(mutex_);
+        while (!pred(*this)) {
+            if (!changed_.wait_until(mutex_, until)) return pred(*this);
+        }
+        return true;
     }
 
-    // Read under WaitFor's lock.
-    int attempts_locked() const { return attempts_; }
-    size_t writes_locked() const { return writes_.size(); }
-    int sessions_locked() const { return static_cast<int>(opened_.size()); }
-    int64_t last_pts_locked() const { return writes_.empty() ? -1 : writes_.back().pts_ms; }
+    // Read under WaitFor's lock, by its predicate.
+    int attempts_locked() const ORVEX_NO_THREAD_SAFETY_ANALYSIS { return attempts_; }
+    size_t writes_locked() const ORVEX_NO_THREAD_SAFETY_ANALYSIS { return writes_.size(); }
+    int sessions_locked() const ORVEX_NO_THREAD_SAFETY_ANALYSIS {
+        return static_cast<int>(opened_.size());
+    }
+    int64_t last_pts_locked() const ORVEX_NO_THREAD_SAFETY_ANALYSIS {
+        return writes_.empty() ? -1 : writes_.back().pts_ms;
+    }
 
 private:
     friend class FakePublishSession;
     bool Record(int session, bool video, bool key, int64_t pts, const uint8_t* data, size_t len,
                 const std::atomic<bool>* stop);
 
-    std::mutex mutex_;
-    std::condition_variable changed_;
-    bool refuse_ = false;
-    bool drop_ = false;
-    bool stall_ = false;
-    int attempts_ = 0;
-    std::vector<PublishTarget> opened_;
-    std::vector<Write> writes_;
+    thread_mutex mutex_;
+    thread_condition changed_;
+    bool refuse_ ORVEX_GUARDED_BY(mutex_) = false;
+    bool drop_ ORVEX_GUARDED_BY(mutex_) = false;
+    bool stall_ ORVEX_GUARDED_BY(mutex_) = false;
+    int attempts_ ORVEX_GUARDED_BY(mutex_) = 0;
+    std::vector<PublishTarget> opened_ ORVEX_GUARDED_BY(mutex_);
+    std::vector<Write> writes_ ORVEX_GUARDED_BY(mutex_);
 };
 
 }  // namespace fake

@@ -23,6 +23,7 @@
 #include "platform/Ports.h"
 #include "platform/host/BinderWire.h"
 #include "platform/host/HostLog.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -104,7 +105,7 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
         HostLogf(kLogDebug, "binder: socket path too long: %s", shown.c_str());
         return -ENAMETOOLONG;
     }
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     if (stopping_ || !epoll_fd_.valid()) return -EINVAL;
     struct stat st {};
     if (!abstract) {
@@ -171,7 +172,7 @@ int HostBinder::addService(const char* name, std::shared_ptr<BinderService> serv
 }
 
 void HostBinder::startThreadPool() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     if (started_ || stopping_ || !epoll_fd_.valid()) return;
     started_ = true;
     for (int i = 0; i < pool_size_; ++i) {
@@ -290,7 +291,7 @@ int HostBinder::Dispatch(BinderService& service, uint32_t code, ParcelReader& re
 }
 
 std::shared_ptr<BinderService> HostBinder::LocalService(const char* name) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     if (stopping_) return nullptr;
     for (const auto& listener : listeners_) {
         if (listener->name == name) return listener->service;
@@ -299,33 +300,37 @@ std::shared_ptr<BinderService> HostBinder::LocalService(const char* name) {
 }
 
 bool HostBinder::TrackConnection(int fd) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     if (stopping_) return false;
     serving_.push_back(fd);
     return true;
 }
 
 void HostBinder::UntrackConnection(int fd) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     serving_.erase(std::remove(serving_.begin(), serving_.end(), fd), serving_.end());
 }
 
 void HostBinder::Stop() {
+    // Taken out under the lock and joined outside it: a pool thread takes the lock to end.
+    std::vector<std::thread> pool;
+    std::vector<std::unique_ptr<Listener>> listeners;
     {
-        std::lock_guard<std::mutex> hold(mutex_);
+        thread_mutex::Scoped hold(mutex_);
         if (stopping_) return;
         stopping_ = true;
         // Wakes threads blocked on a client; they close the descriptor themselves.
         for (int fd : serving_) shutdown(fd, SHUT_RDWR);
+        pool.swap(pool_);
+        listeners.swap(listeners_);
     }
     if (wake_fd_.valid()) {
         uint64_t one = 1;
         ssize_t ignored = write(wake_fd_.get(), &one, sizeof one);
         (void)ignored;
     }
-    for (std::thread& t : pool_) t.join();
-    pool_.clear();
-    for (auto& listener : listeners_) {
+    for (std::thread& t : pool) t.join();
+    for (auto& listener : listeners) {
         close(listener->fd);  // an abstract name goes with its socket
         // Only our own file: a newer service may have taken the name since.
         struct stat st;
@@ -334,12 +339,11 @@ void HostBinder::Stop() {
             unlink(listener->path.c_str());
         }
     }
-    listeners_.clear();
     epoll_fd_.reset();
     wake_fd_.reset();
-    std::lock_guard<std::mutex> hold(outgoing_mutex_);
+    thread_mutex::Scoped hold(outgoing_mutex_);
     for (auto& entry : outgoing_) {
-        std::lock_guard<std::mutex> hold_out(entry.second->mutex);
+        thread_mutex::Scoped hold_out(entry.second->mutex);
         if (entry.second->fd >= 0) close(entry.second->fd);
         entry.second->fd = -1;
     }

@@ -6,13 +6,13 @@
 #include <cstdint>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
 
 #include "platform/BinderPort.h"
 #include "platform/UniqueFd.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -90,8 +90,8 @@ private:
         std::shared_ptr<BinderService> service;
     };
     struct Outgoing {
-        std::mutex mutex;
-        int fd = -1;
+        thread_mutex mutex;
+        int fd ORVEX_GUARDED_BY(mutex) = -1;
     };
 
     static int Dispatch(BinderService& service, uint32_t code, ParcelReader& reader,
@@ -104,7 +104,7 @@ private:
     void UntrackConnection(int fd);
     Outgoing& OutgoingFor(const std::string& service);
     int TransactOn(Outgoing& out, const std::string& path, const uint8_t header[12],
-                   const std::vector<uint8_t>& data);
+                   const std::vector<uint8_t>& data) ORVEX_REQUIRES(out.mutex);
 
     const std::string dir_;
     const int pool_size_;
@@ -114,15 +114,15 @@ private:
 
     std::atomic<bool> refused_told_{false};  // another user's connection was logged once
 
-    std::mutex mutex_;  // guards what follows
-    bool stopping_ = false;
-    bool started_ = false;
-    std::vector<std::unique_ptr<Listener>> listeners_;
-    std::vector<int> serving_;
-    std::vector<std::thread> pool_;
+    thread_mutex mutex_;
+    bool stopping_ ORVEX_GUARDED_BY(mutex_) = false;
+    bool started_ ORVEX_GUARDED_BY(mutex_) = false;
+    std::vector<std::unique_ptr<Listener>> listeners_ ORVEX_GUARDED_BY(mutex_);
+    std::vector<int> serving_ ORVEX_GUARDED_BY(mutex_);
+    std::vector<std::thread> pool_ ORVEX_GUARDED_BY(mutex_);
 
-    std::mutex outgoing_mutex_;
-    std::map<std::string, std::unique_ptr<Outgoing>> outgoing_;
+    thread_mutex outgoing_mutex_;
+    std::map<std::string, std::unique_ptr<Outgoing>> outgoing_ ORVEX_GUARDED_BY(outgoing_mutex_);
 };
 
 }  // namespace host

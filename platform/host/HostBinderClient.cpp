@@ -4,6 +4,7 @@
 
 #include "platform/host/BinderWire.h"
 #include "platform/host/HostBinder.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -11,7 +12,7 @@ namespace host {
 using namespace binder_wire;
 
 HostBinder::Outgoing& HostBinder::OutgoingFor(const std::string& service) {
-    std::lock_guard<std::mutex> hold(outgoing_mutex_);
+    thread_mutex::Scoped hold(outgoing_mutex_);
     std::unique_ptr<Outgoing>& out = outgoing_[service];
     if (out == nullptr) out = std::make_unique<Outgoing>();
     return *out;
@@ -22,7 +23,7 @@ int HostBinder::transact(const char* service, uint32_t code, const ParcelWriter&
     uint8_t header[kHeaderSize];
     WriteHeader(Header{code, 0, static_cast<uint32_t>(data.data().size())}, header);
     Outgoing& out = OutgoingFor(service);
-    std::lock_guard<std::mutex> hold(out.mutex);
+    thread_mutex::Scoped hold(out.mutex);
     if (std::shared_ptr<BinderService> local = LocalService(service)) {
         ParcelReader reader(data.data().data(), data.data().size());
         return Dispatch(*local, code, reader, 0);

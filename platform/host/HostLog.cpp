@@ -13,6 +13,7 @@
 #include <ctime>
 
 #include "platform/Ports.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -97,7 +98,7 @@ void HostLog::WriteLine(int priority, const char* tag, const char* line, size_t 
     localtime_r(&tv.tv_sec, &local);
     char when[32];
     strftime(when, sizeof when, "%m-%d %H:%M:%S", &local);
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     FILE* out = sink_ == Sink::kFile ? file_ : stderr;
     fprintf(out, "%s.%03ld %5d %5ld %c %s: %.*s\n", when, static_cast<long>(tv.tv_usec / 1000),
             static_cast<int>(getpid()), static_cast<long>(syscall(SYS_gettid)),

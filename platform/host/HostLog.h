@@ -2,10 +2,10 @@
 
 #include <atomic>
 #include <cstdio>
-#include <mutex>
 #include <string>
 
 #include "platform/LogPort.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -31,7 +31,9 @@ private:
     enum class Sink { kStderr, kSyslog, kFile };
     void WriteLine(int priority, const char* tag, const char* line, size_t len);
 
-    std::mutex mutex_;
+    // Held for each whole line, so that lines of concurrent threads do not interleave on the
+    // stream; the sink and its file are chosen by the constructor and fixed after.
+    thread_mutex mutex_;
     Sink sink_ = Sink::kStderr;
     FILE* file_ = nullptr;
     const int least_priority_;

@@ -3,6 +3,7 @@
 #include <cstdio>
 
 #include "platform/Ports.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -73,7 +74,7 @@ public:
     explicit HostPipClient(HostPipManager& owner) : owner_(owner) {}
     int setListener(std::shared_ptr<PipManagerListener> listener) override {
         Note("PipManager::setListener");
-        std::lock_guard<std::mutex> hold(owner_.mutex_);
+        thread_mutex::Scoped hold(owner_.mutex_);
         owner_.listener_ = std::move(listener);
         return 0;
     }
@@ -89,7 +90,7 @@ std::shared_ptr<PipManagerClient> HostPipManager::connect() {
 }
 
 std::shared_ptr<PipManagerListener> HostPipManager::listener() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     return listener_;
 }
 

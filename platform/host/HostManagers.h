@@ -1,11 +1,11 @@
 #pragma once
 
 #include <memory>
-#include <mutex>
 
 #include "platform/AudioManagerPort.h"
 #include "platform/CapturePorts.h"
 #include "platform/PipManagerPort.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -21,8 +21,8 @@ public:
 
 private:
     friend class HostPipClient;
-    std::mutex mutex_;
-    std::shared_ptr<PipManagerListener> listener_;
+    thread_mutex mutex_;
+    std::shared_ptr<PipManagerListener> listener_ ORVEX_GUARDED_BY(mutex_);
 };
 
 class HostAudioManager final : public AudioManagerPort {

@@ -7,6 +7,8 @@
 #include <fstream>
 #include <sstream>
 
+#include "sync/thread_mutex.h"
+
 namespace platform {
 namespace host {
 namespace {
@@ -45,6 +47,7 @@ HostProperties::HostProperties(const std::string& paths) {
 }
 
 std::vector<std::string> HostProperties::paths() const {
+    thread_mutex::Scoped hold(mutex_);
     std::vector<std::string> out;
     for (const File& f : files_) out.push_back(f.path);
     return out;
@@ -97,7 +100,7 @@ const std::string* HostProperties::Find(const std::string& key) {
 }
 
 bool HostProperties::Lookup(const std::string& key, std::string* value) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     const std::string* found = Find(key);
     if (found == nullptr || found->empty()) return false;
     *value = *found;
@@ -105,7 +108,7 @@ bool HostProperties::Lookup(const std::string& key, std::string* value) {
 }
 
 int HostProperties::Get(const char* key, char* value, const char* default_value) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     const std::string* found = key != nullptr ? Find(key) : nullptr;
     // As on the television, an empty value reads as unset.
     if (found != nullptr && !found->empty()) return CopyOut(found->c_str(), value);

@@ -4,11 +4,11 @@
 
 #include <ctime>
 #include <map>
-#include <mutex>
 #include <string>
 #include <vector>
 
 #include "platform/PropertyPort.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -42,10 +42,10 @@ private:
     };
     static void ReloadIfChanged(File* file);
     // The value of `key` in the last file that sets it, null when none does.
-    const std::string* Find(const std::string& key);
+    const std::string* Find(const std::string& key) ORVEX_REQUIRES(mutex_);
 
-    std::mutex mutex_;
-    std::vector<File> files_;
+    mutable thread_mutex mutex_;
+    std::vector<File> files_ ORVEX_GUARDED_BY(mutex_);
 };
 
 // Where the host looks for its properties: $ORVEX_PROP_FILE (one path, or several separated by

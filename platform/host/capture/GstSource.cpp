@@ -1,8 +1,7 @@
 #include "platform/host/capture/GstSource.h"
 
-#include <mutex>
-
 #include "platform/host/HostModule.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -11,9 +10,9 @@ namespace {
 // Loads the module once; a failure is tried again at the next start. It is never unloaded:
 // GLib and GStreamer cannot be.
 LiveSourceFactory LoadModule(std::string* error) {
-    static std::mutex mutex;
+    static thread_mutex mutex;
     static LiveSourceFactory factory = nullptr;
-    std::lock_guard<std::mutex> hold(mutex);
+    thread_mutex::Scoped hold(mutex);
     if (factory == nullptr) {
         factory = reinterpret_cast<LiveSourceFactory>(
             LoadModuleSymbol("ORVEX_HOST_GST_MODULE", ORVEX_HOST_GST_MODULE_NAME,

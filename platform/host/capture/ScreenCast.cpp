@@ -7,6 +7,8 @@
 
 #include <algorithm>
 
+#include "sync/thread_mutex.h"
+
 namespace platform {
 namespace host {
 namespace {
@@ -82,7 +84,7 @@ ScreenCast::~ScreenCast() {
 }
 
 ScreenCast::State ScreenCast::poll(int* fd, uint32_t* node, std::string* why) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     *fd = fd_;
     *node = node_;
     *why = why_;
@@ -90,7 +92,7 @@ ScreenCast::State ScreenCast::poll(int* fd, uint32_t* node, std::string* why) {
 }
 
 void ScreenCast::fail(const std::string& why) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     if (state_ == State::kFailed) return;  // the first cause is the one to report
     state_ = State::kFailed;
     why_ = why;
@@ -316,7 +318,7 @@ bool ScreenCast::viaPortal(std::string* why, bool* absent) {
         *why = "OpenPipeWireRemote: no descriptor";
         return false;
     }
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     fd_ = fd;
     node_ = node;
     if (state_ == State::kPending) state_ = State::kReady;
@@ -358,7 +360,7 @@ bool ScreenCast::viaMutter(std::string* why) {
         *why = "Start: no PipeWire stream within 3 s";
         return false;
     }
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     node_ = added_node_;
     if (state_ == State::kPending) state_ = State::kReady;
     return true;

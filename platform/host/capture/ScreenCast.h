@@ -4,9 +4,10 @@
 
 #include <atomic>
 #include <cstdint>
-#include <mutex>
 #include <string>
 #include <thread>
+
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -67,11 +68,11 @@ private:
     uint32_t added_node_ = 0;
     guint subscriptions_[4] = {0, 0, 0, 0};
 
-    std::mutex mutex_;
-    State state_ = State::kPending;
-    int fd_ = -1;
-    uint32_t node_ = 0;
-    std::string why_;
+    thread_mutex mutex_;
+    State state_ ORVEX_GUARDED_BY(mutex_) = State::kPending;
+    int fd_ ORVEX_GUARDED_BY(mutex_) = -1;
+    uint32_t node_ ORVEX_GUARDED_BY(mutex_) = 0;
+    std::string why_ ORVEX_GUARDED_BY(mutex_);
 };
 
 }  // namespace host

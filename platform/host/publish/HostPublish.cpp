@@ -1,9 +1,8 @@
 #include "platform/host/publish/HostPublish.h"
 
-#include <mutex>
-
 #include "platform/host/HostModule.h"
 #include "platform/host/publish/AvModule.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -12,9 +11,9 @@ namespace {
 // Loads the module at the first publish; a failure is tried again at the next connection
 // attempt. It is never unloaded: sessions from it may outlive any one caller.
 AvPublishOpen LoadModule(std::string* error) {
-    static std::mutex mutex;
+    static thread_mutex mutex;
     static AvPublishOpen open = nullptr;
-    std::lock_guard<std::mutex> hold(mutex);
+    thread_mutex::Scoped hold(mutex);
     if (open == nullptr) {
         open = reinterpret_cast<AvPublishOpen>(
             LoadModuleSymbol("ORVEX_HOST_AV_MODULE", ORVEX_HOST_AV_MODULE_NAME,

@@ -3,6 +3,7 @@
 #include <cstdio>
 
 #include "platform/Ports.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -13,30 +14,30 @@ const char* const HostCamera::kDefaultParameters =
     "video-size=1280x720;video-frame-format=yuv420p";
 
 std::string HostCamera::getParameters() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     return parameters_;
 }
 
 int HostCamera::setParameters(const std::string& flattened) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     parameters_ = flattened;
     return 0;
 }
 
 int HostCamera::unlock() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     locked_ = false;
     return 0;
 }
 
 int HostCamera::lock() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     locked_ = true;
     return 0;
 }
 
 bool HostCamera::locked() {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     return locked_;
 }
 

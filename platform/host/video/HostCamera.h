@@ -1,10 +1,10 @@
 #pragma once
 
 #include <memory>
-#include <mutex>
 #include <string>
 
 #include "platform/CapturePorts.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -25,9 +25,9 @@ public:
     bool locked() override;
 
 private:
-    std::mutex mutex_;
-    std::string parameters_ = kDefaultParameters;
-    bool locked_ = true;
+    thread_mutex mutex_;
+    std::string parameters_ ORVEX_GUARDED_BY(mutex_) = kDefaultParameters;
+    bool locked_ ORVEX_GUARDED_BY(mutex_) = true;
 };
 
 // Every camera id connects, to a fresh HostCamera. Thread contract: any thread.

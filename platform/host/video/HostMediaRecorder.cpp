@@ -11,12 +11,12 @@
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <mutex>
 #include <system_error>
 
 #include "platform/Ports.h"
 #include "platform/host/HostLog.h"
 #include "platform/host/capture/GstSource.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -272,7 +272,7 @@ void HostMediaRecorder::takePicture(uint32_t frame, uint64_t ms) {
 int HostMediaRecorder::start() {
     if (state_ != State::kPrepared) return kInvalidOperation;
     {
-        std::lock_guard<std::mutex> hold(mutex_);
+        thread_mutex::Scoped hold(mutex_);
         stopping_ = false;
     }
     try {
@@ -289,7 +289,7 @@ int HostMediaRecorder::start() {
 int HostMediaRecorder::stop() {
     if (thread_.joinable()) {
         {
-            std::lock_guard<std::mutex> hold(mutex_);
+            thread_mutex::Scoped hold(mutex_);
             stopping_ = true;
         }
         wake_.notify_all();
@@ -365,18 +365,21 @@ void HostMediaRecorder::run() {
     const auto start_tp = std::chrono::steady_clock::now();
     const uint64_t period_ns = 1000000000u / fps_;
     uint64_t n = 0;
-    std::unique_lock<std::mutex> lock(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     if (source_.kind == SourceChoice::kNone) {
         // The frames come from another binder client, such as orvex-feed: nothing to pace.
-        wake_.wait(lock, [this] { return stopping_; });
+        while (!stopping_) wake_.wait(mutex_);
         return;
     }
     for (;;) {
         // Frame n is due at a fixed offset from the start, so waits never add up to drift.
         uint64_t due_ns = start_ns + n * 1000000000u / fps_;
         auto due_tp = start_tp + std::chrono::nanoseconds(due_ns - start_ns);
-        if (wake_.wait_until(lock, due_tp, [this] { return stopping_; })) break;
-        lock.unlock();
+        while (!stopping_ && wake_.wait_until(mutex_, due_tp)) {
+        }
+        if (stopping_) break;
+        // The frame is made unlocked so that stop is never kept waiting by an encode.
+        mutex_.unlock();
         uint64_t now_ns = MonotonicNs();
         // More than a period late (a busy machine): leave the missed frames out rather than
         // sending a burst of stale ones.
@@ -389,7 +392,7 @@ void HostMediaRecorder::run() {
         Encoded frame = encodeNext(static_cast<uint32_t>(n), due_ns / 1000000u);
         if (frame.size > 0) deliver(frame);
         ++n;
-        lock.lock();
+        mutex_.lock();
     }
 }
 

@@ -1,11 +1,9 @@
 #pragma once
 
 #include <atomic>
-#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <thread>
 #include <vector>
@@ -15,6 +13,7 @@
 #include "platform/host/capture/HostSources.h"
 #include "platform/host/video/OpenH264Encoder.h"
 #include "platform/host/video/TestPattern.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -120,9 +119,9 @@ private:
     bool failing_ = false;
 
     std::thread thread_;
-    std::mutex mutex_;
-    std::condition_variable wake_;
-    bool stopping_ = false;
+    thread_mutex mutex_;
+    thread_condition wake_;
+    bool stopping_ ORVEX_GUARDED_BY(mutex_) = false;
 
     std::atomic<uint64_t> delivered_{0};
     std::atomic<uint64_t> failed_{0};

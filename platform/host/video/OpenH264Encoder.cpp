@@ -5,12 +5,12 @@
 
 #include <cinttypes>
 #include <cstring>
-#include <mutex>
 #include <string>
 
 #include "codec/AnnexB.h"
 #include "platform/host/HostLog.h"
 #include "platform/host/video/BitBudget.h"
+#include "sync/thread_mutex.h"
 
 namespace platform {
 namespace host {
@@ -38,9 +38,9 @@ struct OpenH264 {
 // Loads OpenH264 at the first encoder and keeps it; a failure logs one line and is tried
 // again at the next prepare. Null when it does not load.
 const OpenH264* LoadOpenH264() {
-    static std::mutex mutex;
+    static thread_mutex mutex;
     static OpenH264 api;
-    std::lock_guard<std::mutex> hold(mutex);
+    thread_mutex::Scoped hold(mutex);
     if (api.create != nullptr) return &api;
     void* library = dlopen(ORVEX_OPENH264_SONAME, RTLD_NOW | RTLD_LOCAL);
     OpenH264 found;
