@@ -6,18 +6,8 @@
 PublishQueue::PublishQueue(size_t bytes, uint32_t span_ms) : m_ring(bytes), m_span_ms(span_ms) {}
 
 void PublishQueue::CopyIn(const void* data, size_t len) {
-    const size_t at = static_cast<size_t>(m_head % m_ring.size());
-    const size_t first = len < m_ring.size() - at ? len : m_ring.size() - at;
-    memcpy(m_ring.data() + at, data, first);
-    memcpy(m_ring.data(), static_cast<const uint8_t*>(data) + first, len - first);
+    m_ring.Put(m_head, data, len);
     m_head += len;
-}
-
-void PublishQueue::CopyOut(uint64_t from, void* data, size_t len) {
-    const size_t at = static_cast<size_t>(from % m_ring.size());
-    const size_t first = len < m_ring.size() - at ? len : m_ring.size() - at;
-    memcpy(data, m_ring.data() + at, first);
-    memcpy(static_cast<uint8_t*>(data) + first, m_ring.data(), len - first);
 }
 
 bool PublishQueue::Push(Kind kind, bool key, uint32_t time_ms, const uint8_t* data, size_t len) {
@@ -31,7 +21,7 @@ bool PublishQueue::Push(Kind kind, bool key, uint32_t time_ms, const uint8_t* da
     bool fits = sizeof(Header) + len <= m_ring.size() - (m_head - m_tail);
     if (fits && m_head != m_tail) {
         Header oldest{};
-        CopyOut(m_tail, &oldest, sizeof oldest);
+        m_ring.Get(m_tail, &oldest, sizeof oldest);
         fits = static_cast<int32_t>(time_ms - oldest.time_ms) <= static_cast<int32_t>(m_span_ms);
     }
     if (!fits) {
@@ -64,9 +54,9 @@ bool PublishQueue::Pop(Frame* frame, std::vector<uint8_t>* buffer, int wait_ms, 
     }
     if (m_stopped || m_head == m_tail) return false;
     Header header{};
-    CopyOut(m_tail, &header, sizeof header);
+    m_ring.Get(m_tail, &header, sizeof header);
     if (buffer->size() < header.len) buffer->resize(header.len);
-    CopyOut(m_tail + sizeof header, buffer->data(), header.len);
+    m_ring.Get(m_tail + sizeof header, buffer->data(), header.len);
     m_tail += sizeof header + header.len;
     frame->kind = static_cast<Kind>(header.kind);
     frame->key = header.key != 0;

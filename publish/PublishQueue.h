@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <vector>
 
+#include "buffers/ByteRing.h"
 #include "sync/thread_mutex.h"
 
 // The frames waiting for one media server: a byte ring allocated once, so that the frame tap
@@ -45,9 +46,8 @@ private:
         uint8_t pad[2];
     };
     void CopyIn(const void* data, size_t len) ORVEX_REQUIRES(m_lock);
-    void CopyOut(uint64_t at, void* data, size_t len) ORVEX_REQUIRES(m_lock);
 
-    std::vector<uint8_t> m_ring;
+    ByteRing m_ring;  // read and written under m_lock
     const uint32_t m_span_ms;
     thread_mutex m_lock;
     thread_condition m_ready;

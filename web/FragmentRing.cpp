@@ -17,24 +17,7 @@ constexpr uint32_t kKeyFlag = 1;
 
 }  // namespace
 
-FragmentRing::FragmentRing(size_t capacity)
-    : m_size(std::max<size_t>(capacity, 64)), m_data(new uint8_t[m_size]) {}
-
-void FragmentRing::Put(uint64_t at, const uint8_t* src, size_t len) {
-    const size_t size = m_size;
-    size_t offset = static_cast<size_t>(at % size);
-    size_t first = std::min(len, size - offset);
-    memcpy(m_data.get() + offset, src, first);
-    memcpy(m_data.get(), src + first, len - first);
-}
-
-void FragmentRing::Get(uint64_t at, uint8_t* dst, size_t len) const {
-    const size_t size = m_size;
-    size_t offset = static_cast<size_t>(at % size);
-    size_t first = std::min(len, size - offset);
-    memcpy(dst, m_data.get() + offset, first);
-    memcpy(dst + first, m_data.get(), len - first);
-}
+FragmentRing::FragmentRing(size_t capacity) : m_ring(std::max<size_t>(capacity, 64)) {}
 
 void FragmentRing::Restart(const uint8_t* init, size_t len, const std::string& content_type) {
     thread_mutex::Scoped hold(m_lock);
@@ -48,16 +31,16 @@ void FragmentRing::Restart(const uint8_t* init, size_t len, const std::string& c
 bool FragmentRing::Append(const uint8_t* head, size_t head_len, const uint8_t* body,
                           size_t body_len, bool key) {
     const size_t total = kRecordHeader + head_len + body_len;
-    if (total > m_size / 4) return false;
+    if (total > m_ring.size() / 4) return false;
     uint8_t header[kRecordHeader];
     PutWord(header, static_cast<uint32_t>(head_len + body_len));
     PutWord(header + 4, key ? kKeyFlag : 0);
     thread_mutex::Scoped hold(m_lock);
     if (m_generation == 0) return false;
     const uint64_t at = m_write_pos;
-    Put(at, header, kRecordHeader);
-    Put(at + kRecordHeader, head, head_len);
-    Put(at + kRecordHeader + head_len, body, body_len);
+    m_ring.Put(at, header, kRecordHeader);
+    m_ring.Put(at + kRecordHeader, head, head_len);
+    m_ring.Put(at + kRecordHeader + head_len, body, body_len);
     m_write_pos = at + total;
     m_last_write = std::chrono::steady_clock::now();
     if (key) {
@@ -119,7 +102,7 @@ long FragmentRing::Read(Reader* reader, uint8_t* out, size_t cap, int wait_ms, c
             // Between fragments a reader may skip: to the latest key fragment when it has
             // fallen far behind, or when what it would read next is gone.
             const uint64_t lag = m_write_pos - reader->pos;
-            if ((lag > m_size / 4 || Overwritten(reader->pos)) && m_last_key != kNoKey &&
+            if ((lag > m_ring.size() / 4 || Overwritten(reader->pos)) && m_last_key != kNoKey &&
                 m_last_key > reader->pos && !Overwritten(m_last_key)) {
                 reader->pos = m_last_key;
                 ++reader->skips;
@@ -133,7 +116,7 @@ long FragmentRing::Read(Reader* reader, uint8_t* out, size_t cap, int wait_ms, c
                 continue;
             }
             uint8_t header[kRecordHeader];
-            Get(reader->pos, header, kRecordHeader);
+            m_ring.Get(reader->pos, header, kRecordHeader);
             reader->pos += kRecordHeader;
             reader->record_left = GetWord(header);
         }
@@ -142,7 +125,7 @@ long FragmentRing::Read(Reader* reader, uint8_t* out, size_t cap, int wait_ms, c
             return -1;
         }
         size_t n = static_cast<size_t>(std::min<uint64_t>(cap, reader->record_left));
-        Get(reader->pos, out, n);
+        m_ring.Get(reader->pos, out, n);
         reader->pos += n;
         reader->record_left -= n;
         return static_cast<long>(n);

@@ -7,6 +7,7 @@
 #include <string>
 #include <vector>
 
+#include "buffers/ByteRing.h"
 #include "sync/thread_mutex.h"
 
 // The live fMP4 stream as every web viewer gets it: one ring of fragments that the muxer
@@ -50,7 +51,7 @@ public:
     // the reader's stream has ended (`why` says how).
     long Read(Reader* reader, uint8_t* out, size_t cap, int wait_ms, const char** why);
 
-    size_t capacity() const { return m_size; }
+    size_t capacity() const { return m_ring.size(); }
 
 private:
     static constexpr size_t kRecordHeader = 8;  // length (4 bytes) and flags (4 bytes)
@@ -59,18 +60,16 @@ private:
     static constexpr int kFreshKeyMs = 300;
     static constexpr int kFreshWaitMs = 3000;
 
-    void Put(uint64_t at, const uint8_t* src, size_t len) ORVEX_REQUIRES(m_lock);
-    void Get(uint64_t at, uint8_t* dst, size_t len) const ORVEX_REQUIRES(m_lock);
     bool Overwritten(uint64_t pos) const ORVEX_REQUIRES(m_lock) {
-        return m_write_pos - pos > m_size;
+        return m_ring.Overrun(m_write_pos, pos);
     }
 
     thread_mutex m_lock;
     thread_condition m_written;
-    // Not zeroed: pages become resident as fragments reach them, so an idle viewer costs no
-    // memory. Only bytes already written are ever read.
-    const size_t m_size;
-    const std::unique_ptr<uint8_t[]> m_data;
+    // Records of kRecordHeader then the fragment, read and written under m_lock (its size is
+    // fixed); pages become resident only as fragments reach them, so an idle viewer costs no
+    // memory.
+    ByteRing m_ring;
     uint64_t m_write_pos ORVEX_GUARDED_BY(m_lock) = 0;
     uint64_t m_last_key ORVEX_GUARDED_BY(m_lock) = kNoKey;
     std::chrono::steady_clock::time_point m_last_write ORVEX_GUARDED_BY(m_lock);
