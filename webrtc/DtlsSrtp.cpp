@@ -83,9 +83,7 @@ struct DtlsDatagramBio {
     }
 };
 
-namespace {
-
-bool SrtpStarted() {
+bool StartSrtp() {
     static std::once_flag once;
     static bool started = false;
     std::call_once(once, [] {
@@ -106,6 +104,8 @@ bool SrtpStarted() {
     });
     return started;
 }
+
+namespace {
 
 bool DigestIs(X509* cert, const std::vector<uint8_t>& expected) {
     unsigned char md[EVP_MAX_MD_SIZE];
@@ -297,7 +297,7 @@ bool DtlsSrtpSession::KeySrtp() {
         Fail("the peer offered no SRTP profile we take (use_srtp, RFC 5764 §4.1.1)");
         return false;
     }
-    if (!SrtpStarted()) {
+    if (!StartSrtp()) {
         Fail("libsrtp did not start");
         return false;
     }

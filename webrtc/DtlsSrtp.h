@@ -30,6 +30,11 @@ constexpr unsigned long kSrtpReplayWindow = 2048;
 // One viewer's DTLS association (server side, RFC 5763/5764) and the SRTP contexts keyed from it.
 // It keeps its own reference to the certificate's context: the certificate may go first.
 // Thread contract: one thread at a time (the caller serialises; the UDP thread in practice).
+// Starts libsrtp for the process, once; any thread, any number of times. Every user of
+// libsrtp in the process goes through here: srtp_init again would restart its crypto kernel
+// under a session being keyed on another thread. False when libsrtp cannot start.
+bool StartSrtp();
+
 class DtlsSrtpSession {
 public:
     enum class State { kHandshaking, kConnected, kFailed };

@@ -7,6 +7,8 @@
 
 #include <cstring>
 
+#include "webrtc/DtlsSrtp.h"
+
 namespace webrtc::test {
 
 X509* SelfSigned(EVP_PKEY* key, long from_days, long to_days) {
@@ -41,6 +43,7 @@ std::string Sha256Text(X509* cert) {
 }
 
 DtlsTestClient::DtlsTestClient(const char* profiles) {
+    webrtc::StartSrtp();  // the process's one start, shared with the server side
     key_ = EVP_EC_gen("P-256");
     cert_ = SelfSigned(key_, -1, 30);
     ctx_ = SSL_CTX_new(DTLS_client_method());
@@ -126,7 +129,6 @@ bool DtlsTestClient::KeySrtp() {
     memcpy(client + k, m + 2 * k, s);
     memcpy(server, m + k, k);
     memcpy(server + k, m + 2 * k + s, s);
-    srtp_init();
     srtp_policy_t p[2];
     memset(p, 0, sizeof(p));
     for (int i = 0; i < 2; ++i) {
