@@ -10,8 +10,8 @@ key = re.compile(r'"((?:kv\.orvex|orvex\.host|ro\.board|kelvo\.build)\.[A-Za-z0-
 listed_file = top / "platform/host/KnownProperties.cpp"
 listed = set(key.findall(listed_file.read_text()))
 read = set()
-for folder in ("auth", "capture", "media", "platform", "publish", "rtp", "rtsp", "server", "service",
-               "web", "webrtc"):
+for folder in ("auth", "base", "buffers", "capture", "codec", "config", "media", "net", "platform",
+               "publish", "rtp", "rtsp", "server", "service", "stream", "sync", "web", "webrtc"):
     for path in (top / folder).rglob("*.[ch]*"):
         if path != listed_file and path.suffix in (".cpp", ".h"):
             read |= set(key.findall(path.read_text(errors="replace")))
