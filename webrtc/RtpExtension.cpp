@@ -2,6 +2,8 @@
 
 #include <cstring>
 
+#include "codec/H264Packetiser.h"
+
 namespace webrtc {
 namespace {
 
@@ -18,15 +20,10 @@ size_t WriteRtpHeaderWithExtensions(uint8_t* p, bool marker, uint8_t payload_typ
                                     std::string_view mid) {
     const bool delay = UsableId(playout_delay_id);
     const bool with_mid = UsableId(mid_id) && !mid.empty() && mid.size() <= kMaxMid;
-    p[0] = (delay || with_mid) ? 0x90 : 0x80;
-    p[1] = uint8_t((marker ? 0x80 : 0) | (payload_type & 0x7f));
-    p[2] = uint8_t(seq >> 8);
-    p[3] = uint8_t(seq);
-    for (int i = 0; i < 4; ++i) {
-        p[4 + i] = uint8_t(ts >> (24 - 8 * i));
-        p[8 + i] = uint8_t(ssrc >> (24 - 8 * i));
-    }
+    // The system's one RTP header writer, with 7 bits of payload type; then the X bit.
+    WriteRtpHeader(p, marker, payload_type & 0x7f, seq, ts, ssrc);
     if (!delay && !with_mid) return kRtpHeaderSize;
+    p[0] |= 0x10;
 
     uint8_t* e = p + kRtpHeaderSize + 4;
     size_t used = 0;

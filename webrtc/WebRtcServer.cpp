@@ -38,8 +38,6 @@ constexpr const char* kTag = "orvex:::webrtc";
 // or tunnel on a viewer's path within a 1500-byte MTU.
 constexpr unsigned kRtpMax = 1200;
 constexpr unsigned kVideoHeader = 12 + 8;  // RTP, and the extension block: 4 + 4 (playout-delay)
-// Payloads are built 8 bytes further in than the packetiser's 12-byte header leaves room for.
-constexpr unsigned kHeaderShift = kVideoHeader - 12;
 constexpr H264Packing kWebRtcPacking = {kRtpMax - kVideoHeader, kRtpMax - kVideoHeader - 2, true,
                                         false};
 constexpr int kReportIntervalMs = 1000;
@@ -73,6 +71,10 @@ std::string AddressText(const sockaddr_storage& addr) {
         port = ntohs(in->sin6_port);
     }
     return std::string(ip) + ":" + std::to_string(port);
+}
+
+socklen_t LengthOf(const sockaddr_storage& addr) {
+    return addr.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);
 }
 
 bool SameAddress(const sockaddr_storage& a, const sockaddr_storage& b) {
@@ -118,8 +120,8 @@ struct Peer {
     uint32_t video_ssrc = 0, audio_ssrc = 0;
     uint16_t video_seq = 0, audio_seq = 0;
     uint32_t video_packets = 0, video_octets = 0, audio_packets = 0, audio_octets = 0;
-    uint32_t last_video_ts = 0;
     unsigned send_failures = 0, resent = 0, nacked_missing = 0;
+    int32_t reported_lost = 0;  // the viewer's own count of our video packets it never got
     bool told_send_failure = false;
     PacketHistory history;
     std::function<void()> end;
@@ -289,8 +291,13 @@ bool WebRtcServer::End(const std::string& id) {
     {
         thread_mutex::Scoped hold(m_lock);
         for (int i = 0; i < kMaxSessions && ended == nullptr; ++i) {
-            if (m_peers[i] != nullptr && m_peers[i]->id == id)
-                ended = Remove(i, "the viewer ended it");
+            if (m_peers[i] == nullptr || m_peers[i]->id != id) continue;
+            Peer* peer = m_peers[i].get();
+            if (peer->playing) {  // a close_notify, so the browser need not wait for consent
+                peer->dtls->Close(
+                    [this, peer](const uint8_t* p, size_t n) { SendDatagram(peer->remote, p, n); });
+            }
+            ended = Remove(i, "the viewer ended it");
         }
     }
     if (ended == nullptr) return false;
@@ -305,9 +312,9 @@ std::shared_ptr<Peer> WebRtcServer::Remove(int slot, const char* why) {
     if (peer->playing) m_playing.fetch_sub(1);
     OrvexLog(kTag,
              "WebRTC session %s of %s ended: %s (%u packets sent again, %u asked too late, %u "
-             "sends refused)\n",
+             "sends refused, %d never arrived by the viewer's count)\n",
              peer->id.c_str(), peer->text.c_str(), why, peer->resent, peer->nacked_missing,
-             peer->send_failures);
+             peer->send_failures, static_cast<int>(peer->reported_lost));
     return peer;
 }
 
@@ -324,8 +331,11 @@ void WebRtcServer::OnVideoFrame(const uint8_t* data, size_t len, uint32_t time_m
 
 void WebRtcServer::OnPicture(const AccessUnitGatherer::Picture& picture) {
     const uint32_t timestamp = picture.time_ms * 90u;  // 90 kHz (RFC 6184 §5.1)
+    // The picture's NAL units, each behind a 4-byte start code.
+    m_units.clear();
+    ForEachNalUnit(picture.data, picture.len,
+                   [this](const uint8_t* nal, size_t len) { m_units.emplace_back(nal, len); });
     thread_mutex::Scoped hold(m_lock);
-    m_picture_ts = timestamp;
     // Which viewers take this picture: those started, and those waiting for a key picture
     // when this is one.
     bool any = false;
@@ -338,70 +348,44 @@ void WebRtcServer::OnPicture(const AccessUnitGatherer::Picture& picture) {
     if (picture.key) {  // parameter sets first, as a joining decoder needs them
         const std::vector<uint8_t>& sps = m_gatherer.sps();
         const std::vector<uint8_t>& pps = m_gatherer.pps();
-        if (!sps.empty()) SendNal(sps.data(), sps.size(), timestamp, false, true);
-        if (!pps.empty()) SendNal(pps.data(), pps.size(), timestamp, false, true);
+        if (!sps.empty()) SendNal(sps.data(), sps.size(), timestamp, false);
+        if (!pps.empty()) SendNal(pps.data(), pps.size(), timestamp, false);
     }
-    // The picture's NAL units, each behind a 4-byte start code; the marker bit on the last
-    // packet of the last one ends the picture for the browser's jitter buffer.
-    const uint8_t* nal = nullptr;
-    size_t nal_len = 0;
-    ForEachNalUnit(picture.data, picture.len, [&](const uint8_t* next, size_t next_len) {
-        if (nal != nullptr) SendNal(nal, nal_len, timestamp, false, picture.key);
-        nal = next;
-        nal_len = next_len;
-    });
-    if (nal != nullptr) SendNal(nal, nal_len, timestamp, true, picture.key);
+    // The marker bit on the last packet of the last unit ends the picture for the browser's
+    // jitter buffer.
+    for (size_t i = 0; i < m_units.size(); ++i)
+        SendNal(m_units[i].first, m_units[i].second, timestamp, i + 1 == m_units.size());
 }
 
-namespace {
-
-// Hands each payload the packetiser builds to a function.
-template <typename F>
-class PayloadFan final : public H264PayloadSink {
-public:
-    explicit PayloadFan(F f) : m_f(std::move(f)) {}
-    void Payload(unsigned char* packet, unsigned length, bool end) override {
-        m_f(packet, length, end);
-    }
-
-private:
-    F m_f;
-};
-
-}  // namespace
-
-void WebRtcServer::SendNal(const uint8_t* nal, size_t len, uint32_t timestamp, bool last,
-                           bool key) {
-    (void)key;
+void WebRtcServer::SendNal(const uint8_t* nal, size_t len, uint32_t timestamp, bool last) {
     static_assert(sizeof(m_packet) >= kRtpMax + kSrtpMaxTrailer, "packet buffer");
-    // The packetiser builds each payload at scratch + 12; the viewers' packets are built from
-    // it with their own header, so the payload is cut once for all of them.
+    // The packetiser builds each payload at scratch + 12 and hands it to Payload, which builds
+    // every viewer's packet from it with their own header: the unit is cut once for all.
     uint8_t scratch[12 + kRtpMax];
-    auto fan = [&](unsigned char* built, unsigned length, bool end) {
-        const bool marker = last && end;
-        for (auto& peer : m_peers) {
-            if (peer == nullptr || !peer->playing || peer->need_key || peer->video_pt < 0) continue;
-            const size_t header = WriteRtpHeaderWithExtensions(
-                m_packet, marker, static_cast<uint8_t>(peer->video_pt), peer->video_seq++,
-                timestamp, peer->video_ssrc, peer->playout_id, -1, "");
-            memcpy(m_packet + header, built + 12, length);
-            peer->video_packets++;
-            peer->video_octets += length;
-            peer->last_video_ts = timestamp;
-            SendProtected(*peer, m_packet, header + length, true);
-        }
-    };
-    PayloadFan<decltype(fan)> sink(fan);
-    PacketiseH264Nal(nal, static_cast<unsigned>(len), kWebRtcPacking, scratch, sink);
+    m_nal_timestamp = timestamp;
+    m_nal_last = last;
+    PacketiseH264Nal(nal, static_cast<unsigned>(len), kWebRtcPacking, scratch, *this);
+}
+
+void WebRtcServer::Payload(unsigned char* built, unsigned length, bool end) {
+    const bool marker = m_nal_last && end;
+    for (auto& peer : m_peers) {
+        if (peer == nullptr || !peer->playing || peer->need_key || peer->video_pt < 0) continue;
+        const size_t header = WriteRtpHeaderWithExtensions(
+            m_packet, marker, static_cast<uint8_t>(peer->video_pt), peer->video_seq++,
+            m_nal_timestamp, peer->video_ssrc, peer->playout_id, -1, "");
+        memcpy(m_packet + header, built + 12, length);
+        peer->video_packets++;
+        peer->video_octets += length;
+        SendProtected(*peer, m_packet, header + length, true);
+    }
 }
 
 void WebRtcServer::SendProtected(Peer& peer, uint8_t* packet, size_t len, bool video) {
     const uint16_t sequence = static_cast<uint16_t>(packet[2] << 8 | packet[3]);
     if (!peer.dtls->ProtectRtp(packet, &len, sizeof m_packet)) return;
     if (video) peer.history.Keep(sequence, packet, len);
-    const ssize_t sent =
-        sendto(m_socket, packet, len, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&peer.remote),
-               peer.remote.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in));
+    const ssize_t sent = SendDatagram(peer.remote, packet, len);
     if (sent < 0) {
         ++peer.send_failures;
         if (!peer.told_send_failure) {
@@ -492,10 +476,7 @@ void WebRtcServer::Run() {
 int WebRtcServer::Housekeeping(uint64_t now) {
     int timeout = 100;
     auto send_to = [this](Peer* peer) {
-        return [this, peer](const uint8_t* p, size_t n) {
-            sendto(m_socket, p, n, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&peer->remote),
-                   peer->remote.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in));
-        };
+        return [this, peer](const uint8_t* p, size_t n) { SendDatagram(peer->remote, p, n); };
     };
     for (auto& slot : m_peers) {
         Peer* peer = slot.get();
@@ -507,14 +488,13 @@ int WebRtcServer::Housekeeping(uint64_t now) {
         }
         if (peer->playing && now - peer->last_report_ms >= kReportIntervalMs) {
             peer->last_report_ms = now;
-            SendReports(*peer, now);
+            SendReports(*peer);
         }
     }
     return timeout < 1 ? 1 : timeout;
 }
 
-void WebRtcServer::SendReports(Peer& peer, uint64_t now) {
-    (void)now;
+void WebRtcServer::SendReports(Peer& peer) {
     // Sender reports tie each track's RTP time to the wall clock, which is how a browser
     // keeps sound and picture together (RFC 3550 §6.4.1).
     const uint64_t ntp = NtpNow();
@@ -524,8 +504,7 @@ void WebRtcServer::SendReports(Peer& peer, uint64_t now) {
         size_t n = WriteSenderReport(peer.video_ssrc, ntp, now_ms * 90u, peer.video_packets,
                                      peer.video_octets, report, 64);
         if (n > 0 && peer.dtls->ProtectRtcp(report, &n, sizeof report)) {
-            sendto(m_socket, report, n, MSG_NOSIGNAL,
-                   reinterpret_cast<const sockaddr*>(&peer.remote), sizeof(sockaddr_in));
+            SendDatagram(peer.remote, report, n);
         }
     }
     if (peer.audio_packets > 0) {
@@ -533,10 +512,14 @@ void WebRtcServer::SendReports(Peer& peer, uint64_t now) {
         size_t n = WriteSenderReport(peer.audio_ssrc, ntp, audio_ts, peer.audio_packets,
                                      peer.audio_octets, report, 64);
         if (n > 0 && peer.dtls->ProtectRtcp(report, &n, sizeof report)) {
-            sendto(m_socket, report, n, MSG_NOSIGNAL,
-                   reinterpret_cast<const sockaddr*>(&peer.remote), sizeof(sockaddr_in));
+            SendDatagram(peer.remote, report, n);
         }
     }
+}
+
+ssize_t WebRtcServer::SendDatagram(const sockaddr_storage& to, const uint8_t* p, size_t n) {
+    return sendto(m_socket, p, n, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&to),
+                  LengthOf(to));
 }
 
 Peer* WebRtcServer::ByAddress(const sockaddr_storage& from) {
@@ -559,10 +542,7 @@ void WebRtcServer::OnDatagram(uint8_t* data, size_t len, const sockaddr_storage&
     if (peer == nullptr) return;  // not a checked address: ignored, as ICE requires
     if (data[0] >= 20 && data[0] <= 63) {
         const bool was_playing = peer->playing;
-        auto send = [this, peer](const uint8_t* p, size_t n) {
-            sendto(m_socket, p, n, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&peer->remote),
-                   peer->remote.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in));
-        };
+        auto send = [this, peer](const uint8_t* p, size_t n) { SendDatagram(peer->remote, p, n); };
         if (peer->dtls->Feed(data, len, send) == DtlsSrtpSession::State::kConnected &&
             !was_playing) {
             peer->playing = true;
@@ -592,8 +572,7 @@ void WebRtcServer::OnStun(const uint8_t* data, size_t len, const sockaddr_storag
     const size_t n = WriteStunBindingSuccess(request, reinterpret_cast<const sockaddr*>(&from),
                                              peer->pwd, response, sizeof response);
     if (n > 0) {
-        sendto(m_socket, response, n, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&from),
-               from.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in));
+        SendDatagram(from, response, n);
     }
     // ICE-lite: the browser nominates; its nominated pair's address is where media goes.
     if (!peer->has_remote || (request.use_candidate && !SameAddress(peer->remote, from))) {
@@ -616,11 +595,11 @@ void WebRtcServer::OnRtcp(Peer& peer, uint8_t* data, size_t len) {
                 continue;
             }
             ++peer.resent;
-            sendto(m_socket, packet, n, MSG_NOSIGNAL,
-                   reinterpret_cast<const sockaddr*>(&peer.remote),
-                   peer.remote.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in));
+            SendDatagram(peer.remote, packet, n);
         }
     }
+    if (feedback.has_report && feedback.report_ssrc == peer.video_ssrc)
+        peer.reported_lost = feedback.cumulative_lost;
     if ((feedback.pli || feedback.fir) && feedback.keyframe_media_ssrc == peer.video_ssrc)
         stream::AskForKeyFrame();
 }

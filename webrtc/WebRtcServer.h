@@ -6,8 +6,11 @@
 #include <memory>
 #include <string>
 #include <thread>
+#include <utility>
+#include <vector>
 
 #include "codec/AccessUnitGatherer.h"
+#include "codec/H264Packetiser.h"
 #include "stream/CaptureChoice.h"
 #include "stream/FrameTap.h"
 #include "sync/thread_mutex.h"
@@ -30,7 +33,8 @@ struct Peer;
 // producers' threads; the socket on the server's own thread. One lock guards the sessions.
 class WebRtcServer final : public WhepEndpoint,
                            public EncodedFrameSink,
-                           private AccessUnitGatherer::Sink {
+                           private AccessUnitGatherer::Sink,
+                           private H264PayloadSink {
 public:
     struct Options {
         uint16_t port = 8189;
@@ -63,8 +67,11 @@ private:
 
     void OnPicture(const AccessUnitGatherer::Picture& picture) override;
     void OnPictureLost(AccessUnitGatherer::Loss) override {}
-    void SendNal(const uint8_t* nal, size_t len, uint32_t timestamp, bool last, bool key)
+    void SendNal(const uint8_t* nal, size_t len, uint32_t timestamp, bool last)
         ORVEX_REQUIRES(m_lock);
+    // Each payload of the unit SendNal cuts; runs inside SendNal, under its lock.
+    void Payload(unsigned char* built, unsigned length,
+                 bool end) override ORVEX_NO_THREAD_SAFETY_ANALYSIS;
     void SendAudio(const uint8_t* payload, size_t len, uint32_t timestamp) ORVEX_REQUIRES(m_lock);
     void SendProtected(Peer& peer, uint8_t* packet, size_t len, bool video) ORVEX_REQUIRES(m_lock);
     void Run();
@@ -74,10 +81,11 @@ private:
         ORVEX_REQUIRES(m_lock);
     void OnRtcp(Peer& peer, uint8_t* data, size_t len) ORVEX_REQUIRES(m_lock);
     int Housekeeping(uint64_t now) ORVEX_REQUIRES(m_lock);
-    void SendReports(Peer& peer, uint64_t now) ORVEX_REQUIRES(m_lock);
+    void SendReports(Peer& peer) ORVEX_REQUIRES(m_lock);
     std::shared_ptr<Peer> Remove(int slot, const char* why) ORVEX_REQUIRES(m_lock);
     void Finish(const std::shared_ptr<Peer>& peer);
     Peer* ByAddress(const sockaddr_storage& from) ORVEX_REQUIRES(m_lock);
+    ssize_t SendDatagram(const sockaddr_storage& to, const uint8_t* p, size_t n);
 
     stream::CaptureDemand* m_demand;
     Options m_options;
@@ -96,10 +104,12 @@ private:
     // The tap's side, serialised by the tap: the gatherer and the Opus encoder.
     AccessUnitGatherer m_gatherer;
     OpusTrack m_opus;
+    std::vector<std::pair<const uint8_t*, size_t>> m_units;  // of the picture being sent
     uint32_t m_audio_clock_ms = 0;  // when the block of the last Opus time stamp came
     uint32_t m_audio_clock_ts = 0;
-    uint8_t m_packet[1500] ORVEX_GUARDED_BY(m_lock) = {};  // one packet under construction
-    uint32_t m_picture_ts = 0;
+    uint8_t m_packet[1500] ORVEX_GUARDED_BY(m_lock) = {};   // one packet under construction
+    uint32_t m_nal_timestamp ORVEX_GUARDED_BY(m_lock) = 0;  // of the unit SendNal cuts
+    bool m_nal_last ORVEX_GUARDED_BY(m_lock) = false;       // it ends its picture
 };
 
 }  // namespace webrtc
