@@ -1,10 +1,6 @@
 #include "rtp/RtpPackets.h"
 
-#include <sys/socket.h>
-
 #include <cstring>
-
-#include "base/OrvexLog.h"
 
 namespace {
 
@@ -54,19 +50,4 @@ unsigned BuildAacPacket(const unsigned char* frame, unsigned length, uint32_t ti
     WriteAuHeaderSection(packet + 12, raw);
     memcpy(packet + 16, frame + kAdtsHeaderBytes, raw);
     return 16 + raw;
-}
-
-ClientFanout::ClientFanout(int sockfd, bool stop_at_first_failure, const char* error_text)
-    : sockfd_(sockfd), stop_at_first_failure_(stop_at_first_failure), error_text_(error_text) {}
-
-void ClientFanout::Send(const unsigned char* packet, unsigned length) {
-    if (targets_ == nullptr) return;
-    for (const sockaddr_in& to : *targets_) {
-        ssize_t sent =
-            sendto(sockfd_, packet, length, 0, reinterpret_cast<const sockaddr*>(&to), sizeof to);
-        if (sent < 0) {
-            OrvexPrint("%s", error_text_);
-            if (stop_at_first_failure_) return;
-        }
-    }
 }

@@ -1,15 +1,12 @@
 #pragma once
 
-#include <netinet/in.h>
-
 #include <cstdint>
-#include <vector>
 
 #include "codec/H264Packetiser.h"
 
 // The RTP packets of the send sessions as pure functions over bytes (the H.264 cutting itself is
-// codec/H264Packetiser's, shared with every other sender), and the fan-out that sends each
-// packet to every client.
+// codec/H264Packetiser's, shared with every other sender); rtp/ClientFanout sends them to every
+// client.
 
 constexpr unsigned kRtpPacketMax = 1500;
 constexpr uint32_t kRtpSsrc = 10;  // every packet of every client
@@ -46,19 +43,3 @@ void WriteAuHeaderSection(unsigned char* p, unsigned au_size);
 unsigned BuildAacPacket(const unsigned char* frame, unsigned length, uint32_t timestamp,
                         uint16_t sequence, unsigned char* packet,
                         unsigned payload_type = kAacPayloadType);
-
-// Sends packets with sendto to a list of destinations in order. Video stops a packet at the
-// first failing destination; audio goes on with the others.
-// Thread contract: the send thread that owns it.
-class ClientFanout final : public PacketSink {
-public:
-    ClientFanout(int sockfd, bool stop_at_first_failure, const char* error_text);
-    void SetTargets(const std::vector<sockaddr_in>& targets) { targets_ = &targets; }
-    void Send(const unsigned char* packet, unsigned length) override;
-
-private:
-    int sockfd_;
-    bool stop_at_first_failure_;
-    const char* error_text_;
-    const std::vector<sockaddr_in>* targets_ = nullptr;
-};

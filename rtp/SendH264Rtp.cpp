@@ -11,6 +11,7 @@
 #include "codec/h264_sps.h"
 #include "config/GlobalConfig.h"
 #include "platform/UniqueFd.h"
+#include "rtp/ClientFanout.h"
 #include "rtp/FrameLatency.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
@@ -151,6 +152,7 @@ void H264RtpTransportSession::procH264Thread() {
         const auto send_start = report_latency ? Clock::now() : Clock::time_point();
         PacketiseH264Item(item->data, static_cast<unsigned>(item->length), ts, payload_type,
                           &sequence, fanout);
+        fanout.Flush();
         if (report_latency) ReportLatency(send_ms - item->timestamp, send_start, &latency);
         state.AfterSend(&sequence);
         recompute = true;

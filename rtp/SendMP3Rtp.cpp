@@ -10,6 +10,7 @@
 #include "base/ThreadName.h"
 #include "config/GlobalConfig.h"
 #include "platform/UniqueFd.h"
+#include "rtp/ClientFanout.h"
 #include "rtp/RtpPackets.h"
 #include "rtp/SendLoopState.h"
 #include "sync/LazyInstance.h"
@@ -38,7 +39,7 @@ MP3RtpTransportSession::MP3RtpTransportSession()
 // The loop runs a virtual of this object: it must stop before the object goes.
 MP3RtpTransportSession::~MP3RtpTransportSession() { CloseSendThread(); }
 
-void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, int sockfd,
+void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, ClientFanout& fanout,
                                               uint32_t timestamp, uint16_t sequence) {
     unsigned char packet[kRtpPacketMax];
     unsigned length = BuildAacPacket(item.data, static_cast<unsigned>(item.length), timestamp,
@@ -48,9 +49,8 @@ void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, int sockf
         OrvexLog(kTag, "\n  mp3 frame of %d bytes dropped ! \n", static_cast<int>(item.length));
         return;
     }
-    ClientFanout fanout(sockfd, false, "\n  mp3 frame send error ! \n ");
-    fanout.SetTargets(m_dests.targets());
     fanout.Send(packet, length);
+    fanout.Flush();
 }
 
 void MP3RtpTransportSession::procMP3Thread() {
@@ -66,6 +66,8 @@ void MP3RtpTransportSession::procMP3Thread() {
     const unsigned rate = config->m_audio_rtp_frequency;
     m_payload_type = static_cast<unsigned>(config->m_audio_payload_type);
     auto item = std::make_unique<Buffer_Item>();
+    ClientFanout fanout(sock.get(), false, "\n  mp3 frame send error ! \n ");
+    fanout.SetTargets(m_dests.targets());
     AacSendState state;
     uint32_t ts = 0;
     uint16_t sequence = 0;
@@ -89,7 +91,7 @@ void MP3RtpTransportSession::procMP3Thread() {
         }
         AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);
         config->set_timestamp(PositionMs(ts, rate), false);
-        sendMP3RtpPacket(*item, sock.get(), ts, sequence);
+        sendMP3RtpPacket(*item, fanout, ts, sequence);
         state.AfterSend(&sequence);
         recompute = true;
     }

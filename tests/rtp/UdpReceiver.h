@@ -21,6 +21,7 @@ public:
     }
     ~UdpReceiver() { close(fd_); }
     int port() const { return port_; }
+    int fd() const { return fd_; }
     // The next datagram, or an empty one when nothing came within `ms`.
     std::vector<unsigned char> Receive(int ms = 3000) {
         timeval tv{ms / 1000, (ms % 1000) * 1000};
