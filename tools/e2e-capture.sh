@@ -89,6 +89,21 @@ export PULSE_SERVER="unix:$work/pulse/native"
 sound_server
 
 source "$top/tools/e2e-capture-start.sh"
+if [[ $mode == cast ]]; then
+  # The sound as gst-rtsp-server makes it beside: the tone, not the sound server.
+  start_capturing x11 tone
+  name=e2e-capture
+  source "$top/tools/e2e-cast-measure.sh"
+  measure_scenes "$orvex" x11 "orvex and its capture child" "$(url 1280 720)"
+  measure_delay x11 "through a window, Xvfb, ximagesrc in orvex's child, orvex and ffmpeg" \
+    "$(url 1280 720)"
+  kill "$orvex"; wait "$orvex" 2>/dev/null || true
+  start_peer x11
+  measure_scenes "$peer" x11 "gst-rtsp-server with the same encoder" rtsp://127.0.0.1/skyvo.0
+  measure_delay x11 "through a window, Xvfb, ximagesrc, gst-rtsp-server and ffmpeg" \
+    rtsp://127.0.0.1/skyvo.0
+  exit 0
+fi
 start_capturing x11 pulse
 
 if [[ $mode == measure ]]; then

@@ -81,102 +81,19 @@ paint "$colour"
 source "$top/tools/e2e-capture-start.sh"
 start_capturing wayland tone
 
-# CPU (user + system over 10 s) and resident memory of the casting process $1 (no child for
-# this screen) while one client plays $3 at 1280x720@30, for a still screen, a small ball moving
-# and bars scrolling over it all; $2 names the server in the lines.
-measure_scenes() {
-  local server=$1 label=$2 url=$3 hz scene scene_pid client cpu0 cpu1 rss frames
-  hz=$(getconf CLK_TCK)
-  for scene in "still:" "ball:pattern=ball" "bars:pattern=smpte horizontal-speed=4"; do
-    if [[ -n ${scene#*:} ]]; then
-      gst-launch-1.0 -q videotestsrc ${scene#*:} is-live=true \
-        ! "video/x-raw,width=1280,height=720,framerate=30/1" ! waylandsink fullscreen=true \
-        >"$work/scene.log" 2>&1 &
-      scene_pid=$!
-      pids+=($scene_pid)
-      sleep 2
-    fi
-    timeout -k 5 60 ffmpeg -y -hide_banner -nostats -loglevel error -rtsp_transport udp \
-      -i "$url" -map 0:v -c copy -t 25 -f h264 "$work/video.h264" </dev/null &
-    client=$!
-    sleep 8
-    cpu0=$(awk '{print $14 + $15}' "/proc/$server/stat")
-    sleep 10
-    cpu1=$(awk '{print $14 + $15}' "/proc/$server/stat")
-    rss=$(awk '/VmRSS/ {print int($2 / 1024)}' "/proc/$server/status")
-    wait "$client" || true
-    frames=$(ffprobe -v error -count_frames -select_streams v:0 \
-      -show_entries stream=nb_read_frames -of csv=p=0 "$work/video.h264")
-    [[ -n ${scene#*:} ]] && { kill "$scene_pid"; wait "$scene_pid" 2>/dev/null || true; }
-    echo "e2e-wayland: measure: 1280x720@30, ${scene%%:*} on a 1280x720 Wayland screen, $label:" \
-      "CPU $(( (cpu1 - cpu0) * 100 / hz / 10 ))% of one core, RSS ${rss} MiB," \
-      "$(awk -v f="$frames" 'BEGIN{printf "%.1f", f/25}') fps" \
-      "(load average $(cut -d' ' -f1 /proc/loadavg) on $(nproc) cores)"
-    sleep 2
-  done
-}
-
 if [[ $mode == measure ]]; then
-  measure_scenes "$orvex" "orvex (no child process)" "$(url 1280 720)"
-  # The delay from a picture drawn to it decoded: the pattern with its capture stamps (in this
-  # machine's monotonic clock) shown full screen, read back from the stream by rtsp_check.py.
-  "$build/orvex-pattern" 1280 720 30 | gst-launch-1.0 -q fdsrc blocksize=1382400 \
-    ! rawvideoparse format=i420 width=1280 height=720 framerate=30/1 ! videoconvert \
-    ! waylandsink fullscreen=true sync=false >"$work/scene.log" 2>&1 &
-  pids+=($!)
-  sleep 3
-  echo "e2e-wayland: measure: delay from the pattern drawn to the picture decoded," \
-    "through a window, mutter, PipeWire, orvex and ffmpeg, 1280x720@30:" \
-    "$(python3 "$top/tools/rtsp_check.py" latency "$(url 1280 720)" 15)"
-
-  # The same screen cast by gst-rtsp-server with the same encoder and settings (OpenH264 at
-  # 2048 kbit/s, a key frame every 2 s, the tone as AAC), for the same client: its CPU beside
-  # orvex's. It takes a screen cast session of its own from mutter.
+  # orvex casting the screen, then gst-rtsp-server casting the same screen with the same
+  # encoder and settings (tools/cast_peer.py, a screen cast session of its own): CPU and memory
+  # of each (no child process here), and the delay from a picture drawn to it decoded.
+  name=e2e-wayland
+  source "$top/tools/e2e-cast-measure.sh"
+  measure_scenes "$orvex" wayland "orvex (no child process)" "$(url 1280 720)"
+  measure_delay wayland "through a window, mutter, PipeWire, orvex and ffmpeg" "$(url 1280 720)"
   kill "$orvex"; wait "$orvex" 2>/dev/null || true
-  cat >"$work/peer.py" <<'PEER'
-import sys
-import gi
-gi.require_version("Gst", "1.0")
-gi.require_version("GstRtspServer", "1.0")
-from gi.repository import Gio, GLib, Gst, GstRtspServer
-Gst.init(None)
-bus = Gio.bus_get_sync(Gio.BusType.SESSION, None)
-def call(path, iface, method, args, reply):
-    return bus.call_sync("org.gnome.Mutter.ScreenCast", path, iface, method, args,
-                         GLib.VariantType(reply), Gio.DBusCallFlags.NONE, 5000, None)
-session = call("/org/gnome/Mutter/ScreenCast", "org.gnome.Mutter.ScreenCast", "CreateSession",
-               GLib.Variant("(a{sv})", ({},)), "(o)").unpack()[0]
-stream = call(session, "org.gnome.Mutter.ScreenCast.Session", "RecordMonitor",
-              GLib.Variant("(sa{sv})", ("", {"cursor-mode": GLib.Variant("u", 1)})),
-              "(o)").unpack()[0]
-loop = GLib.MainLoop()
-def added(conn, sender, path, iface, signal, params):
-    node = params.unpack()[0]
-    factory = GstRtspServer.RTSPMediaFactory()
-    factory.set_launch(
-        "( pipewiresrc path=%d keepalive-time=1000 ! videoconvert ! videoscale ! videorate"
-        " ! video/x-raw,format=I420,width=1280,height=720,framerate=30/1"
-        " ! openh264enc bitrate=2048000 gop-size=60 ! h264parse"
-        " ! rtph264pay name=pay0 pt=96 config-interval=-1"
-        " audiotestsrc wave=sine freq=1000 is-live=true ! audio/x-raw,rate=48000,channels=2"
-        " ! voaacenc bitrate=128000 ! rtpmp4gpay name=pay1 pt=97 )" % node)
-    factory.set_shared(True)
-    server.get_mount_points().add_factory("/skyvo.0", factory)
-    server.attach(None)
-    print("node", node, flush=True)
-bus.signal_subscribe(None, "org.gnome.Mutter.ScreenCast.Stream", "PipeWireStreamAdded", stream,
-                     None, Gio.DBusSignalFlags.NONE, added)
-server = GstRtspServer.RTSPServer()
-server.set_service("554")
-call(session, "org.gnome.Mutter.ScreenCast.Session", "Start", None, "()")
-loop.run()
-PEER
-  /usr/bin/python3 "$work/peer.py" >"$work/peer.out" 2>"$work/peer.log" &
-  peer=$!
-  pids+=($peer)
-  for _ in $(seq 100); do (exec 3<>/dev/tcp/127.0.0.1/554) 2>/dev/null && break; sleep 0.1; done
-  sleep 1
-  measure_scenes "$peer" "gst-rtsp-server with the same encoder" "rtsp://127.0.0.1/skyvo.0"
+  start_peer wayland
+  measure_scenes "$peer" wayland "gst-rtsp-server with the same encoder" rtsp://127.0.0.1/skyvo.0
+  measure_delay wayland "through a window, mutter, PipeWire, gst-rtsp-server and ffmpeg" \
+    rtsp://127.0.0.1/skyvo.0
   exit 0
 fi
 
