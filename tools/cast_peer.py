@@ -18,7 +18,7 @@ gi.require_version("GstRtspServer", "1.0")
 from gi.repository import Gio, GLib, Gst, GstRtspServer  # noqa: E402
 
 # As orvex's conversion: BT.601, limited range, I420 of exactly the asked size at the asked rate.
-TAIL = (" ! videoconvert ! videoscale add-borders=true ! videorate skip-to-first=true"
+TAIL = (" ! videoconvert ! videoscale add-borders=true ! videorate"
         " ! video/x-raw,format=I420,colorimetry=bt601,width=1280,height=720,framerate=30/1"
         ",pixel-aspect-ratio=1/1"
         " ! openh264enc bitrate=2048000 gop-size=60 ! h264parse"

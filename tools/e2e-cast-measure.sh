@@ -78,6 +78,8 @@ measure_scenes() {
       sleep 2
     fi
     result=($(play_and_read "$server" "$url"))
+    # A failure inside the substitution ends only its subshell: its words come back instead.
+    [[ ${#result[@]} -eq 3 ]] || fail "${result[*]}"
     [[ -n $window ]] && { kill "$window"; wait "$window" 2>/dev/null || true; }
     echo "$name: measure: 1280x720@30, ${scene%%:*} on a 1280x720 $screen screen, $label:" \
       "CPU ${result[0]}% of one core, RSS ${result[1]} MiB, ${result[2]} fps" \
@@ -107,9 +109,7 @@ measure_delay() {
 }
 
 # gst-rtsp-server casting screen $1 with orvex's encoder settings (tools/cast_peer.py); its pid
-# in `peer` once a client has received pictures from it. The first media of a fresh screen
-# cast session sometimes gets no picture from PipeWire (PLAY answered 503): a short client
-# tries again, up to five times.
+# in `peer` once a short client has received a second of pictures from it (five tries).
 start_peer() {
   /usr/bin/python3 "$top/tools/cast_peer.py" "$1" >"$work/peer.out" 2>"$work/peer.log" &
   peer=$!
