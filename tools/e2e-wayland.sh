@@ -7,7 +7,8 @@
 # compositor stopped and started again while a client plays. Runs in its own network namespace.
 #   tools/e2e-wayland.sh [BUILD_DIR]           the check (needs root: namespace, port 554)
 #   tools/e2e-wayland.sh [BUILD_DIR] measure   CPU and memory of the casting, frame rate, and
-#                                              the delay from a picture drawn to it decoded
+#                                              the delay from a picture drawn to it decoded,
+#                                              beside gst-rtsp-server (tools/cast_peer.py)
 set -euo pipefail
 top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
