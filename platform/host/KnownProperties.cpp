@@ -11,13 +11,12 @@ namespace host {
 const std::vector<std::string>& KnownPropertyKeys() {
     // tools/check-properties.py keeps this list equal to the keys the sources read.
     static const std::vector<std::string> keys = {
-        "kelvo.build.kelvotv", "kv.orvex.allow",       "kv.orvex.audioclock",
-        "kv.orvex.audiopt",    "kv.orvex.auth",        "kv.orvex.bind",
-        "kv.orvex.dumptosd",   "kv.orvex.http",        "kv.orvex.http.max",
-        "kv.orvex.join",       "kv.orvex.latency",     "kv.orvex.log",
-        "kv.orvex.publish",    "kv.orvex.sdp",         "kv.orvex.wake",  "kv.orvex.webrtc",
-        "orvex.host.audio",    "orvex.host.log",       "orvex.host.log.level",
-        "orvex.host.video",    "orvex.host.video.sub", "ro.board.platform",
+        "kelvo.build.kelvotv",  "kv.orvex.allow",    "kv.orvex.audioclock",  "kv.orvex.audiopt",
+        "kv.orvex.auth",        "kv.orvex.bind",     "kv.orvex.dumptosd",    "kv.orvex.http",
+        "kv.orvex.http.max",    "kv.orvex.join",     "kv.orvex.latency",     "kv.orvex.log",
+        "kv.orvex.publish",     "kv.orvex.sdp",      "kv.orvex.wake",        "kv.orvex.webrtc",
+        "orvex.host.audio",     "orvex.host.log",    "orvex.host.log.level", "orvex.host.video",
+        "orvex.host.video.sub", "ro.board.platform",
     };
     return keys;
 }
