@@ -134,18 +134,25 @@ WebRtcServer::WebRtcServer(stream::CaptureDemand* demand, Options options)
 
 WebRtcServer::~WebRtcServer() { Stop(); }
 
-bool WebRtcServer::Start() {
+// The certificate, the TLS context and the Opus encoder wait for the first viewer: a service
+// nobody watches by WebRTC keeps their few megabytes to itself.
+const DtlsCertificate* WebRtcServer::Certificate() {
+    thread_mutex::Scoped hold(m_certificate_lock);
+    if (m_certificate != nullptr) return m_certificate.get();
     std::string why;
     m_certificate = DtlsCertificate::LoadOrCreate(m_options.certificate_path, &why);
     if (m_certificate == nullptr) {
-        OrvexLogPriority(platform::kLogError, kTag, "WebRTC: no certificate at %s (%s); no WebRTC",
+        OrvexLogPriority(platform::kLogError, kTag, "WebRTC: no certificate at %s (%s)",
                          m_options.certificate_path.c_str(), why.c_str());
-        return false;
+        return nullptr;
     }
-    if (!m_opus.ok()) {
-        OrvexLogPriority(platform::kLogError, kTag, "WebRTC: the Opus encoder did not start");
-        return false;
-    }
+    OrvexLogPriority(why.empty() ? platform::kLogInfo : platform::kLogWarn, kTag,
+                     "WebRTC certificate %s%s%s", m_certificate->Sha256Fingerprint().c_str(),
+                     why.empty() ? "" : ": ", why.c_str());
+    return m_certificate.get();
+}
+
+bool WebRtcServer::Start() {
     m_socket = socket(AF_INET, SOCK_DGRAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0);
     sockaddr_in bind_to{};
     bind_to.sin_family = AF_INET;
@@ -174,8 +181,7 @@ bool WebRtcServer::Start() {
     }
     m_tapped = AddFrameSink(this);
     m_thread = std::thread([this] { Run(); });
-    OrvexLogPriority(platform::kLogInfo, kTag, "WebRTC on UDP port %u, certificate %s",
-                     m_options.port, m_certificate->Sha256Fingerprint().c_str());
+    OrvexLogPriority(platform::kLogInfo, kTag, "WebRTC on UDP port %u", m_options.port);
     return true;
 }
 
@@ -205,6 +211,9 @@ void WebRtcServer::Stop() {
 
 WhepEndpoint::Reply WebRtcServer::Offer(OfferRequest request) {
     if (m_stopping.load()) return {503, "The service is stopping.\n", ""};
+    const DtlsCertificate* certificate = Certificate();
+    if (certificate == nullptr)
+        return {503, "WebRTC has no certificate; the service's log says why.\n", ""};
     // The offer's H.264 types are chosen by the stream's own profile; before the first
     // picture the capture is started so that its parameter sets can say which.
     if (m_demand != nullptr) m_demand->HoldCapture(stream::CaptureQueryFor(request.query));
@@ -243,13 +252,13 @@ WhepEndpoint::Reply WebRtcServer::Offer(OfferRequest request) {
     peer->video_seq = static_cast<uint16_t>(Random32());
     peer->audio_seq = static_cast<uint16_t>(Random32());
     peer->created_ms = NowMs();
-    peer->dtls.reset(new DtlsSrtpSession(*m_certificate, peer->offer.fingerprint));
+    peer->dtls.reset(new DtlsSrtpSession(*certificate, peer->offer.fingerprint));
     peer->end = std::move(request.end);
 
     WebRtcAnswerParams params;
     params.ice_ufrag = peer->ufrag;
     params.ice_pwd = peer->pwd;
-    params.fingerprint_sha256 = m_certificate->Sha256Fingerprint();
+    params.fingerprint_sha256 = certificate->Sha256Fingerprint();
     char ip[INET_ADDRSTRLEN] = "127.0.0.1";
     if (request.local != nullptr && request.local->sa_family == AF_INET) {
         inet_ntop(AF_INET, &reinterpret_cast<const sockaddr_in*>(request.local)->sin_addr, ip,
@@ -402,7 +411,18 @@ void WebRtcServer::SendProtected(Peer& peer, uint8_t* packet, size_t len, bool v
 
 void WebRtcServer::OnAudioPcm(const int16_t* samples, size_t frames, uint32_t time_ms) {
     if (m_playing.load(std::memory_order_relaxed) == 0) return;
-    m_opus.Add(samples, frames, [&](const uint8_t* payload, size_t len, uint32_t timestamp) {
+    if (m_opus == nullptr) {
+        if (m_opus_failed) return;
+        m_opus.reset(new OpusTrack);
+        if (!m_opus->ok()) {
+            OrvexLogPriority(platform::kLogError, kTag,
+                             "WebRTC: the Opus encoder did not start; viewers get no sound");
+            m_opus.reset();
+            m_opus_failed = true;
+            return;
+        }
+    }
+    m_opus->Add(samples, frames, [&](const uint8_t* payload, size_t len, uint32_t timestamp) {
         thread_mutex::Scoped hold(m_lock);
         m_audio_clock_ms = time_ms;
         m_audio_clock_ts = timestamp;

@@ -49,7 +49,7 @@ public:
     WebRtcServer(const WebRtcServer&) = delete;
     WebRtcServer& operator=(const WebRtcServer&) = delete;
 
-    // Binds the port, loads the certificate, taps the frames; false (one line) when it cannot.
+    // Binds the port and taps the frames; false (one line) when it cannot.
     bool Start();
     void Stop();
     uint16_t port() const { return m_options.port; }
@@ -85,11 +85,13 @@ private:
     std::shared_ptr<Peer> Remove(int slot, const char* why) ORVEX_REQUIRES(m_lock);
     void Finish(const std::shared_ptr<Peer>& peer);
     Peer* ByAddress(const sockaddr_storage& from) ORVEX_REQUIRES(m_lock);
+    const DtlsCertificate* Certificate();  // loaded or made at the first offer; null: none
     ssize_t SendDatagram(const sockaddr_storage& to, const uint8_t* p, size_t n);
 
     stream::CaptureDemand* m_demand;
     Options m_options;
-    std::unique_ptr<DtlsCertificate> m_certificate;
+    thread_mutex m_certificate_lock;
+    std::unique_ptr<DtlsCertificate> m_certificate ORVEX_GUARDED_BY(m_certificate_lock);
     int m_socket = -1;
     int m_wake[2] = {-1, -1};  // Stop's word to the socket thread
     std::thread m_thread;
@@ -103,7 +105,8 @@ private:
 
     // The tap's side, serialised by the tap: the gatherer and the Opus encoder.
     AccessUnitGatherer m_gatherer;
-    OpusTrack m_opus;
+    std::unique_ptr<OpusTrack> m_opus;  // made for the first viewer
+    bool m_opus_failed = false;
     std::vector<std::pair<const uint8_t*, size_t>> m_units;  // of the picture being sent
     uint32_t m_audio_clock_ms = 0;  // when the block of the last Opus time stamp came
     uint32_t m_audio_clock_ts = 0;
