@@ -282,6 +282,27 @@ struct WebViewerCalls {
         return Reply(connection, 404, "404 Not Found\n");
     }
 
+    // A viewer's place among kv.orvex.http.max, at a size the capture takes: 0 when it has one
+    // (and is counted), else the status to answer with `why` (one log line said it).
+    static unsigned TakePlace(WebViewer* self, const std::string& peer, const std::string& query,
+                              std::string* why) {
+        const int max = self->m_options.max_viewers;
+        if (self->m_viewers->fetch_add(1) >= max) {
+            self->m_viewers->fetch_sub(1);
+            OrvexLogPriority(platform::kLogWarn, kTag,
+                             "web viewer %s refused: %d viewers already watch (kv.orvex.http.max)",
+                             peer.c_str(), max);
+            *why = "Too many viewers; try again later.\n";
+            return 503;
+        }
+        *why = RefusedSize(query);
+        if (why->empty()) return 0;
+        self->m_viewers->fetch_sub(1);
+        OrvexLogPriority(platform::kLogWarn, kTag, "web viewer %s refused: %.*s", peer.c_str(),
+                         static_cast<int>(why->size() - 1), why->c_str());
+        return 400;
+    }
+
     // POST /whep: an SDP offer in, the answer out, the session counted among the viewers.
     static MHD_Result ServeOffer(WebViewer* self, MHD_Connection* connection,
                                  const std::string& peer, const std::string& query,
@@ -292,19 +313,10 @@ struct WebViewerCalls {
             return Reply(connection, 415, "An offer is sent as application/sdp.\n");
         if (request == nullptr || request->body_too_large)
             return Reply(connection, 413, "The offer is too large.\n", nullptr, nullptr, true);
+        std::string refused;
+        if (const unsigned status = TakePlace(self, peer, query, &refused))
+            return Reply(connection, status, refused);
         const int max = self->m_options.max_viewers;
-        if (self->m_viewers->fetch_add(1) >= max) {
-            self->m_viewers->fetch_sub(1);
-            OrvexLogPriority(platform::kLogWarn, kTag,
-                             "web viewer %s refused: %d viewers already watch (kv.orvex.http.max)",
-                             peer.c_str(), max);
-            return Reply(connection, 503, "Too many viewers; try again later.\n");
-        }
-        const std::string refused = RefusedSize(query);
-        if (!refused.empty()) {
-            self->m_viewers->fetch_sub(1);
-            return Reply(connection, 400, refused);
-        }
         sockaddr_storage local{};
         socklen_t local_len = sizeof local;
         const MHD_ConnectionInfo* fd =
@@ -338,21 +350,10 @@ struct WebViewerCalls {
 
     static MHD_Result ServeStream(WebViewer* self, MHD_Connection* connection,
                                   const std::string& peer, const std::string& query) {
+        std::string refused;
+        if (const unsigned status = TakePlace(self, peer, query, &refused))
+            return Reply(connection, status, refused);
         const int max = self->m_options.max_viewers;
-        if (self->m_viewers->fetch_add(1) >= max) {
-            self->m_viewers->fetch_sub(1);
-            OrvexLogPriority(platform::kLogWarn, kTag,
-                             "web viewer %s refused: %d viewers already watch (kv.orvex.http.max)",
-                             peer.c_str(), max);
-            return Reply(connection, 503, "Too many viewers; try again later.\n");
-        }
-        const std::string refused = RefusedSize(query);
-        if (!refused.empty()) {
-            self->m_viewers->fetch_sub(1);
-            OrvexLogPriority(platform::kLogWarn, kTag, "web viewer %s refused: %.*s", peer.c_str(),
-                             static_cast<int>(refused.size() - 1), refused.c_str());
-            return Reply(connection, 400, refused);
-        }
         if (self->m_transport != nullptr)
             self->m_transport->HoldCapture(stream::CaptureQueryFor(query));
         stream::AskForKeyFrame();  // a fresh key frame to start from, not the encoder's next
