@@ -12,8 +12,6 @@
 
 #include "base/OrvexLog.h"
 #include "platform/LogPort.h"
-#include "platform/Ports.h"
-#include "platform/PropertyPort.h"
 
 namespace auth {
 
@@ -84,14 +82,6 @@ bool StampOf(const std::string& path, struct stat* st) { return stat(path.c_str(
 AccessGate::AccessGate() : AccessGate(SteadyMs) {}
 
 AccessGate::AccessGate(Clock clock) : m_clock(std::move(clock)) {}
-
-void AccessGate::Load() {
-    char allow[platform::kPropertyValueMax] = {};
-    char file[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.allow", allow, "");
-    platform::Properties().Get("kv.orvex.auth", file, "");
-    Configure(allow, file);
-}
 
 void AccessGate::Configure(std::string_view allow, std::string_view auth_file) {
     thread_mutex::Scoped hold(m_lock);

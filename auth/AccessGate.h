@@ -58,10 +58,9 @@ public:
     AccessGate(const AccessGate&) = delete;
     AccessGate& operator=(const AccessGate&) = delete;
 
-    // Reads the properties and the credentials file; every problem is one log line and leaves
-    // the service closed rather than open.
-    void Load();
-    // The same from given values, for callers that already have them.
+    // Takes the address rules (kv.orvex.allow) and reads the credentials file (kv.orvex.auth),
+    // as the start-time settings have them; every problem is one log line and leaves the
+    // service closed rather than open.
     void Configure(std::string_view allow, std::string_view auth_file);
 
     // False when a connection from `address` (host order) must be reset at once: it is not

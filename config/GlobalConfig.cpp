@@ -1,16 +1,11 @@
 #include "config/GlobalConfig.h"
 
-#include <cstring>
-
 #include "base/OrvexLog.h"
-#include "platform/Ports.h"
 #include "sync/LazyInstance.h"
 
 namespace {
 
 constexpr const char* kTag = "globalconfig";
-// The television's own clients expect 98, although the SDP announces 97.
-constexpr int32_t kAudioPayloadTypeDefault = 98;
 
 std::atomic<Global_Config*> g_instance{nullptr};
 TLock g_create_lock;
@@ -38,57 +33,16 @@ void Global_Config::video_audio_close_cap() {
     if (m_audio_close != nullptr) m_audio_close();
 }
 
-void Global_Config::read_audio_payload_type() {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.audiopt", value, "");
-    m_audio_payload_type = kAudioPayloadTypeDefault;
-    if (value[0] == '\0') return;  // unset, as on the television
-    char* end = nullptr;
-    long pt = strtol(value, &end, 10);
-    if (end == value || *end != '\0' || pt < 96 || pt > 127) {
-        OrvexLog(kTag,
-                 "kv.orvex.audiopt=\"%s\" is not a payload type from 96 to 127; audio RTP keeps 98",
-                 value);
-        return;
-    }
-    m_audio_payload_type = static_cast<int32_t>(pt);
-}
-
-namespace {
-
-// A two-way switch property: unset (or empty) and `off` give false, `on` true; anything else is
-// logged once, with what the service does instead, and gives false.
-bool ReadSwitch(const char* key, const char* off, const char* on, const char* otherwise) {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get(key, value, "");
-    if (strcmp(value, on) == 0) return true;
-    if (value[0] != '\0' && strcmp(value, off) != 0) {
-        OrvexLog(kTag, "%s=\"%s\" is neither %s nor %s; %s", key, value, off, on, otherwise);
-    }
-    return false;
-}
-
-}  // namespace
-
-void Global_Config::read_wake_mode() {
-    m_wake_on_write.store(ReadSwitch("kv.orvex.wake", "poll", "event", "idle loops keep polling"),
-                          std::memory_order_relaxed);
+void Global_Config::Apply(const config::Settings& settings) {
+    m_audio_payload_type = settings.audio_payload_type;
+    m_wake_on_write.store(settings.wake_on_write, std::memory_order_relaxed);
+    m_report_latency.store(settings.report_latency, std::memory_order_relaxed);
+    m_audio_clock_samples.store(settings.audio_clock_samples, std::memory_order_relaxed);
 }
 
 void Global_Config::read_join_mode() {
-    m_join_at_key.store(ReadSwitch("kv.orvex.join", "now", "key", "clients join at once"),
+    m_join_at_key.store(config::Reread(config::Property::kJoin).number != 0,
                         std::memory_order_relaxed);
-}
-
-void Global_Config::read_latency_report() {
-    m_report_latency.store(ReadSwitch("kv.orvex.latency", "0", "1", "no latency report"),
-                           std::memory_order_relaxed);
-}
-
-void Global_Config::read_audio_clock() {
-    m_audio_clock_samples.store(
-        ReadSwitch("kv.orvex.audioclock", "write", "samples", "audio is stamped at write time"),
-        std::memory_order_relaxed);
 }
 
 void Global_Config::mp3_config_ok() {

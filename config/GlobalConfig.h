@@ -5,6 +5,7 @@
 #include <string>
 
 #include "base/Clocks.h"  // the program's two clocks live with the configuration
+#include "config/Settings.h"
 #include "config/orvexPIPCfg.h"
 #include "sync/TLock.h"
 
@@ -40,30 +41,20 @@ public:
     void video_audio_open_cap();
     void video_audio_close_cap();
 
-    // Takes the audio RTP payload type from the property kv.orvex.audiopt: a number from 96
-    // to 127; anything else is logged and leaves 98. Called once, when the server opens.
-    void read_audio_payload_type();
-    // Takes how idle loops wait from the property kv.orvex.wake: "poll" (the default: fixed
-    // short sleeps) or "event" (a ring's consumer sleeps until a write, the run-flag loops
-    // until they are woken). Anything else is logged and leaves polling. Called once, when the
-    // server opens; threads read it when they start.
-    void read_wake_mode();
+    // Takes the start-time settings the send threads and idle loops read: the audio payload
+    // type (kv.orvex.audiopt), how idle loops wait (kv.orvex.wake: fixed short sleeps, or a
+    // ring's consumer sleeps until a write and the run-flag loops until they are woken), the
+    // video sender's latency report (kv.orvex.latency) and how AAC frames are stamped
+    // (kv.orvex.audioclock: at write time, or by the capture time of their first sample).
+    // Called once, when the server opens; threads read them when they start.
+    void Apply(const config::Settings& settings);
     bool wake_on_write() const { return m_wake_on_write.load(std::memory_order_relaxed); }
-    // Takes when a new RTSP client gets its first picture from kv.orvex.join: "now" (the
-    // default: whatever the encoder sends next, as the television does) or "key" (from the next
-    // key picture, so that its decoder never starts on a picture it cannot decode).
+    // Reads kv.orvex.join again: "key" lets a new RTSP client start at the next key picture,
+    // so that its decoder never starts on a picture it cannot decode; otherwise it gets
+    // whatever the encoder sends next, as the television does. At each video send start.
     void read_join_mode();
     bool join_at_key() const { return m_join_at_key.load(std::memory_order_relaxed); }
-    // Takes the property kv.orvex.latency: "1" makes the video sender log, every 300 frames,
-    // how long frames waited in the ring and took to send; unset or "0" does not. Anything else
-    // is logged and leaves it off. Called once, when the server opens.
-    void read_latency_report();
     bool report_latency() const { return m_report_latency.load(std::memory_order_relaxed); }
-    // Takes the property kv.orvex.audioclock: "samples" stamps each AAC frame with the capture
-    // time of its first sample (so the RTP time advances by one frame's duration whatever the
-    // capture's block size); unset or "write", as on the television, stamps at write time.
-    // Anything else is logged and leaves write time. Called once, when the server opens.
-    void read_audio_clock();
     bool audio_clock_samples() const {
         return m_audio_clock_samples.load(std::memory_order_relaxed);
     }

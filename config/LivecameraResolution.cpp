@@ -7,6 +7,7 @@
 
 #include "base/OrvexLog.h"
 #include "config/DumpSwitches.h"
+#include "config/Settings.h"
 #include "config/livepipmanager.h"
 #include "platform/Ports.h"
 #include "sync/TLock.h"
@@ -21,20 +22,13 @@ TLock g_size_lock;
 unsigned g_locked_width ORVEX_GUARDED_BY(g_size_lock) = 0;
 unsigned g_locked_height ORVEX_GUARDED_BY(g_size_lock) = 0;
 
-bool PropertyIsOn(const char* key) {
-    char value[platform::kPropertyValueMax];
-    platform::Properties().Get(key, value, "0");
-    return atoi(value) != 0;
-}
-
 }  // namespace
 
 CaptureState& capture_state() { return g_state; }
 
 void get_platform_info() {
-    char value[platform::kPropertyValueMax];
-    platform::Properties().Get("ro.board.platform", value, "android");
-    snprintf(g_state.board, sizeof g_state.board, "%s", value);
+    snprintf(g_state.board, sizeof g_state.board, "%s",
+             config::Reread(config::Property::kBoard).text.c_str());
     OrvexLog(kTag, "******the platform is %s******", g_state.board);
 }
 
@@ -51,8 +45,9 @@ int set_video_resolution_support_more(unsigned width, unsigned height, unsigned 
                                       unsigned frameRate) {
     OrvexLog(kTag, "**********Orvex version::%s.**********", kVersion);
     get_platform_info();
-    g_state.log_switch = PropertyIsOn("kv.orvex.log");
-    g_state.dump_to_sd = PropertyIsOn("kv.orvex.dumptosd");
+    // The television's debug switches are set while it runs: read at each capture choice.
+    g_state.log_switch = config::Reread(config::Property::kLog).number != 0;
+    g_state.dump_to_sd = config::Reread(config::Property::kDumpToSd).number != 0;
     g_state.camera_id = cameraId;
     g_state.traveling_mode = travelingMode;
     if (dumpVideo == 1) set_write_file_video();

@@ -1,16 +1,10 @@
 #include "config/PlatformFlavour.h"
 
-#include <cstring>
-
-#include "platform/Ports.h"
+#include "config/Settings.h"
 
 PlatformFlavour ReadPlatformFlavour() {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kelvo.build.kelvotv", value, "");
-    if (strcmp(value, "sa") == 0) return kFlavourSa;
-    if (strcmp(value, "px") == 0) return kFlavourPx;
-    if (strcmp(value, "dqx") == 0) return kFlavourDqx;
-    return kFlavourUnknown;
+    // The table's choices are in the order of PlatformFlavour, after kFlavourUnknown.
+    return static_cast<PlatformFlavour>(config::Reread(config::Property::kFlavour).number);
 }
 
 PlatformFlavour PlatformFlavourCache::Get() {

@@ -7,8 +7,7 @@
 #include "codec/H264Packetiser.h"
 #include "config/GlobalConfig.h"
 #include "config/LivecameraResolution.h"
-#include "platform/Ports.h"
-#include "platform/PropertyPort.h"
+#include "config/Settings.h"
 #include "stream/StreamFacts.h"
 
 MediaStreamH264::MediaStreamH264(const char* name) : MediaStream(name, kMediaTypeH264) {}
@@ -37,9 +36,7 @@ const char* MediaStreamH264::FmtpForWidth(unsigned width) {
 }
 
 bool MediaStreamH264::DescribesLiveStream() {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.sdp", value, "");
-    return strcmp(value, "live") == 0;
+    return config::Reread(config::Property::kSdp).number != 0;
 }
 
 std::string MediaStreamH264::LiveFmtp(unsigned width, unsigned height) {

@@ -52,10 +52,12 @@ PublishPort& Publish();
 
 // Defined by the platform library the executable links (host or android), never by fakes.
 void InstallDefaultPorts();
-// Once the service listens: the RTSP port, the web viewer's (0: none) and who may watch (empty:
-// nothing to add). The host logs one line with the sources and addresses; the television
-// logs nothing more than it always has. Same library as InstallDefaultPorts.
-void AnnounceService(unsigned rtsp_port, unsigned http_port, const std::string& access);
+// Once the service listens: the RTSP port, the web viewer's (0: none), the address it listens
+// on (kv.orvex.bind; empty: every one) and who may watch (empty: nothing to add). The host logs
+// one line with the sources and addresses; the television logs nothing more than it always
+// has. Same library as InstallDefaultPorts.
+void AnnounceService(unsigned rtsp_port, unsigned http_port, const std::string& bind,
+                     const std::string& access);
 // The process answers a person's command with traces (orvex -v): the stdout copy of the traces
 // is printed even where the platform leaves it out (the television always prints it).
 void ShowStdoutMirror();

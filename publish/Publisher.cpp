@@ -239,10 +239,8 @@ namespace {
 std::unique_ptr<Publisher> g_publisher;
 }
 
-void StartPublishing(stream::CaptureDemand* transport) {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.publish", value, "");
-    const std::vector<std::string> words = SplitPublishList(value);
+void StartPublishing(const config::Settings& settings, stream::CaptureDemand* transport) {
+    const std::vector<std::string> words = SplitPublishList(settings.publish);
     if (words.empty()) return;  // the default: no publishing, no threads
     std::vector<PublishUrl> urls;
     for (const std::string& word : words) {

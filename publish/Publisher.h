@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "codec/AccessUnitGatherer.h"
+#include "config/Settings.h"
 #include "publish/PublishUrl.h"
 #include "stream/CaptureChoice.h"
 #include "stream/FrameTap.h"
@@ -63,7 +64,7 @@ private:
 // `max_ms`. `previous_ms` 0 means no failure yet.
 int NextBackoffMs(int previous_ms, int first_ms, int max_ms);
 
-// The service's publisher, started when kv.orvex.publish names servers (unset: nothing
-// happens). Main thread.
-void StartPublishing(stream::CaptureDemand* transport);
+// The service's publisher, started when the settings' kv.orvex.publish names servers (unset:
+// nothing happens). Main thread.
+void StartPublishing(const config::Settings& settings, stream::CaptureDemand* transport);
 void StopPublishing();

@@ -3,6 +3,7 @@
 #include <memory>
 
 #include "config/GlobalConfig.h"
+#include "config/Settings.h"
 #include "media/MediaSession.h"
 #include "media/MediaStreamH264.h"
 #include "media/MediaStreamMP4A.h"
@@ -14,7 +15,7 @@
 // listener's rings while it is open.
 class RtspService_t {
 public:
-    RtspService_t();
+    explicit RtspService_t(config::Settings settings);
     virtual ~RtspService_t();
     RtspService_t(const RtspService_t&) = delete;
     RtspService_t& operator=(const RtspService_t&) = delete;
@@ -27,8 +28,11 @@ public:
 
     RtspTransport* listener() { return m_listener.get(); }
     Global_Config* config() { return m_config; }
+    // The start-time properties, read when the service was made.
+    const config::Settings& settings() const { return m_settings; }
 
 private:
+    const config::Settings m_settings;
     std::unique_ptr<RtspTransport> m_listener;
     unsigned m_bookkeeping[4] = {};
     Global_Config* m_config;

@@ -5,6 +5,8 @@
 #include <thread>
 
 #include "base/OrvexLog.h"
+#include "config/Settings.h"
+#include "platform/Ports.h"
 #include "server/RtspService_t.h"
 #include "server/skyvo_service.h"
 #include "stream/FrameTap.h"
@@ -46,7 +48,8 @@ RtspService_t* skyvo_rtsp_service() { return Service(); }
 extern "C" {
 
 void* skyvo_rtsp_sever_init(void) {
-    auto* service = new RtspService_t();
+    // The start-time properties are read here, once, and live with the service.
+    auto* service = new RtspService_t(config::ReadSettings(platform::Properties()));
     g_pRtspService.store(service, std::memory_order_release);
     return service;
 }

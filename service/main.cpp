@@ -129,15 +129,17 @@ int main(int argc, char** argv) {
         skyvo_rtsp_sever_close();
         return result;
     }
+    const config::Settings& settings = skyvo_rtsp_service()->settings();
     // only when kv.orvex.http names a port; one gate judges RTSP and HTTP alike
     // WebRTC playback (kv.orvex.webrtc) is offered on the web viewer's server.
     WhepEndpoint* whep = StartWebRtc(skyvo_rtsp_service()->listener());
-    StartWebViewer(skyvo_rtsp_service()->listener(), &skyvo_rtsp_service()->listener()->access(),
-                   whep);
-    StartPublishing(skyvo_rtsp_service()->listener());  // only when kv.orvex.publish names servers
+    StartWebViewer(settings, skyvo_rtsp_service()->listener(),
+                   &skyvo_rtsp_service()->listener()->access(), whep);
+    // only when kv.orvex.publish names servers
+    StartPublishing(settings, skyvo_rtsp_service()->listener());
     start_orvex_system_service();
     platform::AnnounceService(
-        554, WebViewerPort(),
+        554, WebViewerPort(), settings.bind,
         "who may watch: " + skyvo_rtsp_service()->listener()->access().Summary());
     const useconds_t poll_us = Global_Config::instance()->run_flag_poll_us();
     int signal_pipe[2] = {-1, -1};

@@ -2,17 +2,15 @@
 // no HTTP library): a kv.orvex.http that asks for it is answered with one line, not a port.
 #include "base/OrvexLog.h"
 #include "platform/LogPort.h"
-#include "platform/Ports.h"
 #include "web/WebViewer.h"
 
-void StartWebViewer(stream::CaptureDemand*, auth::AccessGate*, WhepEndpoint*) {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.http", value, "");
-    if (value[0] == '\0') return;
+void StartWebViewer(const config::Settings& settings, stream::CaptureDemand*, auth::AccessGate*,
+                    WhepEndpoint*) {
+    if (settings.http_text.empty()) return;
     OrvexLogPriority(platform::kLogWarn, "orvex:::web",
                      "kv.orvex.http=%s: this build has no web viewer (docs/android.md says how "
                      "to build it in); no port is opened",
-                     value);
+                     settings.http_text.c_str());
 }
 
 void StopWebViewer() {}

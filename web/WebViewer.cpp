@@ -20,7 +20,6 @@
 #include "config/LivecameraResolution.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
-#include "platform/PropertyPort.h"
 #include "web/WebPage.h"
 
 namespace {
@@ -80,8 +79,8 @@ constexpr const char* kUnauthorizedText =
 std::string RefusedSize(const std::string& query) {
     unsigned width = 0, height = 0;
     stream::CaptureQuerySize(stream::CaptureQueryFor(query), &width, &height);
-    char board[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("ro.board.platform", board, "android");
+    const std::string board_text = config::Reread(config::Property::kBoard).text;
+    const char* board = board_text.c_str();
     if (ResolutionCode(width, height, board) >= 0) return "";
     return "The capture does not take " + std::to_string(width) + "x" + std::to_string(height) +
            "; accepted sizes (width= and height= in the address): " + AcceptedSizesText(board) +
@@ -435,7 +434,7 @@ WebViewer::WebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, O
 WebViewer::~WebViewer() { Stop(); }
 
 bool WebViewer::Start() {
-    if (m_own_gate != nullptr) m_own_gate->Load();
+    if (m_own_gate != nullptr) m_own_gate->Configure(m_options.allow, m_options.auth_file);
     sockaddr_in bind{};
     bind.sin_family = AF_INET;
     bind.sin_port = htons(static_cast<uint16_t>(m_options.port));
@@ -508,29 +507,16 @@ namespace {
 std::unique_ptr<WebViewer> g_web_viewer;
 }
 
-void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, WhepEndpoint* whep) {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.http", value, "");
-    if (value[0] == '\0') return;  // the television's default: no web viewer, no port
-    char* end = nullptr;
-    long port = strtol(value, &end, 10);
-    if (end == value || *end != '\0' || port < 1 || port > 65535) {
-        OrvexLogPriority(platform::kLogError, kTag,
-                         "kv.orvex.http=\"%s\" is not a port number; no web viewer", value);
-        return;
-    }
+void StartWebViewer(const config::Settings& settings, stream::CaptureDemand* transport,
+                    auth::AccessGate* gate, WhepEndpoint* whep) {
+    // Unset is the television's default: no web viewer, no port. A refused value was logged.
+    if (settings.http_port == 0) return;
     WebViewer::Options options;
-    options.port = static_cast<unsigned>(port);
-    platform::Properties().Get("kv.orvex.http.max", value, "16");
-    long max = strtol(value, &end, 10);
-    if (end == value || *end != '\0' || max < 1 || max > 64) {
-        OrvexLogPriority(platform::kLogWarn, kTag,
-                         "kv.orvex.http.max=\"%s\" is not 1 to 64; 16 viewers at most", value);
-        max = 16;
-    }
-    options.max_viewers = static_cast<int>(max);
-    platform::Properties().Get("kv.orvex.bind", value, "");
-    options.bind = value;
+    options.port = settings.http_port;
+    options.max_viewers = settings.http_max;
+    options.bind = settings.bind;
+    options.allow = settings.allow;
+    options.auth_file = settings.auth_file;
     auto viewer = std::make_unique<WebViewer>(transport, gate, options, whep);
     if (viewer->Start()) g_web_viewer = std::move(viewer);
 }

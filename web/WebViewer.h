@@ -6,6 +6,7 @@
 #include <thread>
 
 #include "auth/AccessGate.h"
+#include "config/Settings.h"
 #include "stream/CaptureChoice.h"
 #include "sync/thread_mutex.h"
 #include "web/ConnectionWarden.h"
@@ -37,11 +38,14 @@ public:
         // Connections waiting for a request at once, and how long each may take to send it.
         int waiting_max = 32;
         unsigned request_deadline_ms = 5000;
+        // Who may watch, for a viewer with a gate of its own (kv.orvex.allow, kv.orvex.auth).
+        std::string allow;
+        std::string auth_file;
     };
 
     // `gate`: who may watch, shared with the RTSP side; null makes the viewer a gate of its own,
-    // read from the properties at Start. `whep`: WebRTC playback offered at /whep (null: none);
-    // it must outlive the viewer's Stop.
+    // configured from the options at Start. `whep`: WebRTC playback offered at /whep (null:
+    // none); it must outlive the viewer's Stop.
     WebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate, Options options,
               WhepEndpoint* whep = nullptr);
     ~WebViewer();
@@ -78,10 +82,10 @@ private:
     std::atomic<uint32_t> m_crowd_logged_ms{0};  // one line per episode, not per connection
 };
 
-// The service's web viewer, started when kv.orvex.http names a port (unset: none, no port is
-// opened). kv.orvex.http.max: viewers at once (default 16). Main thread.
-void StartWebViewer(stream::CaptureDemand* transport, auth::AccessGate* gate,
-                    WhepEndpoint* whep = nullptr);
+// The service's web viewer, started when the settings' kv.orvex.http names a port (unset: none,
+// no port is opened), with kv.orvex.http.max viewers at once and kv.orvex.bind. Main thread.
+void StartWebViewer(const config::Settings& settings, stream::CaptureDemand* transport,
+                    auth::AccessGate* gate, WhepEndpoint* whep = nullptr);
 void StopWebViewer();
 // The port the service's web viewer listens on; 0 when there is none.
 unsigned WebViewerPort();

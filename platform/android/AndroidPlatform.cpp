@@ -34,7 +34,7 @@ void InstallDefaultPorts() {
     Install(ports);
 }
 
-void AnnounceService(unsigned, unsigned, const std::string&) {}
+void AnnounceService(unsigned, unsigned, const std::string&, const std::string&) {}
 
 void ShowStdoutMirror() {}
 

@@ -3,6 +3,7 @@
 #include <sstream>
 #include <string>
 
+#include "config/PropertyTable.h"
 #include "platform/Ports.h"
 #include "platform/host/HostAudio.h"
 #include "platform/host/HostBinder.h"
@@ -29,16 +30,16 @@ void InstallDefaultPorts() {
     // level as ChooseLogLevel reads it.
     static std::string level_complaint;
     static host::HostLog* log = [] {
+        // Read before any log exists, through the table, straight from the file.
         const char* env = getenv("ORVEX_LOG");
-        char value[kPropertyValueMax];
-        char level[kPropertyValueMax];
-        char kv_log[kPropertyValueMax];
-        properties->Get("orvex.host.log", value, "stderr");
-        properties->Get("orvex.host.log.level", level, "");
-        properties->Get("kv.orvex.log", kv_log, "");
+        auto read = [](config::Property id) {
+            return config::ReadProperty(*properties, config::Def(id)).text;
+        };
+        const std::string sink = read(config::Property::kHostLog);
         int least =
-            host::ChooseLogLevel(getenv("ORVEX_LOG_LEVEL"), level, kv_log, &level_complaint);
-        return new host::HostLog(env != nullptr && env[0] != '\0' ? env : value, least);
+            host::ChooseLogLevel(getenv("ORVEX_LOG_LEVEL"), read(config::Property::kHostLogLevel),
+                                 read(config::Property::kLog), &level_complaint);
+        return new host::HostLog(env != nullptr && env[0] != '\0' ? env : sink, least);
     }();
     g_log = log;
     static const Ports ports = [] {
@@ -76,9 +77,8 @@ void ShowStdoutMirror() {
     if (g_log != nullptr) g_log->ShowMirror();
 }
 
-void AnnounceService(unsigned rtsp_port, unsigned http_port, const std::string& access) {
-    char bind[kPropertyValueMax];
-    Properties().Get("kv.orvex.bind", bind, "");
+void AnnounceService(unsigned rtsp_port, unsigned http_port, const std::string& bind,
+                     const std::string& access) {
     const std::string line =
         host::StartLine(host::ChooseVideoSource(false), host::ChooseAudioSource(),
                         host::ReachableAddress(bind), rtsp_port, http_port, access);

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 
+#include "config/PropertyTable.h"
 #include "platform/LogPort.h"
 #include "platform/host/HostLog.h"
 
@@ -9,15 +10,11 @@ namespace platform {
 namespace host {
 
 const std::vector<std::string>& KnownPropertyKeys() {
-    // tools/check-properties.py keeps this list equal to the keys the sources read.
-    static const std::vector<std::string> keys = {
-        "kelvo.build.kelvotv",  "kv.orvex.allow",    "kv.orvex.audioclock",  "kv.orvex.audiopt",
-        "kv.orvex.auth",        "kv.orvex.bind",     "kv.orvex.dumptosd",    "kv.orvex.http",
-        "kv.orvex.http.max",    "kv.orvex.join",     "kv.orvex.latency",     "kv.orvex.log",
-        "kv.orvex.publish",     "kv.orvex.sdp",      "kv.orvex.wake",        "kv.orvex.webrtc",
-        "orvex.host.audio",     "orvex.host.log",    "orvex.host.log.level", "orvex.host.video",
-        "orvex.host.video.sub", "ro.board.platform",
-    };
+    static const std::vector<std::string> keys = [] {
+        std::vector<std::string> out;
+        for (size_t i = 0; i < config::kPropertyCount; ++i) out.push_back(config::Defs()[i].key);
+        return out;
+    }();
     return keys;
 }
 

@@ -7,8 +7,9 @@
 namespace platform {
 namespace host {
 
-// Every property key the service reads, the television's and the host's. A key in the property
-// file that is not among them does nothing, and is most likely misspelt.
+// Every property key the service reads, the television's and the host's, in the order of the
+// property table (config/PropertyTable.cpp). A key in the property file that is not among them
+// does nothing, and is most likely misspelt.
 const std::vector<std::string>& KnownPropertyKeys();
 
 // The known key with the fewest single-character edits from `key` (the first such in the list).

@@ -112,7 +112,7 @@ TEST_F(GlobalConfigTest, AudioPayloadTypeProperty) {
         fake.log.Clear();
         Global_Config* config = Global_Config::instance();
         config->m_audio_payload_type = 0;
-        config->read_audio_payload_type();
+        config->Apply(config::ReadSettings(fake.properties));
         EXPECT_EQ(config->m_audio_payload_type, c.payload_type) << (c.value ? c.value : "missing");
         EXPECT_EQ(fake.log.Texts("globalconfig"), c.log) << (c.value ? c.value : "missing");
     }
@@ -163,9 +163,7 @@ TEST_F(GlobalConfigTest, SwitchProperties) {
         if (c.value != nullptr) fake.properties.Set(c.key, c.value);
         fake.log.Clear();
         Global_Config* config = Global_Config::instance();
-        config->read_wake_mode();
-        config->read_latency_report();
-        config->read_audio_clock();
+        config->Apply(config::ReadSettings(fake.properties));
         const std::string key = c.key;
         EXPECT_EQ(config->wake_on_write(), key == "kv.orvex.wake" && c.on) << what;
         EXPECT_EQ(config->run_flag_poll_us(), key == "kv.orvex.wake" && c.on ? 1000000u : 10000u)

@@ -385,13 +385,13 @@ TEST_F(PublisherTest, StopEndsAStalledWrite) {
 
 // The property: unset, nothing happens; a malformed URL is named once and the rest still run.
 TEST_F(PublisherTest, PropertyNamesTheServers) {
-    StartPublishing(nullptr);
+    StartPublishing(config::ReadSettings(fake.properties), nullptr);
     StopPublishing();
     EXPECT_EQ(server.attempts(), 0);
     EXPECT_TRUE(fake.log.Texts("orvex:::publish").empty());
 
     fake.properties.Set("kv.orvex.publish", "ftp://127.0.0.1/x rtmp://127.0.0.1/live/tv");
-    StartPublishing(nullptr);
+    StartPublishing(config::ReadSettings(fake.properties), nullptr);
     const Bytes sps = AnnexB({kSps}), pps = AnnexB({kPps}), idr = AnnexB({kIdr});
     for (int i = 0; i < 3; ++i) {
         TapVideoFrame(sps.data(), sps.size());

@@ -42,7 +42,7 @@ protected:
         Global_Config::CloseInstance();
         config = Global_Config::instance();
         fake.properties.Set("kv.orvex.wake", GetParam());
-        config->read_wake_mode();
+        config->Apply(config::ReadSettings(fake.properties));
         config->m_video_rtp_frequency = 90000;
         config->m_audio_rtp_frequency = 48000;
         config->m_audio_rtp_port = 0;  // any port: tests may run side by side
@@ -216,7 +216,7 @@ TEST_P(SendSessionTest, AudioDropsFramesWhilePausedOrNotReady) {
 TEST_P(SendSessionTest, AudioWaitsForBothClockRates) {
     Global_Config::CloseInstance();
     config = Global_Config::instance();
-    config->read_wake_mode();
+    config->Apply(config::ReadSettings(fake.properties));
     config->m_audio_rtp_frequency = 48000;
     config->mp3_config_ok();  // the video rate is still missing
     UdpReceiver r;
@@ -251,7 +251,7 @@ TEST_P(SendSessionTest, BrokenItemStreamDoesNotSpinTheSender) {
 TEST_P(SendSessionTest, LatencyReportComesWithEvery300thFrame) {
     for (const char* value : {"0", "1"}) {
         fake.properties.Set("kv.orvex.latency", value);
-        config->read_latency_report();
+        config->Apply(config::ReadSettings(fake.properties));
         fake.log.Clear();
         UdpReceiver r;
         config->set_timestamp(1000000, false);

@@ -35,8 +35,9 @@ TEST(OptionalModulesTest, LeftOutModulesSayWhyOnceWhenAskedFor) {
         SCOPED_TRACE(std::string(c.key) + "=" + c.value);
         platform::fake::FakePlatform fake;
         fake.properties.Set(c.key, c.value);
-        StartWebViewer(nullptr, nullptr);
-        StartPublishing(nullptr);
+        const config::Settings settings = config::ReadSettings(fake.properties);
+        StartWebViewer(settings, nullptr, nullptr);
+        StartPublishing(settings, nullptr);
         StopPublishing();
         StopWebViewer();
         EXPECT_EQ(fake.log.Texts(c.tag), c.lines);

@@ -575,7 +575,9 @@ TEST_F(WebViewerTest, WithUsersEveryPathNeedsADigestAnswer) {
     ASSERT_EQ(write(fd, line.data(), line.size()), static_cast<ssize_t>(line.size()));
     close(fd);
     fake_.properties.Set("kv.orvex.auth", path);
-    StartViewer();
+    WebViewer::Options options;
+    options.auth_file = config::ReadSettings(fake_.properties).auth_file;
+    StartViewer(16, nullptr, options);
     std::string challenge = Ask(viewer_->port(), "GET /?a=1 HTTP/1.1\r\nHost: t\r\n\r\n");
     ASSERT_EQ(challenge.compare(0, 12, "HTTP/1.1 401"), 0) << challenge.substr(0, 80);
     const std::string www = Header(challenge, "WWW-Authenticate");
