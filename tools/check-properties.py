@@ -1,24 +1,52 @@
 #!/usr/bin/env python3
-"""The host warns about property keys that nothing reads: its list of known keys
-(platform/host/KnownProperties.cpp) must hold every key the sources read, and nothing else."""
+"""Every property is read through its entry of config/PropertyTable.cpp, which also gives the
+host its list of known keys for the misspelt-key warning. Fails when a source names a key as a
+whole string that the table lacks (a read by hand, or a table that lost an entry), when a source
+outside config/ calls the property port itself, or when an entry of the table is read by
+nothing."""
 import pathlib
 import re
 import sys
 
 top = pathlib.Path(__file__).resolve().parent.parent
 key = re.compile(r'"((?:kv\.orvex|orvex\.host|ro\.board|kelvo\.build)\.[A-Za-z0-9_.]+)"')
-listed_file = top / "platform/host/KnownProperties.cpp"
-listed = set(key.findall(listed_file.read_text()))
-read = set()
-for folder in ("auth", "base", "buffers", "capture", "codec", "config", "media", "net", "platform",
-               "publish", "rtp", "rtsp", "server", "service", "stream", "sync", "web", "webrtc"):
-    for path in (top / folder).rglob("*.[ch]*"):
-        if path != listed_file and path.suffix in (".cpp", ".h"):
-            read |= set(key.findall(path.read_text(errors="replace")))
-for k in sorted(read - listed):
-    print("check-properties: %s is read but not in %s" % (k, listed_file.relative_to(top)))
-for k in sorted(listed - read):
-    print("check-properties: %s is listed but nothing reads it" % k)
-print("check-properties: %d keys read, %d listed, %d differences"
-      % (len(read), len(listed), len(read ^ listed)))
-sys.exit(1 if read ^ listed else 0)
+entry = re.compile(r'\{P::(k[A-Za-z0-9]+),\s*"([^"]+)"')
+table_file = top / "config/PropertyTable.cpp"
+table_header = top / "config/PropertyTable.h"
+table = dict((k, ident) for ident, k in entry.findall(table_file.read_text()))
+if not table:
+    print("check-properties: no entries found in %s" % table_file.relative_to(top))
+    sys.exit(1)
+
+named = {}  # key -> the first file that names it
+used = set()  # Property identifiers read outside the table
+by_hand = re.compile(r"(?:Properties\(\)\s*\.|properties->|properties\.)\s*(?:Get|Lookup)\s*\(")
+by_hand_files = []
+sources = []
+for folder in ("auth", "capture", "config", "media", "platform", "publish", "rtp", "rtsp",
+               "server", "service", "stream", "web"):
+    if (top / folder).is_dir():
+        sources += [p for p in (top / folder).rglob("*.[ch]*") if p.suffix in (".cpp", ".h")]
+for path in sources:
+    if path in (table_file, table_header):
+        continue
+    text = path.read_text(errors="replace")
+    for k in key.findall(text):
+        named.setdefault(k, path.relative_to(top))
+    used |= set(re.findall(r"Property::(k[A-Za-z0-9]+)", text))
+    if by_hand.search(text) and path.relative_to(top).parts[0] != "config":
+        by_hand_files.append(path.relative_to(top))
+
+problems = 0
+for k in sorted(set(named) - set(table)):
+    problems += 1
+    print("check-properties: %s (in %s) is not in %s" % (k, named[k], table_file.relative_to(top)))
+for path in by_hand_files:
+    problems += 1
+    print("check-properties: %s reads the property port itself; read through config/" % path)
+for k, ident in sorted(table.items()):
+    if ident not in used:
+        problems += 1
+        print("check-properties: %s (Property::%s) is in the table but nothing reads it" % (k, ident))
+print("check-properties: %d keys in the table, %d problems" % (len(table), problems))
+sys.exit(1 if problems else 0)
