@@ -20,6 +20,14 @@ int FakeProperties::Get(const char* key, char* value, const char* default_value)
     return static_cast<int>(n);
 }
 
+bool FakeProperties::Lookup(const std::string& key, std::string* value) {
+    std::lock_guard<std::mutex> hold(mutex_);
+    auto it = values_.find(key);
+    if (it == values_.end() || it->second.empty()) return false;
+    *value = it->second;
+    return true;
+}
+
 void FakeProperties::Set(const std::string& key, const std::string& value) {
     thread_mutex::Scoped hold(mutex_);
     values_[key] = value;

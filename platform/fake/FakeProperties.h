@@ -14,6 +14,8 @@ namespace fake {
 class FakeProperties final : public PropertyPort {
 public:
     int Get(const char* key, char* value, const char* default_value) override;
+    // The whole value, as the host's property file keeps it.
+    bool Lookup(const std::string& key, std::string* value) override;
     void Set(const std::string& key, const std::string& value);
     void Clear();
 
