@@ -21,8 +21,8 @@ constexpr const char* kAccess = "orvex:::access";
 constexpr int kError = platform::kLogError;
 constexpr int kWarn = platform::kLogWarn;
 
-// tools/check-properties.py reads the keys from this table: one entry per line group, the key
-// the first string of its entry.
+// tools/check-properties.py and cmake/PropertyKeys.cmake read the keys from this source: each
+// entry begins with its Property (P::) and its key, on one line.
 // clang-format off
 constexpr PropertyDef kTable[] = {
     {P::kFlavour, "kelvo.build.kelvotv", T::kChoice, "", nullptr, nullptr, 0, 0, 0, kFlavours,
@@ -63,7 +63,7 @@ constexpr PropertyDef kTable[] = {
      "kv.orvex.latency=\"%s\" is neither 0 nor 1; no latency report"},
     // The host reads its text too: "debug" or non-zero is its debug level (HostLog).
     {P::kLog, "kv.orvex.log", T::kNonZero, "0", nullptr, nullptr, 0, 0, 0, nullptr, W::kAtPlay,
-     "capture: its debug logging (the host's log level at start)", nullptr, 0, nullptr},
+     "capture: its debug logging; platform/host: its log level at start", nullptr, 0, nullptr},
     {P::kPublish, "kv.orvex.publish", T::kText, "", nullptr, nullptr, 0, 0, 0, nullptr,
      W::kAtStart, "publisher: rtmp:// and srt:// URLs; it logs the ones it leaves out", nullptr,
      0, nullptr},
@@ -75,16 +75,16 @@ constexpr PropertyDef kTable[] = {
      "kv.orvex.wake=\"%s\" is neither poll nor event; idle loops keep polling"},
     // The host's sources are parsed, and refused with a line, by platform/host/capture.
     {P::kHostAudio, "orvex.host.audio", T::kWholeText, "tone", nullptr, nullptr, 0, 0, 0,
-     nullptr, W::kAtPlay, "host: the sound source", nullptr, 0, nullptr},
+     nullptr, W::kAtPlay, "platform/host (HostSources): the sound source", nullptr, 0, nullptr},
     {P::kHostLog, "orvex.host.log", T::kText, "stderr", nullptr, nullptr, 0, 0, 0, nullptr,
-     W::kAtStart, "host: the log sink (stderr, syslog, file:PATH)", nullptr, 0, nullptr},
+     W::kAtStart, "platform/host (HostPlatform): the log sink (stderr, syslog, file:PATH)", nullptr, 0, nullptr},
     {P::kHostLogLevel, "orvex.host.log.level", T::kText, "", nullptr, nullptr, 0, 0, 0, nullptr,
-     W::kAtStart, "host: the least priority logged; HostLog refuses unknown levels", nullptr, 0,
+     W::kAtStart, "platform/host (HostLog): the least priority logged; it refuses unknown ones", nullptr, 0,
      nullptr},
     {P::kHostVideo, "orvex.host.video", T::kWholeText, "pattern", nullptr, nullptr, 0, 0, 0,
-     nullptr, W::kAtPlay, "host: the main window's picture source", nullptr, 0, nullptr},
+     nullptr, W::kAtPlay, "platform/host (HostSources): the main window's picture source", nullptr, 0, nullptr},
     {P::kHostVideoSub, "orvex.host.video.sub", T::kWholeText, "pattern", nullptr, nullptr, 0, 0,
-     0, nullptr, W::kAtPlay, "host: the sub window's picture source", nullptr, 0, nullptr},
+     0, nullptr, W::kAtPlay, "platform/host (HostSources): the sub window's picture source", nullptr, 0, nullptr},
     // Read-only on the television; read at each capture choice as the television always has.
     {P::kBoard, "ro.board.platform", T::kText, "android", nullptr, nullptr, 0, 0, 0, nullptr,
      W::kAtPlay, "capture rules, web viewer: the chip (1920x1080 is refused on tarvo)", nullptr,

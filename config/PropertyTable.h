@@ -7,10 +7,12 @@
 
 // Every property the service reads, the television's and the host's, in one table: its key,
 // how its text becomes a value, what an unset key means, what is accepted, who reads it and
-// when a change takes effect. Nothing else reads the property port by key: the service reads
-// the start-time ones once into config::Settings, and the few that act at the next PLAY again
-// through their entry here. The host's misspelt-key warning and tools/check-properties.py take
-// their list of keys from this table.
+// when a change takes effect. The service reads the start-time ones once into
+// config::Settings, and the few that act at the next PLAY again through their entry here. Only
+// the host platform, a layer below this one, reads its own (orvex.host.*, and kv.orvex.log for
+// its log level) itself, with the texts and defaults its entries name. The host's misspelt-key
+// warning (through cmake/PropertyKeys.cmake) and tools/check-properties.py take their list of
+// keys from this table.
 // Thread contract: the table is constant; the functions may run on any thread.
 
 namespace config {

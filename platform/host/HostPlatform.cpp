@@ -3,7 +3,6 @@
 #include <sstream>
 #include <string>
 
-#include "config/PropertyTable.h"
 #include "platform/Ports.h"
 #include "platform/host/HostAudio.h"
 #include "platform/host/HostBinder.h"
@@ -30,16 +29,17 @@ void InstallDefaultPorts() {
     // level as ChooseLogLevel reads it.
     static std::string level_complaint;
     static host::HostLog* log = [] {
-        // Read before any log exists, through the table, straight from the file.
+        // Read before any log exists, by hand: the property table is a layer above this one.
         const char* env = getenv("ORVEX_LOG");
-        auto read = [](config::Property id) {
-            return config::ReadProperty(*properties, config::Def(id)).text;
-        };
-        const std::string sink = read(config::Property::kHostLog);
+        char value[kPropertyValueMax];
+        char level[kPropertyValueMax];
+        char kv_log[kPropertyValueMax];
+        properties->Get("orvex.host.log", value, "stderr");
+        properties->Get("orvex.host.log.level", level, "");
+        properties->Get("kv.orvex.log", kv_log, "");
         int least =
-            host::ChooseLogLevel(getenv("ORVEX_LOG_LEVEL"), read(config::Property::kHostLogLevel),
-                                 read(config::Property::kLog), &level_complaint);
-        return new host::HostLog(env != nullptr && env[0] != '\0' ? env : sink, least);
+            host::ChooseLogLevel(getenv("ORVEX_LOG_LEVEL"), level, kv_log, &level_complaint);
+        return new host::HostLog(env != nullptr && env[0] != '\0' ? env : value, least);
     }();
     g_log = log;
     static const Ports ports = [] {

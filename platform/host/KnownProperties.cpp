@@ -2,7 +2,6 @@
 
 #include <algorithm>
 
-#include "config/PropertyTable.h"
 #include "platform/LogPort.h"
 #include "platform/host/HostLog.h"
 
@@ -10,11 +9,10 @@ namespace platform {
 namespace host {
 
 const std::vector<std::string>& KnownPropertyKeys() {
-    static const std::vector<std::string> keys = [] {
-        std::vector<std::string> out;
-        for (size_t i = 0; i < config::kPropertyCount; ++i) out.push_back(config::Defs()[i].key);
-        return out;
-    }();
+    // The property table's keys, in its order, listed at build time (cmake/PropertyKeys.cmake).
+    static const std::vector<std::string> keys = {
+#include "PropertyKeys.inc"
+    };
     return keys;
 }
 

@@ -7,6 +7,7 @@
 #include <sstream>
 #include <string>
 
+#include "config/PropertyTable.h"
 #include "platform/Ports.h"
 #include "platform/host/HostLog.h"
 #include "platform/host/HostProperties.h"
@@ -278,6 +279,13 @@ TEST(KnownPropertiesTest, MisspeltKeysPointToTheNearestKnownOne) {
     for (const auto& c : cases) {
         EXPECT_EQ(platform::host::NearestKnownKey(c.key), c.nearest) << c.key;
     }
+}
+
+// The keys the build listed for the host are the property table's, in its order.
+TEST(KnownPropertiesTest, TheKnownKeysAreThePropertyTables) {
+    std::vector<std::string> table;
+    for (size_t i = 0; i < config::kPropertyCount; ++i) table.push_back(config::Defs()[i].key);
+    EXPECT_EQ(platform::host::KnownPropertyKeys(), table);
 }
 
 // The shipped host properties use only keys that something reads.

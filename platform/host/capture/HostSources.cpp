@@ -4,7 +4,6 @@
 #include <cstring>
 #include <string>
 
-#include "config/PropertyTable.h"
 #include "platform/Ports.h"
 
 namespace platform {
@@ -19,6 +18,12 @@ bool Is(const std::string& value, const char* name, std::string* arg) {
     return true;
 }
 
+// The property's whole value: a host property file holds pipelines longer than Get can copy.
+std::string WholeProperty(const char* key, const char* default_value) {
+    std::string value;
+    return Properties().Lookup(key, &value) ? value : default_value;
+}
+
 std::string Quoted(const std::string& s) {
     std::string out = "\"";
     for (char c : s) {
@@ -28,12 +33,9 @@ std::string Quoted(const std::string& s) {
     return out + "\"";
 }
 
-// The entries are whole text: a host property file holds pipelines longer than Get can copy.
-SourceChoice Choose(config::Property id, bool (*parse)(const std::string&, SourceChoice*)) {
-    const config::PropertyDef& def = config::Def(id);
-    const char* key = def.key;
-    const char* default_value = def.unset;
-    std::string value = config::ReadProperty(Properties(), def).text;
+SourceChoice Choose(const char* key, const char* default_value,
+                    bool (*parse)(const std::string&, SourceChoice*)) {
+    std::string value = WholeProperty(key, default_value);
     SourceChoice choice;
     if (parse(value, &choice)) return choice;
     std::string line =
@@ -109,11 +111,10 @@ bool ParseAudioSource(const std::string& value, SourceChoice* out) {
 }
 
 SourceChoice ChooseVideoSource(bool sub) {
-    return Choose(sub ? config::Property::kHostVideoSub : config::Property::kHostVideo,
-                  &ParseVideoSource);
+    return Choose(sub ? kSubVideoProperty : kVideoProperty, "pattern", &ParseVideoSource);
 }
 
-SourceChoice ChooseAudioSource() { return Choose(config::Property::kHostAudio, &ParseAudioSource); }
+SourceChoice ChooseAudioSource() { return Choose(kAudioProperty, "tone", &ParseAudioSource); }
 
 namespace {
 

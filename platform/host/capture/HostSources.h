@@ -22,6 +22,10 @@ struct SourceChoice {
     bool throughPipeWire() const { return kind == kWayland || kind == kPipeWire; }
 };
 
+constexpr const char* kVideoProperty = "orvex.host.video";
+constexpr const char* kSubVideoProperty = "orvex.host.video.sub";
+constexpr const char* kAudioProperty = "orvex.host.audio";
+
 // Parses a video value: pattern, x11[:DISPLAY], wayland, screen (wayland or x11, whichever the
 // session is), pipewire:NODE, v4l2[:DEVICE], gst:PIPELINE or none. False when the value is
 // none of those.
@@ -32,8 +36,8 @@ SourceChoice::Kind ScreenKind(const char* wayland_display, const char* session_t
 // Parses an audio value: tone, pulse[:SOURCE], alsa[:DEVICE], gst:PIPELINE or none.
 bool ParseAudioSource(const std::string& value, SourceChoice* out);
 
-// Reads the property (whole value) through its entry of the property table, and parses it; an
-// unknown value logs one line and gives the entry's default (the pattern, the tone).
+// Reads the property (whole value) and parses it; an unknown value logs one line and gives
+// the default (the pattern, the tone).
 SourceChoice ChooseVideoSource(bool sub);
 SourceChoice ChooseAudioSource();
 
