@@ -23,10 +23,13 @@ used = set()  # Property identifiers read outside the table
 by_hand = re.compile(r"(?:Properties\(\)\s*\.|properties->|properties\.)\s*(?:Get|Lookup)\s*\(")
 by_hand_files = []
 sources = []
-for folder in ("auth", "capture", "config", "media", "platform", "publish", "rtp", "rtsp",
-               "server", "service", "stream", "web"):
-    if (top / folder).is_dir():
-        sources += [p for p in (top / folder).rglob("*.[ch]*") if p.suffix in (".cpp", ".h")]
+# Every folder of the service's sources, whatever the layers are called; not the tests, tools,
+# benchmarks or build trees.
+skipped = {"bench", "cmake", "docs", "tests", "tools"}
+for folder in sorted(top.iterdir()):
+    if not folder.is_dir() or folder.name in skipped or folder.name.startswith((".", "build")):
+        continue
+    sources += [p for p in folder.rglob("*.[ch]*") if p.suffix in (".cpp", ".h")]
 for path in sources:
     if path in (table_file, table_header):
         continue
