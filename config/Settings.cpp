@@ -6,14 +6,7 @@
 namespace config {
 namespace {
 
-PropertyValue Read(platform::PropertyPort& port, Property id) {
-    PropertyValue value = ReadProperty(port, Def(id));
-    LogRefusal(id, value);
-    return value;
-}
-
-}  // namespace
-
+// One line, as `id`'s entry says, for a refused value.
 void LogRefusal(Property id, const PropertyValue& value) {
     if (value.refusal.empty()) return;
     const PropertyDef& def = Def(id);
@@ -23,6 +16,14 @@ void LogRefusal(Property id, const PropertyValue& value) {
         OrvexLogPriority(def.priority, def.tag, "%s", value.refusal.c_str());
     }
 }
+
+PropertyValue Read(platform::PropertyPort& port, Property id) {
+    PropertyValue value = ReadProperty(port, Def(id));
+    LogRefusal(id, value);
+    return value;
+}
+
+}  // namespace
 
 Settings ReadSettings(platform::PropertyPort& port) {
     Settings s;

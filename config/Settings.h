@@ -32,7 +32,4 @@ Settings ReadSettings(platform::PropertyPort& port);
 // take effect at the next PLAY (TakesEffect::kAtPlay, kAtFirstUse).
 PropertyValue Reread(Property id);
 
-// Logs `value`'s refusal, if it has one, as `id`'s entry says.
-void LogRefusal(Property id, const PropertyValue& value);
-
 }  // namespace config
