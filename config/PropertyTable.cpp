@@ -73,6 +73,10 @@ constexpr PropertyDef kTable[] = {
     {P::kWake, "kv.orvex.wake", T::kSwitch, "", "poll", "event", 0, 0, 0, nullptr, W::kAtStart,
      "send threads, AAC encoder, run-flag loops: sleep until woken", kConfig, kTraceLine,
      "kv.orvex.wake=\"%s\" is neither poll nor event; idle loops keep polling"},
+    // Unset on the television: no WebRTC. 0 is any free port.
+    {P::kWebRtc, "kv.orvex.webrtc", T::kNumber, "", nullptr, nullptr, 0, 65535, -1, nullptr,
+     W::kAtStart, "WebRTC playback: its UDP port", "orvex:::webrtc", kError,
+     "kv.orvex.webrtc=\"%s\" is not a UDP port number; no WebRTC"},
     // The host's sources are parsed, and refused with a line, by platform/host/capture.
     {P::kHostAudio, "orvex.host.audio", T::kWholeText, "tone", nullptr, nullptr, 0, 0, 0,
      nullptr, W::kAtPlay, "platform/host (HostSources): the sound source", nullptr, 0, nullptr},

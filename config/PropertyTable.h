@@ -34,6 +34,7 @@ enum class Property {
     kPublish,
     kSdp,
     kWake,
+    kWebRtc,
     kHostAudio,
     kHostLog,
     kHostLogLevel,

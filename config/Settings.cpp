@@ -37,6 +37,9 @@ Settings ReadSettings(platform::PropertyPort& port) {
     s.http_port = static_cast<unsigned>(http.number);
     // Only a web viewer reads its limit: without one, a bad limit is not worth a line.
     if (s.http_port != 0) s.http_max = static_cast<int>(Read(port, Property::kHttpMax).number);
+    const PropertyValue webrtc = Read(port, Property::kWebRtc);
+    s.webrtc_text = webrtc.text;
+    s.webrtc_port = static_cast<int>(webrtc.number);
     s.publish = Read(port, Property::kPublish).text;
     s.audio_payload_type = static_cast<int>(Read(port, Property::kAudioPayloadType).number);
     s.wake_on_write = Read(port, Property::kWake).number != 0;

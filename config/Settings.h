@@ -17,6 +17,8 @@ struct Settings {
     unsigned http_port = 0;            // kv.orvex.http: 0 for no web viewer
     std::string http_text;             // as written, for a build without the web viewer
     int http_max = 16;                 // kv.orvex.http.max
+    int webrtc_port = -1;              // kv.orvex.webrtc: -1 for no WebRTC, 0 for any free port
+    std::string webrtc_text;           // as written, for a build without WebRTC
     std::string publish;               // kv.orvex.publish, as written (the publisher splits it)
     int audio_payload_type = 98;       // kv.orvex.audiopt
     bool wake_on_write = false;        // kv.orvex.wake=event

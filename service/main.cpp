@@ -132,7 +132,7 @@ int main(int argc, char** argv) {
     const config::Settings& settings = skyvo_rtsp_service()->settings();
     // only when kv.orvex.http names a port; one gate judges RTSP and HTTP alike
     // WebRTC playback (kv.orvex.webrtc) is offered on the web viewer's server.
-    WhepEndpoint* whep = StartWebRtc(skyvo_rtsp_service()->listener());
+    WhepEndpoint* whep = StartWebRtc(settings, skyvo_rtsp_service()->listener());
     StartWebViewer(settings, skyvo_rtsp_service()->listener(),
                    &skyvo_rtsp_service()->listener()->access(), whep);
     // only when kv.orvex.publish names servers

@@ -3,16 +3,13 @@
 // with one line, not a port.
 #include "base/OrvexLog.h"
 #include "platform/LogPort.h"
-#include "platform/Ports.h"
 #include "webrtc/WebRtc.h"
 
-WhepEndpoint* StartWebRtc(stream::CaptureDemand*) {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.webrtc", value, "");
-    if (value[0] != '\0') {
+WhepEndpoint* StartWebRtc(const config::Settings& settings, stream::CaptureDemand*) {
+    if (!settings.webrtc_text.empty()) {
         OrvexLogPriority(platform::kLogWarn, "orvex:::webrtc",
                          "kv.orvex.webrtc=%s: this build has no WebRTC playback; no port is opened",
-                         value);
+                         settings.webrtc_text.c_str());
     }
     return nullptr;
 }

@@ -640,21 +640,12 @@ std::string CertificatePath() {
 }
 }  // namespace
 
-WhepEndpoint* StartWebRtc(stream::CaptureDemand* demand) {
-    char value[platform::kPropertyValueMax] = {};
-    platform::Properties().Get("kv.orvex.webrtc", value, "");
-    if (value[0] == '\0') return nullptr;  // the television's default: nothing opens
-    char* end = nullptr;
-    const long port = strtol(value, &end, 10);
-    if (end == value || *end != '\0' || port < 0 || port > 65535) {
-        OrvexLogPriority(platform::kLogError, "orvex:::webrtc",
-                         "kv.orvex.webrtc=\"%s\" is not a UDP port number; no WebRTC", value);
-        return nullptr;
-    }
+WhepEndpoint* StartWebRtc(const config::Settings& settings, stream::CaptureDemand* demand) {
+    // Unset is the television's default: nothing opens. A refused value was logged.
+    if (settings.webrtc_port < 0) return nullptr;
     webrtc::WebRtcServer::Options options;
-    options.port = static_cast<uint16_t>(port);
-    platform::Properties().Get("kv.orvex.bind", value, "");
-    options.bind = value;
+    options.port = static_cast<uint16_t>(settings.webrtc_port);
+    options.bind = settings.bind;
     options.certificate_path = CertificatePath();
     auto server = std::make_unique<webrtc::WebRtcServer>(demand, options);
     if (!server->Start()) return nullptr;
