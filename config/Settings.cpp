@@ -1,7 +1,7 @@
 #include "config/Settings.h"
 
+#include "base/OrvexLog.h"
 #include "platform/Ports.h"
-#include "service/OrvexLog.h"
 
 namespace config {
 namespace {

@@ -21,7 +21,7 @@ int FakeProperties::Get(const char* key, char* value, const char* default_value)
 }
 
 bool FakeProperties::Lookup(const std::string& key, std::string* value) {
-    std::lock_guard<std::mutex> hold(mutex_);
+    thread_mutex::Scoped hold(mutex_);
     auto it = values_.find(key);
     if (it == values_.end() || it->second.empty()) return false;
     *value = it->second;
