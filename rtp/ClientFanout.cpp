@@ -2,6 +2,12 @@
 
 #include <netinet/udp.h>
 
+// Older C libraries' headers (the television's among them) predate UDP segmentation (Linux
+// 4.18); the option's number is the kernel's ABI, and an older kernel refuses it at the probe.
+#ifndef UDP_SEGMENT
+#define UDP_SEGMENT 103
+#endif
+
 #include <cerrno>
 #include <cstring>
 
