@@ -4,11 +4,9 @@
 #include <arpa/inet.h>
 #include <gtest/gtest.h>
 #include <netinet/in.h>
-#include <openssl/hmac.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
-#include <zlib.h>
 
 #include <cstdlib>
 #include <cstring>
@@ -21,11 +19,14 @@
 #include "stream/FrameTap.h"
 #include "stream/StreamFacts.h"
 #include "tests/webrtc/DtlsTestClient.h"
+#include "tests/webrtc/StunRequest.h"
 #include "webrtc/WebRtcServer.h"
 
 namespace webrtc {
 namespace {
 
+using test::BindingRequest;
+using test::Put16;
 using Bytes = std::vector<uint8_t>;
 
 std::string ReadFile(const std::string& path) {
@@ -41,39 +42,6 @@ std::string Attribute(const std::string& sdp, const std::string& name) {
     if (at == std::string::npos) return "";
     const size_t from = at + name.size() + 3;
     return sdp.substr(from, sdp.find("\r\n", from) - from);
-}
-
-void Put16(Bytes& b, size_t at, uint16_t v) {
-    b[at] = static_cast<uint8_t>(v >> 8);
-    b[at + 1] = static_cast<uint8_t>(v);
-}
-
-// A browser's connectivity check (RFC 8445 §7.2.2): USERNAME, USE-CANDIDATE,
-// MESSAGE-INTEGRITY, FINGERPRINT.
-Bytes BindingRequest(const std::string& username, const std::string& password) {
-    Bytes m = {0x00, 0x01, 0, 0, 0x21, 0x12, 0xA4, 0x42, 1, 2, 3, 4, 5, 6, 7, 8, 9, 10, 11, 12};
-    auto attribute = [&m](uint16_t type, const Bytes& value) {
-        const size_t at = m.size();
-        m.resize(at + 4 + ((value.size() + 3) & ~size_t{3}), 0);
-        Put16(m, at, type);
-        Put16(m, at + 2, static_cast<uint16_t>(value.size()));
-        std::copy(value.begin(), value.end(), m.begin() + static_cast<long>(at) + 4);
-        Put16(m, 2, static_cast<uint16_t>(m.size() - 20));
-    };
-    attribute(0x0006, Bytes(username.begin(), username.end()));
-    attribute(0x0025, {});
-    Put16(m, 2, static_cast<uint16_t>(m.size() - 20 + 24));
-    uint8_t mac[20];
-    unsigned mac_len = 0;
-    HMAC(EVP_sha1(), password.data(), static_cast<int>(password.size()), m.data(), m.size(), mac,
-         &mac_len);
-    attribute(0x0008, Bytes(mac, mac + 20));
-    Put16(m, 2, static_cast<uint16_t>(m.size() - 20 + 8));
-    const uint32_t crc =
-        static_cast<uint32_t>(crc32(0, m.data(), static_cast<uInt>(m.size()))) ^ 0x5354554e;
-    attribute(0x8028, {static_cast<uint8_t>(crc >> 24), static_cast<uint8_t>(crc >> 16),
-                       static_cast<uint8_t>(crc >> 8), static_cast<uint8_t>(crc)});
-    return m;
 }
 
 class Viewer {
