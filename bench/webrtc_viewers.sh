@@ -45,7 +45,7 @@ frames() { tr '\r' '\n' <"$work/ffmpeg.log" | grep -o 'frame= *[0-9]*' | tail -1
   --stall "0:$stall_from:$stall_len" >"$work/viewers.log" 2>&1 &
 tool=$!
 pids+=($tool)
-while ! grep -q counting_in_ms "$work/viewers.log" && kill -0 "$tool" 2>/dev/null; do
+while ! grep -qs counting_in_ms "$work/viewers.log" && kill -0 "$tool" 2>/dev/null; do
   sleep 0.05
 done
 sleep 0.5
