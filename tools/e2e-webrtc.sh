@@ -3,7 +3,8 @@
 # properties, a password) at 90% of the picture rate with Opus sound and no error, by itself
 # and when asked to; a wrong password plays nothing; malformed offers are answered 400 at once;
 # 200 offer/DELETE cycles leave descriptors, threads and memory as they were; the
-# glass-to-glass delay over WebRTC and over MSE is printed.
+# glass-to-glass delay over WebRTC and over MSE is printed; 16 viewers at once keep the rate,
+# one of them deaf for a while.
 #   tools/e2e-webrtc.sh [BUILD_DIR]      (as root: it makes a network namespace of its own)
 set -euo pipefail
 [[ -n ${ORVEX_E2E_TRACE:-} ]] && set -x
@@ -99,6 +100,30 @@ for transport in webrtc mse; do
   echo "$name: glass-to-glass in chromium over $transport, 15 s: $line"
 done
 
+kill -TERM "$pid"
+timeout 10 tail -s 0.1 --pid="$pid" -f /dev/null || fail "orvex still running 10 s after SIGTERM"
+pid=
+
+# Sixteen viewers at once (bench/webrtc_viewers.cpp; no password: the shipped properties
+# alone), viewer 0 deaf for 4 s from second 3 as if its Wi-Fi went: every other viewer keeps
+# 27 fps, and the deaf one is back at 25 fps or more over its last 3 s.
+start env HOME="$work" ORVEX_PROP_FILE="$top/platform/host/orvex.prop" "$build/orvex"
+for _ in $(seq 50); do (exec 3<>/dev/tcp/127.0.0.1/8080) 2>/dev/null && break; sleep 0.1; done
+timeout -k 5 25 ffmpeg -hide_banner -nostdin -rtsp_transport udp -t 20 -i \
+  "rtsp://127.0.0.1/skyvo.0?$query&cameraid=hd0&win=main&sub=0&dumpvideo=0&dumpaudio=0&specialcase=none" \
+  -f null - >"$work/rtsp.log" 2>&1 &
+rtsp=$!
+sleep 2
+"$build/bench/webrtc_viewers" 127.0.0.1 8080 16 10 --stall 0:3:4 >"$work/viewers.log" 2>&1 ||
+  fail "16 WebRTC viewers: $(tail -3 "$work/viewers.log")"
+kill "$rtsp" 2>/dev/null || true
+summary=$(grep '^viewers=' "$work/viewers.log")
+stalled=$(grep '^viewer=0 ' "$work/viewers.log")
+min_fps=$(sed -n 's/.* min_fps=\([0-9.]*\).*/\1/p' <<<"$summary")
+last3=$(sed -n 's/.* last3_fps=\([0-9.]*\).*/\1/p' <<<"$stalled")
+awk -v m="$min_fps" -v l="$last3" 'BEGIN { exit !(m >= 27 && l >= 25) }' ||
+  fail "16 WebRTC viewers, one stalled: $summary; the stalled one: $stalled"
+ok "16 WebRTC viewers, viewer 0 deaf 4 s: $summary; viewer 0 ${stalled#viewer=0 }; load$(uptime | sed 's/.*load//')"
 kill -TERM "$pid"
 timeout 10 tail -s 0.1 --pid="$pid" -f /dev/null || fail "orvex still running 10 s after SIGTERM"
 pid=
