@@ -4,7 +4,8 @@
 //   webrtc_viewers HOST HTTP_PORT N SECONDS [--stall K:FROM:LEN]
 // --stall: viewer K reads and sends nothing from second FROM for LEN seconds (its socket's
 // buffer fills and the kernel drops the rest, as for a viewer whose Wi-Fi vanished), then
-// goes on. One thread polls every socket.
+// goes on. One thread polls every socket. Per viewer: lost counts the video packets missing
+// from the sequence when a later one came, resent those of them that came after all.
 #include <arpa/inet.h>
 #include <netinet/in.h>
 #include <poll.h>

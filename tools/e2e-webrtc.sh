@@ -107,6 +107,7 @@ pid=
 # Sixteen viewers at once (bench/webrtc_viewers.cpp; no password: the shipped properties
 # alone), viewer 0 deaf for 4 s from second 3 as if its Wi-Fi went: every other viewer keeps
 # 27 fps, and the deaf one is back at 25 fps or more over its last 3 s.
+began=$SECONDS
 start env HOME="$work" ORVEX_PROP_FILE="$top/platform/host/orvex.prop" "$build/orvex"
 for _ in $(seq 50); do (exec 3<>/dev/tcp/127.0.0.1/8080) 2>/dev/null && break; sleep 0.1; done
 timeout -k 5 25 ffmpeg -hide_banner -nostdin -rtsp_transport udp -t 20 -i \
@@ -123,7 +124,8 @@ min_fps=$(sed -n 's/.* min_fps=\([0-9.]*\).*/\1/p' <<<"$summary")
 last3=$(sed -n 's/.* last3_fps=\([0-9.]*\).*/\1/p' <<<"$stalled")
 awk -v m="$min_fps" -v l="$last3" 'BEGIN { exit !(m >= 27 && l >= 25) }' ||
   fail "16 WebRTC viewers, one stalled: $summary; the stalled one: $stalled"
-ok "16 WebRTC viewers, viewer 0 deaf 4 s: $summary; viewer 0 ${stalled#viewer=0 }; load$(uptime | sed 's/.*load//')"
+ok "16 WebRTC viewers, viewer 0 deaf 4 s: $summary; viewer 0 ${stalled#viewer=0 };" \
+  "$((SECONDS - began)) s; load$(uptime | sed 's/.*load//')"
 kill -TERM "$pid"
 timeout 10 tail -s 0.1 --pid="$pid" -f /dev/null || fail "orvex still running 10 s after SIGTERM"
 pid=
