@@ -177,7 +177,6 @@ struct WebViewerCalls {
                              const char* method, const char*, const char* upload_data,
                              size_t* upload_size, void** context) {
         auto* self = static_cast<WebViewer*>(cls);
-        self->m_warden.Answering(connection);
         auto* request = static_cast<Request*>(*context);
         if (*upload_size != 0) {  // kept for a POST (an offer), else read and dropped
             if (request != nullptr && request->headers_seen) {
@@ -195,6 +194,9 @@ struct WebViewerCalls {
             request->headers_seen = true;
             return MHD_YES;
         }
+        // Only now is the request whole: a body still coming is under the warden's deadline
+        // as its head was, since the gate sees a POST only once its body is in.
+        self->m_warden.Answering(connection);
         const std::string uri = request != nullptr && !request->uri.empty() ? request->uri : url;
         return Answer(self, connection, uri, method, request);
     }
