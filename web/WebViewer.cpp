@@ -7,6 +7,7 @@
 #include <netinet/in.h>
 #include <stdarg.h>
 #include <string.h>
+#include <strings.h>
 
 #include <sys/socket.h>
 
@@ -85,6 +86,19 @@ std::string RefusedSize(const std::string& query) {
     return "The capture does not take " + std::to_string(width) + "x" + std::to_string(height) +
            "; accepted sizes (width= and height= in the address): " + AcceptedSizesText(board) +
            ".\n";
+}
+
+// How many Host lines a request has; RFC 9112 §3.2 wants one in every HTTP/1.1 request.
+int HostLines(MHD_Connection* connection) {
+    int count = 0;
+    MHD_get_connection_values(
+        connection, MHD_HEADER_KIND,
+        [](void* cls, MHD_ValueKind, const char* key, const char*) -> MHD_Result {
+            if (strcasecmp(key, MHD_HTTP_HEADER_HOST) == 0) ++*static_cast<int*>(cls);
+            return MHD_YES;
+        },
+        &count);
+    return count;
 }
 
 // What a request carries between libmicrohttpd's callbacks: its target as the client sent it
@@ -174,7 +188,7 @@ struct WebViewerCalls {
     }
 
     static MHD_Result Handle(void* cls, MHD_Connection* connection, const char* url,
-                             const char* method, const char*, const char* upload_data,
+                             const char* method, const char* version, const char* upload_data,
                              size_t* upload_size, void** context) {
         auto* self = static_cast<WebViewer*>(cls);
         auto* request = static_cast<Request*>(*context);
@@ -197,6 +211,9 @@ struct WebViewerCalls {
         // Only now is the request whole: a body still coming is under the warden's deadline
         // as its head was, since the gate sees a POST only once its body is in.
         self->m_warden.Answering(connection);
+        if (strcmp(version, MHD_HTTP_VERSION_1_1) == 0 && HostLines(connection) != 1)
+            return Reply(connection, 400, "An HTTP/1.1 request names its Host once.\n", nullptr,
+                         nullptr, true);
         const std::string uri = request != nullptr && !request->uri.empty() ? request->uri : url;
         return Answer(self, connection, uri, method, request);
     }

@@ -520,6 +520,11 @@ TEST_F(WebViewerTest, AnswersByPathAndMethod) {
          "address): 640x480, 720x576, 320x240, 480x320, 1280x720, 720x480, 720x400, 320x176, "
          "640x368, 1920x1080.\n"},
         {"GARBAGE\r\n\r\n", nullptr, nullptr},  // 400, or just the connection closed
+        // RFC 9112 §3.2: an HTTP/1.1 request names one host, before anything else is judged.
+        {"GET / HTTP/1.1\r\n\r\n", "HTTP/1.1 400", "text/plain; charset=utf-8", "Host"},
+        {"GET / HTTP/1.1\r\nHost: t\r\nhost: u\r\n\r\n", "HTTP/1.1 400",
+         "text/plain; charset=utf-8", "Host"},
+        {"GET / HTTP/1.0\r\n\r\n", "HTTP/1.1 200", "text/html; charset=utf-8"},
     };
     for (const Case& c : cases) {
         SCOPED_TRACE(c.request);
