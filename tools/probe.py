@@ -409,9 +409,7 @@ def stale_no_lockout(p, proto, src):
     return FAILED, "after 12 stale answers the right password gets %s" % reply
 
 
-def kept_nonce(p, proto, src):
-    if proto == "rtsp":
-        return HELD, "(kept over HTTP only)"
+def kept_nonce(p):
     if not p.kept:
         return WEAK, "not run: no --kept answer from before a restart"
     kept = json.load(open(p.kept))
@@ -973,7 +971,7 @@ CASES = [
     ("digest: a nonce the service never made", both(made_up_nonce)),
     ("digest: a forged nonce of our shape is stale=TRUE", both(forged_nonce)),
     ("digest: stale answers do not lock out", both(stale_no_lockout)),
-    ("digest: a nonce from before a restart", both(kept_nonce)),
+    ("digest: an HTTP nonce from before a restart", kept_nonce),
     ("digest: user names with odd bytes", both(odd_user)),
     ("digest: a password right for another user", both(other_users_password)),
     ("lockout: wrong RTSP answers lock out HTTP", lockout_across("rtsp", "http")),
