@@ -116,7 +116,7 @@ struct Peer {
     bool has_remote = false;
     bool playing = false;  // DTLS done: media flows
     bool need_key = true;  // nothing is sent before a key picture
-    uint64_t created_ms = 0, last_check_ms = 0, last_report_ms = 0, next_timer_ms = 0;
+    uint64_t created_ms = 0, last_check_ms = 0, last_report_ms = 0;
     uint32_t video_ssrc = 0, audio_ssrc = 0;
     uint16_t video_seq = 0, audio_seq = 0;
     uint32_t video_packets = 0, video_octets = 0, audio_packets = 0, audio_octets = 0;
@@ -188,8 +188,9 @@ bool WebRtcServer::Start() {
 void WebRtcServer::Stop() {
     if (m_socket < 0) return;
     m_stopping.store(true);
-    if (write(m_wake[1], "x", 1) < 0) {
-    }
+    // Should the pipe be full, the thread sees the flag at its next 100 ms wait anyway.
+    const ssize_t woke = write(m_wake[1], "x", 1);
+    (void)woke;
     if (m_thread.joinable()) m_thread.join();
     if (m_tapped) RemoveFrameSink(this);
     m_tapped = false;
@@ -433,7 +434,9 @@ void WebRtcServer::OnAudioPcm(const int16_t* samples, size_t frames, uint32_t ti
 void WebRtcServer::SendAudio(const uint8_t* payload, size_t len, uint32_t timestamp) {
     for (auto& peer : m_peers) {
         if (peer == nullptr || !peer->playing || peer->audio_pt < 0) continue;
-        WriteRtpHeaderWithExtensions(m_packet, true, static_cast<uint8_t>(peer->audio_pt),
+        // No marker: Opus is sent without silence suppression, so no talkspurt ever begins
+        // (RFC 3551 §4.1).
+        WriteRtpHeaderWithExtensions(m_packet, false, static_cast<uint8_t>(peer->audio_pt),
                                      peer->audio_seq++, timestamp, peer->audio_ssrc, -1, -1, "");
         memcpy(m_packet + 12, payload, len);
         peer->audio_packets++;
@@ -466,7 +469,13 @@ void WebRtcServer::Run() {
                 Peer* peer = m_peers[i].get();
                 if (peer == nullptr) continue;
                 const char* why = nullptr;
-                if (peer->dtls->state() == DtlsSrtpSession::State::kFailed) {
+                const bool failed = peer->dtls->state() == DtlsSrtpSession::State::kFailed;
+                // A browser that closes its connection says so (close_notify): not a fault.
+                const bool closed =
+                    failed && peer->dtls->why().find("close_notify") != std::string::npos;
+                if (closed) {
+                    why = "the viewer closed it";
+                } else if (failed) {
                     why = "DTLS failed";
                 } else if (!peer->playing &&
                            now - peer->created_ms >
@@ -479,7 +488,7 @@ void WebRtcServer::Run() {
                     why = "no consent check for 30 s (the viewer is gone)";
                 }
                 if (why != nullptr) {
-                    if (peer->dtls->state() == DtlsSrtpSession::State::kFailed) {
+                    if (failed && !closed) {
                         OrvexLogPriority(platform::kLogWarn, kTag, "WebRTC session %s: %s",
                                          peer->id.c_str(), peer->dtls->why().c_str());
                     }
