@@ -95,9 +95,9 @@ read -r status _ < <(whep DELETE "$session")
 
 # Printed, not judged here: figures of speed (bench/README.md has three runs of 30 s).
 for transport in webrtc mse; do
-  line=$(python3 "$top/tools/web_check.py" latency "$page&transport=$transport" 15 2>&1) ||
+  line=$(python3 "$top/tools/web_check.py" latency "$page&transport=$transport" 10 2>&1) ||
     fail "latency over $transport: $line"
-  echo "$name: glass-to-glass in chromium over $transport, 15 s: $line"
+  echo "$name: glass-to-glass in chromium over $transport, 10 s: $line"
 done
 
 kill -TERM "$pid"
