@@ -7,7 +7,6 @@
 # one of them deaf for a while.
 #   tools/e2e-webrtc.sh [BUILD_DIR]      (as root: it makes a network namespace of its own)
 set -euo pipefail
-[[ -n ${ORVEX_E2E_TRACE:-} ]] && set -x
 top=$(cd "$(dirname "$0")/.." && pwd)
 build=$(cd "${1:-$top/build}" && pwd)
 name=e2e-webrtc

@@ -113,11 +113,6 @@ struct Request {
 // An SDP offer is a few kilobytes; anything much larger is not one.
 constexpr size_t kMaxOfferBytes = 64 * 1024;
 
-std::string LocalAddressText(const sockaddr_storage& local) {
-    if (local.ss_family != AF_INET) return "?";
-    return AddressText(reinterpret_cast<const sockaddr*>(&local));
-}
-
 }  // namespace
 
 // One streaming response: a reader of the ring and the capture hold it took.
@@ -362,7 +357,8 @@ struct WebViewerCalls {
         MHD_Result result = MHD_queue_response(connection, 201, response);
         MHD_destroy_response(response);
         OrvexLog(kTag, "web viewer %s watching by WebRTC (%d of %d) from %s\n", peer.c_str(),
-                 self->m_viewers->load(), max, LocalAddressText(local).c_str());
+                 self->m_viewers->load(), max,
+                 AddressText(reinterpret_cast<const sockaddr*>(&local)).c_str());
         return result;
     }
 

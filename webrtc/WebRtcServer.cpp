@@ -15,6 +15,7 @@
 #include "base/Clocks.h"
 #include "base/OrvexLog.h"
 #include "codec/H264Packetiser.h"
+#include "net/Socket.h"
 #include "platform/LogPort.h"
 #include "platform/Ports.h"
 #include "platform/PropertyPort.h"
@@ -58,39 +59,13 @@ std::string RandomText(size_t n) {
     return text;
 }
 
-std::string AddressText(const sockaddr_storage& addr) {
-    char ip[INET6_ADDRSTRLEN] = "?";
-    uint16_t port = 0;
-    if (addr.ss_family == AF_INET) {
-        const auto* in = reinterpret_cast<const sockaddr_in*>(&addr);
-        inet_ntop(AF_INET, &in->sin_addr, ip, sizeof ip);
-        port = ntohs(in->sin_port);
-    } else if (addr.ss_family == AF_INET6) {
-        const auto* in = reinterpret_cast<const sockaddr_in6*>(&addr);
-        inet_ntop(AF_INET6, &in->sin6_addr, ip, sizeof ip);
-        port = ntohs(in->sin6_port);
-    }
-    return std::string(ip) + ":" + std::to_string(port);
+// The one socket is IPv4: every address it sees is a sockaddr_in.
+std::string AddressText(const sockaddr_in& addr) {
+    return DottedAddress(addr) + ":" + std::to_string(ntohs(addr.sin_port));
 }
 
-socklen_t LengthOf(const sockaddr_storage& addr) {
-    return addr.ss_family == AF_INET6 ? sizeof(sockaddr_in6) : sizeof(sockaddr_in);
-}
-
-bool SameAddress(const sockaddr_storage& a, const sockaddr_storage& b) {
-    if (a.ss_family != b.ss_family) return false;
-    if (a.ss_family == AF_INET) {
-        const auto* x = reinterpret_cast<const sockaddr_in*>(&a);
-        const auto* y = reinterpret_cast<const sockaddr_in*>(&b);
-        return x->sin_port == y->sin_port && x->sin_addr.s_addr == y->sin_addr.s_addr;
-    }
-    if (a.ss_family == AF_INET6) {
-        const auto* x = reinterpret_cast<const sockaddr_in6*>(&a);
-        const auto* y = reinterpret_cast<const sockaddr_in6*>(&b);
-        return x->sin6_port == y->sin6_port &&
-               memcmp(&x->sin6_addr, &y->sin6_addr, sizeof x->sin6_addr) == 0;
-    }
-    return false;
+bool SameAddress(const sockaddr_in& a, const sockaddr_in& b) {
+    return a.sin_port == b.sin_port && a.sin_addr.s_addr == b.sin_addr.s_addr;
 }
 
 // NTP time (RFC 3550 §4): seconds since 1900 in the high word, the fraction in the low.
@@ -112,7 +87,7 @@ struct Peer {
     WebRtcOffer offer;
     int video_pt = -1, audio_pt = -1, playout_id = -1;
     std::unique_ptr<DtlsSrtpSession> dtls;
-    sockaddr_storage remote{};
+    sockaddr_in remote{};
     bool has_remote = false;
     bool playing = false;  // DTLS done: media flows
     bool need_key = true;  // nothing is sent before a key picture
@@ -260,12 +235,9 @@ WhepEndpoint::Reply WebRtcServer::Offer(OfferRequest request) {
     params.ice_ufrag = peer->ufrag;
     params.ice_pwd = peer->pwd;
     params.fingerprint_sha256 = certificate->Sha256Fingerprint();
-    char ip[INET_ADDRSTRLEN] = "127.0.0.1";
-    if (request.local != nullptr && request.local->sa_family == AF_INET) {
-        inet_ntop(AF_INET, &reinterpret_cast<const sockaddr_in*>(request.local)->sin_addr, ip,
-                  sizeof ip);
-    }
-    params.address = ip;
+    params.address = request.local != nullptr && request.local->sa_family == AF_INET
+                         ? DottedAddress(*reinterpret_cast<const sockaddr_in*>(request.local))
+                         : "127.0.0.1";
     params.port = m_options.port;
     params.video_ssrc = peer->video_ssrc;
     params.audio_ssrc = peer->audio_ssrc;
@@ -456,7 +428,7 @@ void WebRtcServer::Run() {
             thread_mutex::Scoped hold(m_lock);
             const uint64_t now = NowMs();
             for (int i = 0; i < 64; ++i) {  // a bounded batch, then the timers
-                sockaddr_storage from{};
+                sockaddr_in from{};
                 socklen_t from_len = sizeof from;
                 const ssize_t n = recvfrom(m_socket, buffer, sizeof buffer, 0,
                                            reinterpret_cast<sockaddr*>(&from), &from_len);
@@ -546,12 +518,11 @@ void WebRtcServer::SendReports(Peer& peer) {
     }
 }
 
-ssize_t WebRtcServer::SendDatagram(const sockaddr_storage& to, const uint8_t* p, size_t n) {
-    return sendto(m_socket, p, n, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&to),
-                  LengthOf(to));
+ssize_t WebRtcServer::SendDatagram(const sockaddr_in& to, const uint8_t* p, size_t n) {
+    return sendto(m_socket, p, n, MSG_NOSIGNAL, reinterpret_cast<const sockaddr*>(&to), sizeof to);
 }
 
-Peer* WebRtcServer::ByAddress(const sockaddr_storage& from) {
+Peer* WebRtcServer::ByAddress(const sockaddr_in& from) {
     for (auto& peer : m_peers) {
         if (peer != nullptr && peer->has_remote && SameAddress(peer->remote, from))
             return peer.get();
@@ -559,8 +530,7 @@ Peer* WebRtcServer::ByAddress(const sockaddr_storage& from) {
     return nullptr;
 }
 
-void WebRtcServer::OnDatagram(uint8_t* data, size_t len, const sockaddr_storage& from,
-                              uint64_t now) {
+void WebRtcServer::OnDatagram(uint8_t* data, size_t len, const sockaddr_in& from, uint64_t now) {
     if (len == 0) return;
     // RFC 7983 §7: the first byte tells STUN (0-3), DTLS (20-63) and RTP/RTCP (128-191) apart.
     if (LooksLikeStun(data, len)) {
@@ -587,8 +557,7 @@ void WebRtcServer::OnDatagram(uint8_t* data, size_t len, const sockaddr_storage&
     if (LooksLikeRtcp(data, len) && peer->playing) OnRtcp(*peer, data, len);
 }
 
-void WebRtcServer::OnStun(const uint8_t* data, size_t len, const sockaddr_storage& from,
-                          uint64_t now) {
+void WebRtcServer::OnStun(const uint8_t* data, size_t len, const sockaddr_in& from, uint64_t now) {
     StunBindingRequest request{};
     if (ReadStunBindingRequest(data, len, &request) != StunRead::kOk) return;
     const std::string_view ufrag = LocalUfragOf(request.username);

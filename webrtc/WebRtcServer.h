@@ -75,18 +75,18 @@ private:
     void SendAudio(const uint8_t* payload, size_t len, uint32_t timestamp) ORVEX_REQUIRES(m_lock);
     void SendProtected(Peer& peer, uint8_t* packet, size_t len, bool video) ORVEX_REQUIRES(m_lock);
     void Run();
-    void OnDatagram(uint8_t* data, size_t len, const sockaddr_storage& from, uint64_t now)
+    void OnDatagram(uint8_t* data, size_t len, const sockaddr_in& from, uint64_t now)
         ORVEX_REQUIRES(m_lock);
-    void OnStun(const uint8_t* data, size_t len, const sockaddr_storage& from, uint64_t now)
+    void OnStun(const uint8_t* data, size_t len, const sockaddr_in& from, uint64_t now)
         ORVEX_REQUIRES(m_lock);
     void OnRtcp(Peer& peer, uint8_t* data, size_t len) ORVEX_REQUIRES(m_lock);
     int Housekeeping(uint64_t now) ORVEX_REQUIRES(m_lock);
     void SendReports(Peer& peer) ORVEX_REQUIRES(m_lock);
     std::shared_ptr<Peer> Remove(int slot, const char* why) ORVEX_REQUIRES(m_lock);
     void Finish(const std::shared_ptr<Peer>& peer);
-    Peer* ByAddress(const sockaddr_storage& from) ORVEX_REQUIRES(m_lock);
+    Peer* ByAddress(const sockaddr_in& from) ORVEX_REQUIRES(m_lock);
     const DtlsCertificate* Certificate();  // loaded or made at the first offer; null: none
-    ssize_t SendDatagram(const sockaddr_storage& to, const uint8_t* p, size_t n);
+    ssize_t SendDatagram(const sockaddr_in& to, const uint8_t* p, size_t n);
 
     stream::CaptureDemand* m_demand;
     Options m_options;
