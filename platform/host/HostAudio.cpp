@@ -4,6 +4,7 @@
 #include <time.h>
 
 #include <algorithm>
+#include <array>
 #include <cmath>
 #include <cstring>
 #include <memory>
@@ -153,16 +154,28 @@ private:
 }  // namespace
 
 void FillTone(int16_t* out, size_t frames, uint64_t first, uint64_t start_ms) {
-    for (size_t i = 0; i < frames; ++i) {
-        uint64_t n = first + i;
-        uint64_t ms = start_ms + n * 1000 / kRate;
-        int16_t v = 0;
-        if (InFlash(ms)) {
-            double phase = 2.0 * M_PI * kToneHz * static_cast<double>(n % kRate) / kRate;
-            v = static_cast<int16_t>(std::lround(kAmplitude * std::sin(phase)));
+    // At 1 kHz one period of the tone is one millisecond: 48 samples, worked out once. Sample
+    // n is then period[n % 48], heard while its millisecond (n / 48) is in a flash.
+    static_assert(kRate % 1000 == 0 && kToneHz == 1000.0, "one period a millisecond");
+    constexpr size_t kPeriod = kRate / 1000;
+    static const std::array<int16_t, kPeriod> period = [] {
+        std::array<int16_t, kPeriod> p{};
+        for (size_t k = 0; k < kPeriod; ++k) {
+            double phase = 2.0 * M_PI * kToneHz * static_cast<double>(k) / kRate;
+            p[k] = static_cast<int16_t>(std::lround(kAmplitude * std::sin(phase)));
         }
-        out[2 * i] = v;
-        out[2 * i + 1] = v;
+        return p;
+    }();
+    for (size_t i = 0; i < frames;) {
+        const uint64_t n = first + i;
+        const size_t phase = static_cast<size_t>(n % kPeriod);
+        const size_t run = std::min(kPeriod - phase, frames - i);
+        const bool on = InFlash(start_ms + n / kPeriod);
+        for (size_t k = 0; k < run; ++k, ++i) {
+            const int16_t v = on ? period[phase + k] : 0;
+            out[2 * i] = v;
+            out[2 * i + 1] = v;
+        }
     }
 }
 
