@@ -66,6 +66,7 @@ kelvo.build.kelvotv=sa
 ro.board.platform=android
 kv.orvex.audiopt=97
 kv.orvex.wake=${ORVEX_WAKE:-event}
+kv.orvex.aacenc=${ORVEX_AACENC:-inline}
 orvex.host.log=file:$work/orvex.log
 orvex.host.video=none
 orvex.host.audio=tone

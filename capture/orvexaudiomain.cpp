@@ -2,8 +2,6 @@
 
 #include <pthread.h>
 #include <unistd.h>
-#include <functional>
-
 #include <memory>
 #include <vector>
 
@@ -61,6 +59,95 @@ DumpFile g_aac_dump(kTag, "/data/app/orvextestaudio.aac", "/mnt/usb/sda1/orvexte
                      "Remove /data/app/orvextestaudio.aac failed. \n",
                      "/n open /data/app/orvextestaudio.aac failed/n"},
                     &kAlwaysSay);
+
+// The platform's loadable AAC encoder, set up for 48 kHz stereo at 128 kbit/s with ADTS
+// headers; the frames of each 20 ms block it takes go to the server's audio input. It runs in
+// the encoder thread, or in the PCM thread when that encodes as it reads.
+class AacBlockEncoder {
+public:
+    AacBlockEncoder() = default;
+    AacBlockEncoder(const AacBlockEncoder&) = delete;
+    AacBlockEncoder& operator=(const AacBlockEncoder&) = delete;
+    ~AacBlockEncoder() { Close(); }
+
+    // Loads and starts the encoder; false after the line that says what failed (the library
+    // is closed again before it).
+    bool Open() {
+        library_ = &platform::AacLibrary();
+        handle_ = library_->open();
+        if (handle_ == nullptr) {
+            OrvexPrint("open dll error......");
+            return false;
+        }
+        auto get_api =
+            reinterpret_cast<VoGetAacEncApi>(library_->symbol(handle_, "voGetAACEncAPI"));
+        if (get_api == nullptr) return Fail("open function error......");
+        if (get_api(&api_) != 0) return Fail("pGetAPI function return error");
+        if (static_cast<int32_t>(api_.Init(&codec_, kVoAudioCodingAac, &user_)) < 0) {
+            codec_ = nullptr;
+            return Fail("#### VOI_Error2:fail to initialize the Encoderr###");
+        }
+        api_.SetParam(codec_, kVoPidAacEncParam, &params_);
+        return true;
+    }
+
+    // One block of kPcmBlockBytes. False once the encoder has said its output buffer is too
+    // small: it has ended and takes no more.
+    bool Encode(unsigned char* input) {
+        TapAudioPcm(input, kPcmBlockBytes, GetTimeStampMillsec());
+        VO_CODECBUFFER in{input, kPcmBlockBytes, 0};
+        api_.SetInputData(codec_, &in);
+        for (int unknown = 0; unknown < kUnknownResultsMax;) {
+            VO_CODECBUFFER out{output_.data(), kPcmBlockBytes, 0};
+            VO_AUDIO_OUTPUTINFO info{};
+            VO_U32 r = api_.GetOutputData(codec_, &out, &info);
+            if (r == kVoErrNone) {
+                if (get_write_aac_file()) Test_write_audio_aac(output_.data(), out.Length);
+                // 0 lets the ring stamp the frame at write time, as on the television.
+                skyvo_add_mp3_data(output_.data(), static_cast<unsigned>(out.Length),
+                                   by_samples_ ? clock_.Next(GetTimeStampMillsec()) : 0);
+            } else if (r == kVoErrInputBufferSmall) {
+                return true;
+            } else if (r == kVoErrOutputBufferSmall) {
+                return false;
+            } else if (++unknown == kUnknownResultsMax) {
+                OrvexLog(kTag,
+                         "encoder gave %d unknown results for one block (last 0x%lx): "
+                         "block skipped",
+                         kUnknownResultsMax, static_cast<unsigned long>(r));
+            }
+        }
+        return true;
+    }
+
+    // Ends the encoder, then closes its library; nothing when it is not open.
+    void Close() {
+        if (codec_ != nullptr) api_.Uninit(codec_);
+        codec_ = nullptr;
+        if (handle_ != nullptr) library_->close(handle_);
+        handle_ = nullptr;
+    }
+
+private:
+    bool Fail(const char* line) {
+        Close();
+        OrvexPrint("%s", line);
+        return false;
+    }
+
+    VO_MEM_OPERATOR memory_{cmnMemAlloc, cmnMemFree, cmnMemSet, cmnMemCopy,
+                            cmnMemCheck, nullptr,    nullptr};
+    VO_CODEC_INIT_USERDATA user_{kVoImfUserMemOperator, &memory_, 0, 0};
+    AACENC_PARAM params_{48000, 128000, 2, 1};  // ADTS headers on
+    platform::AacLibraryPort* library_ = nullptr;
+    void* handle_ = nullptr;
+    VO_AUDIO_CODECAPI api_{};
+    VO_HANDLE codec_ = nullptr;
+    // Its own buffer, taken once per start: a second start's encoder never shares it.
+    std::vector<unsigned char> output_ = std::vector<unsigned char>(kPcmBlockBytes);
+    const bool by_samples_ = Global_Config::instance()->audio_clock_samples();
+    AudioSampleClock clock_{48000, kAacFrameSamples};
+};
 
 void* PcmThread(void* flag) {
     NameThisThread("orvex-pcm");
@@ -164,7 +251,17 @@ int audio_output_pcm(std::atomic<int>* run_flag) {
         OrvexPrint("\n audiorecord start error !");
         return 1;
     }
+    // Encoding here, as each read arrives, spares the encoder thread's wake-up per block; the
+    // ring still cuts reads of any size into whole blocks.
+    const bool inline_encoder = Global_Config::instance()->aac_inline();
+    std::unique_ptr<AacBlockEncoder> encoder;
+    if (inline_encoder) {
+        OrvexLog(kTag, "audio_aac_enc");
+        encoder = std::make_unique<AacBlockEncoder>();
+        if (!encoder->Open()) encoder.reset();
+    }
     std::vector<unsigned char> buffer(static_cast<size_t>(size));
+    std::vector<unsigned char> block(encoder ? kPcmBlockBytes : 0);
     while (run_flag->load(std::memory_order_relaxed) != 0) {
         long n = record.readaudiodata(buffer.data(), buffer.size());
         if (n < 1) {
@@ -173,8 +270,14 @@ int audio_output_pcm(std::atomic<int>* run_flag) {
             continue;
         }
         if (get_write_pcm_file()) Test_write_audio_pcm(buffer.data(), static_cast<size_t>(n));
+        // An inline encoder that failed or ended takes nothing: the ring is not filled for no one.
+        if (inline_encoder && !encoder) continue;
         add_audio_pcm_data(buffer.data(), static_cast<int>(n));
+        while (encoder && g_pcm_ring.read(block.data(), kPcmBlockBytes) > 0) {
+            if (!encoder->Encode(block.data())) encoder.reset();
+        }
     }
+    encoder.reset();
     record.stop();
     Global_Config::instance()->set_sub_stat(false);
     return 0;
@@ -186,82 +289,23 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
         OrvexPrint("\n Stsrt param error !");  // the spelling operators know
         return 1;
     }
-    VO_MEM_OPERATOR memory{cmnMemAlloc, cmnMemFree, cmnMemSet, cmnMemCopy,
-                           cmnMemCheck, nullptr,    nullptr};
-    VO_CODEC_INIT_USERDATA user{kVoImfUserMemOperator, &memory, 0, 0};
-    AACENC_PARAM params{48000, 128000, 2, 1};  // ADTS headers on
-
-    platform::AacLibraryPort& library = platform::AacLibrary();
-    // Closed on every way out, before the closing trace.
-    std::unique_ptr<void, std::function<void(void*)>> handle(
-        library.open(), [&library](void* h) { library.close(h); });
-    if (handle == nullptr) {
-        OrvexPrint("open dll error......");
-        return -1;
-    }
-    auto get_api = reinterpret_cast<VoGetAacEncApi>(library.symbol(handle.get(), "voGetAACEncAPI"));
-    if (get_api == nullptr) {
-        handle.reset();
-        OrvexPrint("open function error......");
-        return -1;
-    }
-    VO_AUDIO_CODECAPI api{};
-    if (get_api(&api) != 0) {
-        handle.reset();
-        OrvexPrint("pGetAPI function return error");
-        return -1;
-    }
-    VO_HANDLE codec = nullptr;
-    if (static_cast<int32_t>(api.Init(&codec, kVoAudioCodingAac, &user)) < 0) {
-        handle.reset();
-        OrvexPrint("#### VOI_Error2:fail to initialize the Encoderr###");
-        return -1;
-    }
-    api.SetParam(codec, kVoPidAacEncParam, &params);
-
-    // This thread's own blocks, taken once per start: a second start stops the first thread,
+    AacBlockEncoder encoder;
+    if (!encoder.Open()) return -1;
+    // This thread's own block, taken once per start: a second start stops the first thread,
     // but buffers of its own keep the two from ever sharing one.
-    std::vector<unsigned char> input_block(kPcmBlockBytes), output_block(kPcmBlockBytes);
+    std::vector<unsigned char> input_block(kPcmBlockBytes);
     unsigned char* const input = input_block.data();
-    unsigned char* const output = output_block.data();
     const bool wake_on_write = Global_Config::instance()->wake_on_write();
-    const bool by_samples = Global_Config::instance()->audio_clock_samples();
-    AudioSampleClock clock(static_cast<unsigned>(params.sampleRate), kAacFrameSamples);
-    bool ended = false;
-    while (!ended && run_flag->load(std::memory_order_relaxed) != 0) {
+    while (run_flag->load(std::memory_order_relaxed) != 0) {
         if (g_pcm_ring.read(input, kPcmBlockBytes) < 1) {
             if (!wake_on_write || !g_pcm_ring.wait_readable(kPcmBlockBytes, kEncoderIdleBoundMs)) {
                 usleep(5000);
             }
             continue;
         }
-        TapAudioPcm(input, kPcmBlockBytes, GetTimeStampMillsec());
-        VO_CODECBUFFER in{input, kPcmBlockBytes, 0};
-        api.SetInputData(codec, &in);
-        for (int unknown = 0; unknown < kUnknownResultsMax;) {
-            VO_CODECBUFFER out{output, kPcmBlockBytes, 0};
-            VO_AUDIO_OUTPUTINFO info{};
-            VO_U32 r = api.GetOutputData(codec, &out, &info);
-            if (r == kVoErrNone) {
-                if (get_write_aac_file()) Test_write_audio_aac(output, out.Length);
-                // 0 lets the ring stamp the frame at write time, as on the television.
-                skyvo_add_mp3_data(output, static_cast<unsigned>(out.Length),
-                                   by_samples ? clock.Next(GetTimeStampMillsec()) : 0);
-            } else if (r == kVoErrInputBufferSmall) {
-                break;
-            } else if (r == kVoErrOutputBufferSmall) {
-                ended = true;
-                break;
-            } else if (++unknown == kUnknownResultsMax) {
-                OrvexLog(kTag,
-                         "encoder gave %d unknown results for one block (last 0x%lx): "
-                         "block skipped",
-                         kUnknownResultsMax, static_cast<unsigned long>(r));
-            }
-        }
+        if (!encoder.Encode(input)) break;
     }
-    api.Uninit(codec);
-    handle.reset();
+    encoder.Close();
     OrvexPrint("\n exit audio_aac_enc ");
     return 0;
 }
@@ -280,7 +324,7 @@ int start_audio_record_enc() {
     g_pcm_ring.reset();
     g_pcm.run = 1;
     g_aac.run = 1;
-    Start(g_aac, AacThread, "AAC encoder");
+    if (!Global_Config::instance()->aac_inline()) Start(g_aac, AacThread, "AAC encoder");
     return Start(g_pcm, PcmThread, "PCM");
 }
 

@@ -7,7 +7,9 @@
 
 // The television's sound: a PCM thread reads the platform's audio record into the PCM ring,
 // an encoder thread encodes 20 ms blocks to AAC (ADTS) with the platform's loadable encoder
-// and hands each frame to the server's audio input.
+// and hands each frame to the server's audio input. With kv.orvex.aacenc=inline the PCM thread
+// encodes each whole block itself (and the server's audio input sends each frame at once), and
+// there is no encoder thread.
 // Thread contract: start_audio_record_enc / stop_audio_record_enc from the capture callbacks'
 // thread; the two workers share only the PCM ring.
 

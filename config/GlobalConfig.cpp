@@ -38,6 +38,7 @@ void Global_Config::Apply(const config::Settings& settings) {
     m_wake_on_write.store(settings.wake_on_write, std::memory_order_relaxed);
     m_report_latency.store(settings.report_latency, std::memory_order_relaxed);
     m_audio_clock_samples.store(settings.audio_clock_samples, std::memory_order_relaxed);
+    m_aac_inline.store(settings.aac_inline, std::memory_order_relaxed);
 }
 
 void Global_Config::read_join_mode() {

@@ -45,7 +45,9 @@ public:
     // type (kv.orvex.audiopt), how idle loops wait (kv.orvex.wake: fixed short sleeps, or a
     // ring's consumer sleeps until a write and the run-flag loops until they are woken), the
     // video sender's latency report (kv.orvex.latency) and how AAC frames are stamped
-    // (kv.orvex.audioclock: at write time, or by the capture time of their first sample).
+    // (kv.orvex.audioclock: at write time, or by the capture time of their first sample), and
+    // where AAC is encoded and sent (kv.orvex.aacenc: threads of their own, or the sound
+    // reader's).
     // Called once, when the server opens; threads read them when they start.
     void Apply(const config::Settings& settings);
     bool wake_on_write() const { return m_wake_on_write.load(std::memory_order_relaxed); }
@@ -58,6 +60,7 @@ public:
     bool audio_clock_samples() const {
         return m_audio_clock_samples.load(std::memory_order_relaxed);
     }
+    bool aac_inline() const { return m_aac_inline.load(std::memory_order_relaxed); }
     // The sleep of the loops that only watch a run flag (the main and binder service loops).
     // Waiting for writes, they are woken instead: SIGTERM interrupts main's sleep, and the
     // service's stop notifies its thread; the second is only a bound.
@@ -103,6 +106,7 @@ private:
     std::atomic<bool> m_join_at_key{false};
     std::atomic<bool> m_report_latency{false};
     std::atomic<bool> m_audio_clock_samples{false};
+    std::atomic<bool> m_aac_inline{false};
     TLock m_timestamp_lock;
     unsigned m_video_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;
     unsigned m_audio_time ORVEX_GUARDED_BY(m_timestamp_lock) = 0;

@@ -20,6 +20,7 @@ namespace config {
 // Indexes of the table, in its order (the keys' alphabetical order).
 enum class Property {
     kFlavour,
+    kAacEncoder,
     kAllow,
     kAudioClock,
     kAudioPayloadType,

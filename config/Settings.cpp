@@ -44,6 +44,7 @@ Settings ReadSettings(platform::PropertyPort& port) {
     s.audio_payload_type = static_cast<int>(Read(port, Property::kAudioPayloadType).number);
     s.wake_on_write = Read(port, Property::kWake).number != 0;
     s.audio_clock_samples = Read(port, Property::kAudioClock).number != 0;
+    s.aac_inline = Read(port, Property::kAacEncoder).number != 0;
     s.report_latency = Read(port, Property::kLatency).number != 0;
     return s;
 }

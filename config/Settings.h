@@ -24,6 +24,7 @@ struct Settings {
     bool wake_on_write = false;        // kv.orvex.wake=event
     bool report_latency = false;       // kv.orvex.latency=1
     bool audio_clock_samples = false;  // kv.orvex.audioclock=samples
+    bool aac_inline = false;           // kv.orvex.aacenc=inline
 };
 
 // Reads every start-time property of the service from `port`, logging each refused value

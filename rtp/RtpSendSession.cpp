@@ -24,6 +24,10 @@ int RtpSendSession::StartSendThread() {
     m_running.store(1, std::memory_order_relaxed);
     m_wake_on_write.store(Global_Config::instance()->wake_on_write(), std::memory_order_relaxed);
     BeforeStart();
+    if (BeginDriven()) {
+        m_thread_started = m_driven = true;
+        return 0;
+    }
     int rc = pthread_create(&m_thread, nullptr, Trampoline, this);
     m_thread_started = rc == 0;
     if (rc != 0) {
@@ -36,6 +40,11 @@ int RtpSendSession::StartSendThread() {
 
 void RtpSendSession::CloseSendThread() {
     m_running.store(0, std::memory_order_relaxed);
+    if (m_driven) {
+        EndDriven();
+        m_thread_started = m_driven = false;
+        OrvexPrint("%s", m_closed_text);
+    }
     if (m_thread_started && m_ring != nullptr) m_ring->wake_reader();
     if (m_thread_started) {
         pthread_join(m_thread, nullptr);

@@ -13,9 +13,11 @@
 
 // What the video and audio senders share: the input ring (attached by the server, not owned),
 // the client destinations, the send thread's start and stop, and the item time that playing
-// starts from. Each sender runs its own loop.
+// starts from. Each sender runs its own loop, on a thread of its own or, for a sender that can
+// be driven, on the producer's thread after each write (no thread is started then).
 // Thread contract: Start/CloseSendThread from the controlling thread (the RTSP listener);
-// add/del_dest_socket_info from any thread; the loop runs on its own thread.
+// add/del_dest_socket_info from any thread; the loop runs on its own thread, or a driven sender
+// on whichever thread drives it, one at a time.
 class RtpSendSession {
 public:
     virtual ~RtpSendSession();
@@ -43,6 +45,10 @@ protected:
     RtpSendSession(TLock& class_lock, unsigned server_port, const char* closed_text);
     // Runs on the controlling thread just before the send thread is created.
     virtual void BeforeStart() {}
+    // On the controlling thread after BeforeStart: true when the producer will drive the loop,
+    // so that no thread is started; EndDriven then ends it at the close.
+    virtual bool BeginDriven() { return false; }
+    virtual void EndDriven() {}
     // The send loop; returns once m_running is 0.
     virtual void Run() = 0;
     // The loop's pause when it has nothing to send: `poll_us` of sleep, or, when the loops wait
@@ -58,7 +64,8 @@ private:
     static void* Trampoline(void* self);
 
     pthread_t m_thread{};
-    bool m_thread_started = false;
+    bool m_thread_started = false;  // or, driven, the loop begun
+    bool m_driven = false;
     std::atomic<bool> m_wake_on_write{false};
     unsigned m_server_port;
     const char* m_closed_text;

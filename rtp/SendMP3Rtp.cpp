@@ -53,47 +53,87 @@ void MP3RtpTransportSession::sendMP3RtpPacket(const Buffer_Item& item, ClientFan
     fanout.Flush();
 }
 
-void MP3RtpTransportSession::procMP3Thread() {
-    NameThisThread("orvex-aac-send");
+// What one run of the sender keeps from its start to its stop.
+struct MP3RtpTransportSession::SendRun {
+    explicit SendRun(int fd) : sock(fd), fanout(fd, false, "\n  mp3 frame send error ! \n ") {}
+
+    const platform::UniqueFd sock;
+    ClientFanout fanout;
+    unsigned rate = 0;
+    std::unique_ptr<Buffer_Item> item = std::make_unique<Buffer_Item>();
+    AacSendState state;
+    uint32_t ts = 0;
+    uint16_t sequence = 0;
+    bool recompute = true;
+    unsigned audio_ms = 0;
+};
+
+std::unique_ptr<MP3RtpTransportSession::SendRun> MP3RtpTransportSession::BeginRun() {
     Global_Config* config = Global_Config::instance();
-    const platform::UniqueFd sock(socket(AF_INET, SOCK_DGRAM, 0));
+    auto run = std::make_unique<SendRun>(socket(AF_INET, SOCK_DGRAM, 0));
     sockaddr_in local{};
     local.sin_family = AF_INET;
     local.sin_port = htons(static_cast<uint16_t>(config->m_audio_rtp_port));
     local.sin_addr.s_addr = htonl(INADDR_ANY);
-    (void)bind(sock.get(), reinterpret_cast<sockaddr*>(&local),
+    (void)bind(run->sock.get(), reinterpret_cast<sockaddr*>(&local),
                sizeof local);  // unchecked, as ever
-    const unsigned rate = config->m_audio_rtp_frequency;
+    run->rate = config->m_audio_rtp_frequency;
     m_payload_type = static_cast<unsigned>(config->m_audio_payload_type);
-    auto item = std::make_unique<Buffer_Item>();
-    ClientFanout fanout(sock.get(), false, "\n  mp3 frame send error ! \n ");
-    fanout.SetTargets(m_dests.targets());
-    AacSendState state;
-    uint32_t ts = 0;
-    uint16_t sequence = 0;
+    run->fanout.SetTargets(m_dests.targets());
+    return run;
+}
 
-    bool recompute = true;
-    unsigned audio_ms = 0;
+bool MP3RtpTransportSession::Turn(SendRun& run) {
+    Global_Config* config = Global_Config::instance();
+    if (run.recompute) run.audio_ms = PositionMs(run.ts, run.rate);
+    run.recompute = false;
+    unsigned video_ms = config->get_timestamp(true);
+    if (run.state.VideoLags(run.audio_ms, video_ms) && GET_ORVEX_API_DEBUG_PRINTF() == 1) {
+        // The number shown is the video position itself; operators read it that way.
+        OrvexPrintLog(kTag, "Video and audio timestamp compare: video delay %d \n",
+                      static_cast<int>(video_ms));
+    }
+    GetSocketInfoList();
+    bool got = m_ring != nullptr && m_ring->newread(*run.item);
+    if (!got || config->isPause() || !config->InIISOK() || m_dests.targets().empty()) {
+        return false;
+    }
+    AdvanceTimestamp(&run.ts, run.rate, run.item->timestamp, &m_last_item_time);
+    config->set_timestamp(PositionMs(run.ts, run.rate), false);
+    sendMP3RtpPacket(*run.item, run.fanout, run.ts, run.sequence);
+    run.state.AfterSend(&run.sequence);
+    run.recompute = true;
+    return true;
+}
+
+void MP3RtpTransportSession::procMP3Thread() {
+    NameThisThread("orvex-aac-send");
+    std::unique_ptr<SendRun> run = BeginRun();
     while (m_running.load(std::memory_order_relaxed) == 1) {
-        if (recompute) audio_ms = PositionMs(ts, rate);
-        recompute = false;
-        unsigned video_ms = config->get_timestamp(true);
-        if (state.VideoLags(audio_ms, video_ms) && GET_ORVEX_API_DEBUG_PRINTF() == 1) {
-            // The number shown is the video position itself; operators read it that way.
-            OrvexPrintLog(kTag, "Video and audio timestamp compare: video delay %d \n",
-                          static_cast<int>(video_ms));
-        }
-        GetSocketInfoList();
-        bool got = m_ring != nullptr && m_ring->newread(*item);
-        if (!got || config->isPause() || !config->InIISOK() || m_dests.targets().empty()) {
-            Idle(kIdleSleepUs);
-            continue;
-        }
-        AdvanceTimestamp(&ts, rate, item->timestamp, &m_last_item_time);
-        config->set_timestamp(PositionMs(ts, rate), false);
-        sendMP3RtpPacket(*item, fanout, ts, sequence);
-        state.AfterSend(&sequence);
-        recompute = true;
+        if (!Turn(*run)) Idle(kIdleSleepUs);
     }
     OrvexPrint("\n exit MP3RtpTransportSession::SendAACRTPPACKET ");
+}
+
+// Driven, the encoder's thread sends: a frame goes out as soon as it is written, with no
+// thread to wake. The video sender paces itself on the same published position.
+bool MP3RtpTransportSession::BeginDriven() {
+    if (!Global_Config::instance()->aac_inline()) return false;
+    TLock::Scoped hold(m_drive_lock);
+    m_driven_run = BeginRun();
+    return true;
+}
+
+void MP3RtpTransportSession::EndDriven() {
+    TLock::Scoped hold(m_drive_lock);
+    if (m_driven_run == nullptr) return;
+    m_driven_run.reset();
+    OrvexPrint("\n exit MP3RtpTransportSession::SendAACRTPPACKET ");
+}
+
+void MP3RtpTransportSession::Pump() {
+    TLock::Scoped hold(m_drive_lock);
+    if (m_driven_run == nullptr) return;
+    while (m_running.load(std::memory_order_relaxed) == 1 && Turn(*m_driven_run)) {
+    }
 }

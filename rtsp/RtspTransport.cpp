@@ -481,5 +481,8 @@ int RtspTransport::skyvo_add_h264_data(unsigned char* data, unsigned len) {
 }
 
 int RtspTransport::skyvo_add_mp3_data(unsigned char* data, unsigned len, unsigned timestamp) {
-    return AddWithRetries(m_audio_ring, data, len, timestamp);
+    int added = AddWithRetries(m_audio_ring, data, len, timestamp);
+    // Encoding inline, the encoder's thread sends its frames too.
+    if (Global_Config::instance()->aac_inline()) MP3RtpTransportSession::instance()->Pump();
+    return added;
 }

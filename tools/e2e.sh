@@ -122,9 +122,10 @@ done
 stop 1
 
 creds=
-# As on the television: no kv.orvex.audiopt, so the audio packets carry 98; no kv.orvex.wake.
-grep -v -e '^kv.orvex.audiopt=' -e '^kv.orvex.wake=' "$top/platform/host/orvex.prop" \
-  >"$work/tv.prop"
+# As on the television: no kv.orvex.audiopt, so the audio packets carry 98; no kv.orvex.wake;
+# no kv.orvex.aacenc (the encoder and audio sender have threads of their own).
+grep -v -e '^kv.orvex.audiopt=' -e '^kv.orvex.wake=' -e '^kv.orvex.aacenc=' \
+  "$top/platform/host/orvex.prop" >"$work/tv.prop"
 start env ORVEX_PROP_FILE="$work/tv.prop" "$build/orvex"
 packets 98
 sleep 1

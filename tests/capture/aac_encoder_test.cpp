@@ -3,6 +3,7 @@
 // thread ends.
 #include <dlfcn.h>
 #include <gtest/gtest.h>
+#include <unistd.h>
 
 #include <atomic>
 #include <chrono>
@@ -13,6 +14,8 @@
 #include <vector>
 
 #include "capture/orvexaudiomain.h"
+#include "config/GlobalConfig.h"
+#include "config/Settings.h"
 #include "platform/fake/FakePlatform.h"
 #include "rtsp/RtspTransport.h"
 #include "server/RtspService_t.h"
@@ -299,3 +302,49 @@ TEST_F(AacEncoderLoopTest, LoadAndInitFailuresEndOnlyTheEncoderThread) {
 }
 
 }  // namespace
+
+// kv.orvex.aacenc=inline: the PCM thread encodes what it reads, whole blocks only, and no
+// encoder thread is started; an encoder that cannot load leaves the PCM ring untouched.
+TEST_F(AacEncoderLoopTest, InlineEncoderRunsInThePcmThread) {
+    const std::string scripted = ORVEX_SCRIPTED_AAC;
+    struct Case {
+        const char* name;
+        std::string library;
+        std::vector<Bytes> items;
+        const char* printed;  // a line the start prints, if any
+    };
+    const std::vector<Step> steps = {
+        {0, kFrameA}, {0, kFrameB}, {kMoreInput, {}}, {0, kFrameC}, {kEnd, {}}};
+    const Case cases[] = {
+        {"frames reach the server", scripted, {kFrameA, kFrameB, kFrameC}, nullptr},
+        {"missing library", "/nonexistent/libstagefright.so", {}, "\nopen dll error......\n"},
+    };
+    fake.properties.Set("kv.orvex.aacenc", "inline");
+    Global_Config::instance()->Apply(config::ReadSettings(fake.properties));
+    for (const Case& c : cases) {
+        SCOPED_TRACE(c.name);
+        fake.aac_library.set_library(c.library);
+        Load(0, 0, steps);
+        audio_pcm_ring().reset();
+        ::testing::internal::CaptureStdout();
+        ASSERT_EQ(start_audio_record_enc(), 0);
+        // What the server's audio ring holds once every frame is in (read on this thread only
+        // after the PCM thread is joined).
+        unsigned expected = 0;
+        for (const Bytes& item : c.items) expected += kItemHeaderSize + item.size();
+        cycle_buffer& ring = skyvo_rtsp_service()->listener()->audio_ring();
+        for (int i = 0; i < 5000 && ring.used_space() < expected; ++i) usleep(1000);
+        usleep(20000);
+        stop_audio_record_enc();
+        std::string out = ::testing::internal::GetCapturedStdout();
+        EXPECT_NE(out.find("thread_join(g_thread_audio_pcm.thread_handle)"), std::string::npos);
+        EXPECT_EQ(out.find("thread_join(g_thread_audio_aac.thread_handle)"), std::string::npos);
+        if (c.printed != nullptr) {
+            EXPECT_NE(out.find(c.printed), std::string::npos);
+        }
+        EXPECT_EQ(RingItems(), c.items);
+        EXPECT_EQ(audio_pcm_ring().used_space(), 0u);
+        EXPECT_EQ(Record().set_input_calls, c.items.empty() ? 0 : 2);
+        EXPECT_EQ(Record().input_length_other, 0u);
+    }
+}

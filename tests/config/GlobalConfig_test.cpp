@@ -119,9 +119,10 @@ TEST_F(GlobalConfigTest, AudioPayloadTypeProperty) {
 }
 
 // The two-way switches: kv.orvex.wake ("event" makes idle loops wait for writes),
-// kv.orvex.latency ("1" turns on the video sender's report) and kv.orvex.audioclock
-// ("samples" stamps audio by its samples). Anything but the two values or
-// unset is logged once and leaves the switch off, as on the television.
+// kv.orvex.latency ("1" turns on the video sender's report), kv.orvex.audioclock
+// ("samples" stamps audio by its samples) and kv.orvex.aacenc ("inline" encodes in the reader).
+// Anything but the two values or unset is logged once and leaves the switch off, as on the
+// television.
 TEST_F(GlobalConfigTest, SwitchProperties) {
     struct Case {
         const char* key;
@@ -156,6 +157,14 @@ TEST_F(GlobalConfigTest, SwitchProperties) {
          false,
          {"kv.orvex.audioclock=\"sample\" is neither write nor samples; audio is stamped at "
           "write time"}},
+        {"kv.orvex.aacenc", nullptr, false, {}},
+        {"kv.orvex.aacenc", "thread", false, {}},
+        {"kv.orvex.aacenc", "inline", true, {}},
+        {"kv.orvex.aacenc",
+         "in-line",
+         false,
+         {"kv.orvex.aacenc=\"in-line\" is neither thread nor inline; the encoder keeps its own "
+          "thread"}},
     };
     for (const Case& c : cases) {
         const std::string what = std::string(c.key) + "=" + (c.value ? c.value : "(missing)");
@@ -170,6 +179,7 @@ TEST_F(GlobalConfigTest, SwitchProperties) {
             << what;
         EXPECT_EQ(config->report_latency(), key == "kv.orvex.latency" && c.on) << what;
         EXPECT_EQ(config->audio_clock_samples(), key == "kv.orvex.audioclock" && c.on) << what;
+        EXPECT_EQ(config->aac_inline(), key == "kv.orvex.aacenc" && c.on) << what;
         EXPECT_EQ(fake.log.Texts("globalconfig"), c.log) << what;
     }
 }
