@@ -270,7 +270,7 @@ int audio_output_pcm(std::atomic<int>* run_flag) {
             continue;
         }
         if (get_write_pcm_file()) Test_write_audio_pcm(buffer.data(), static_cast<size_t>(n));
-        // An inline encoder that failed or ended takes nothing: the ring is not filled for no one.
+        // An inline encoder that failed or ended takes nothing: no blocks pile up for nobody.
         if (inline_encoder && !encoder) continue;
         add_audio_pcm_data(buffer.data(), static_cast<int>(n));
         while (encoder && g_pcm_ring.read(block.data(), kPcmBlockBytes) > 0) {

@@ -19,7 +19,8 @@ struct DestSocketInfo {
 // The destinations of a send session, keyed by the requesting RTSP session, and the send
 // thread's own copy of them (ascending key order), refreshed once per loop turn.
 // Thread contract: Add, Del and Clear from any thread, under the owner's class-wide lock
-// (passed in); Refresh and targets() only from the send thread.
+// (passed in); Refresh and targets() only from the send thread (or, for a driven sender, under
+// its drive lock).
 class DestSocketTable {
 public:
     explicit DestSocketTable(TLock& lock) : lock_(lock) {}
