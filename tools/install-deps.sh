@@ -10,6 +10,7 @@
 #   install-deps.sh bench    that, plus the e2e clients and the peer server bench/peer_cost.sh
 #                            serves beside orvex (gst-rtsp-server through Python), and perf
 #   install-deps.sh ci       all of it, plus the sanitizer, fuzzing and 32-bit ARM tool chains
+#                            and ccache
 set -euo pipefail
 
 packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock-dev
@@ -22,7 +23,7 @@ packages=(cmake ninja-build g++ make pkg-config googletest libgtest-dev libgmock
           libavformat-dev libavcodec-dev libavutil-dev  # publishing to media servers
           libssl-dev zlib1g-dev libsrtp2-dev libopus-dev)  # WebRTC playback: DTLS-SRTP, Opus sound
 if [[ "${1:-}" == ci ]]; then
-  packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static)
+  packages+=(clang clang-format libclang-rt-dev g++-arm-linux-gnueabihf qemu-user-static ccache)
 fi
 if [[ "${1:-}" == ci || "${1:-}" == capture-e2e ]]; then
   packages+=(xvfb gstreamer1.0-x pulseaudio pulseaudio-utils)
