@@ -13,6 +13,9 @@ void DestSocketTable::Add(void* key, int port, const std::string& ip) {
 void DestSocketTable::SetJoinAtKey(bool on) {
     TLock::Scoped hold(lock_);
     join_at_key_ = on;
+    if (!on) return;
+    for (auto& entry : map_) entry.second->waiting = true;
+    changed_ = true;
 }
 
 bool DestSocketTable::AdmitWaiting() {

@@ -28,6 +28,8 @@ public:
     // A key already present gets the new value. A new key waits for AdmitWaiting while
     // SetJoinAtKey is on: it is left out of targets() until then.
     void Add(void* key, int port, const std::string& ip);
+    // Called as a run starts: turned on, the destinations already present wait as well, since
+    // none of them has had a picture of this run.
     void SetJoinAtKey(bool on);
     // Lets the waiting destinations in (at a key picture); false when none was waiting.
     bool AdmitWaiting();

@@ -44,6 +44,12 @@ H264RtpTransportSession::~H264RtpTransportSession() { CloseSendThread(); }
 void H264RtpTransportSession::BeforeStart() {
     m_dests.MarkChanged();
     m_sps_seen = false;
+    m_last_nal_type = 0;  // the last run's last unit says nothing of this run's first
+    // Before the thread runs: the clients that set up before capture started are held to a key
+    // picture too, as the items after a ring reset may begin inside a picture.
+    Global_Config* config = Global_Config::instance();
+    config->read_join_mode();
+    m_dests.SetJoinAtKey(config->join_at_key());
 }
 
 void H264RtpTransportSession::InspectParameterSets(const Buffer_Item& item) {
@@ -106,8 +112,6 @@ void H264RtpTransportSession::procH264Thread() {
     uint16_t sequence = 0;
 
     const bool report_latency = config->report_latency();
-    config->read_join_mode();
-    m_dests.SetJoinAtKey(config->join_at_key());
     FrameLatency latency;
 
     bool recompute = true;

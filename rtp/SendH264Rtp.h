@@ -31,7 +31,7 @@ private:
     bool StartsKeyPicture(const Buffer_Item& item);
 
     bool m_sps_seen = false;
-    unsigned m_last_nal_type = 0;  // send thread only
+    unsigned m_last_nal_type = 0;  // send thread only (reset before it starts)
     bool m_pps_seen = false;
     uint32_t m_time_scale = 1;
     std::string m_sps_base64;
