@@ -168,7 +168,8 @@ stop 1
 
 # Another encoder's High-profile stream, joined while it flows: DESCRIBE announces the stream's
 # own parameter sets (kv.orvex.sdp=live) and the client starts at its next key picture
-# (kv.orvex.join=key), so every picture it gets decodes, over RTSP and from /stream.mp4.
+# (kv.orvex.join=key), so every picture it gets decodes, over RTSP and from /stream.mp4. The
+# RTSP client's first unit is an SPS, though its PLAY starts a capture the feed runs ahead of.
 for slices in 1 4; do
   ffmpeg -y -v error -f lavfi -i testsrc2=size=1280x720:rate=30 -t 4 -c:v libx264 -preset veryfast \
     -profile:v high -x264-params "aud=1:keyint=30:slices=$slices" -f h264 "$work/high.h264"
@@ -176,6 +177,10 @@ for slices in 1 4; do
   "$build/orvex-feed" --loop "$work/high.h264" 2>"$work/feed.log" &
   feeder=$!
   sleep 2.5
+  line=$(python3 "$top/tools/rtsp_check.py" first "$(url 1280 720)" 3) ||
+    fail "x264 High, $slices slice(s), the client that starts the capture: $line"
+  ok "x264 High, $slices slice(s), the client that starts the capture: $line"
+  sleep 0.5
   join_check "$(url 1280 720)" 140 \
     "x264 High profile 1280x720, $slices slice(s) a picture, joined mid-stream over RTSP"
   log=$(timeout -k 5 25 ffmpeg -hide_banner -nostats -i "http://127.0.0.1:8080/stream.mp4" \

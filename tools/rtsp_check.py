@@ -8,6 +8,8 @@
     rtsp_check.py split URL [SECONDS]     the same delay cut in two: capture to the frame's last
                                           packet here, and that packet to the decoded frame
     rtsp_check.py stamps URL [SECONDS]    the audio RTP time stamp steps (one AAC frame each)
+    rtsp_check.py first URL [SECONDS]     the types of the first H.264 NAL units that arrive;
+                                          fails unless the first is an SPS (a key picture)
     (measure and latency also read what a media server gives: rtmp://, an HLS playlist, a file)
     rtsp_check.py guess URL SOURCE        wrong passwords from SOURCE until the connection ends,
                                           then the URL's right one from there
@@ -399,6 +401,27 @@ def stamps(url, seconds):
     return 0 if steps and not outside else 1
 
 
+def first(url, seconds):
+    """The NAL unit types that begin the video a client gets (FU-A fragments count once, at
+    their start). A client held to a key picture gets an SPS first."""
+    video, audio = udp_pair(), udp_pair()
+    session = Session(url)
+    session.play([video.getsockname()[1], audio.getsockname()[1]])
+    video.settimeout(seconds)
+    types = []
+    try:
+        while len(types) < 6:
+            p = video.recv(2048)
+            if p[12] & 0x1F != 28:
+                types.append(p[12] & 0x1F)
+            elif p[13] & 0x80:
+                types.append(p[13] & 0x1F)
+    except socket.timeout:
+        pass
+    print("first_nal_types=%s" % ",".join(map(str, types)))
+    return 0 if types and types[0] == 7 else 1
+
+
 def guess(url, source):
     """A scripted guesser from `source`: wrong passwords until the service ends the connection.
     Then one more connection from the same address with the right password (the URL's)."""
@@ -450,7 +473,7 @@ def main():
         sys.exit(guess(url, args[2]))
     seconds = float(args[2]) if len(args) > 2 else 10.0
     modes = {"packets": packets, "measure": measure, "latency": latency, "split": split,
-             "stamps": stamps}
+             "stamps": stamps, "first": first}
     offset = os.path.getsize(log) if log and os.path.exists(log) else 0
     rc = modes[mode](url, seconds)
     if log:
