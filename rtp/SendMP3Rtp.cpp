@@ -19,6 +19,8 @@ namespace {
 
 constexpr const char* kTag = "orvex:::SendMP3Rtp";
 constexpr useconds_t kIdleSleepUs = 5000;
+// Printed when a run ends, whether a thread or the producer drove it.
+constexpr const char* kRunEndedText = "\n exit MP3RtpTransportSession::SendAACRTPPACKET ";
 
 TLock g_class_lock;
 std::atomic<MP3RtpTransportSession*> g_instance{nullptr};
@@ -112,7 +114,7 @@ void MP3RtpTransportSession::procMP3Thread() {
     while (m_running.load(std::memory_order_relaxed) == 1) {
         if (!Turn(*run)) Idle(kIdleSleepUs);
     }
-    OrvexPrint("\n exit MP3RtpTransportSession::SendAACRTPPACKET ");
+    OrvexPrint("%s", kRunEndedText);
 }
 
 // Driven, the encoder's thread sends: a frame goes out as soon as it is written, with no
@@ -128,7 +130,7 @@ void MP3RtpTransportSession::EndDriven() {
     TLock::Scoped hold(m_drive_lock);
     if (m_driven_run == nullptr) return;
     m_driven_run.reset();
-    OrvexPrint("\n exit MP3RtpTransportSession::SendAACRTPPACKET ");
+    OrvexPrint("%s", kRunEndedText);
 }
 
 void MP3RtpTransportSession::Pump() {
