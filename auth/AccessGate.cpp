@@ -217,7 +217,8 @@ AccessDecision AccessGate::Judge(const AccessRequest& request) {
         d.answer = AccessAnswer::kBadRequest;
     } else {
         d.answer = AccessAnswer::kChallenge;
-        d.challenge = m_gate->Challenge(now, request.address, verdict == DigestVerdict::kStale);
+        d.challenge = m_gate->Challenge(now, m_nonce_serial++, request.address,
+                                        verdict == DigestVerdict::kStale);
     }
     if (IsFailedGuess(verdict) && m_lockout.RecordFailure(request.address, now)) {
         OrvexLogPriority(platform::kLogWarn, kTag,

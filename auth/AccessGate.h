@@ -83,6 +83,7 @@ private:
     std::unique_ptr<DigestGate> m_gate ORVEX_GUARDED_BY(m_lock);
     FailureLockout m_lockout ORVEX_GUARDED_BY(m_lock);
     NonceCounts m_counts ORVEX_GUARDED_BY(m_lock);
+    uint16_t m_nonce_serial ORVEX_GUARDED_BY(m_lock) = 0;  // no two challenges share a nonce
     std::string m_file ORVEX_GUARDED_BY(m_lock);
     std::string m_secret ORVEX_GUARDED_BY(m_lock);
     // What the users file was when last read: a change in any re-reads it.

@@ -11,6 +11,8 @@ namespace auth {
 namespace {
 
 constexpr size_t kNonceTimeDigits = 16;
+// Below the serial: milliseconds of a monotonic clock, good for some 8,900 years of uptime.
+constexpr uint64_t kStampTimeMask = (uint64_t{1} << 48) - 1;
 
 bool IsLowerHex(std::string_view s) {
     for (char c : s) {
@@ -110,15 +112,17 @@ std::string NonceMac(const std::string& secret, std::string_view stamp, uint32_t
 
 }  // namespace
 
-std::string DigestGate::MakeNonce(uint64_t now_ms, uint32_t address) const {
+std::string DigestGate::MakeNonce(uint64_t now_ms, uint16_t serial, uint32_t address) const {
     char stamp[kNonceTimeDigits + 1];
-    snprintf(stamp, sizeof stamp, "%016" PRIx64, now_ms);
+    snprintf(stamp, sizeof stamp, "%016" PRIx64,
+             (uint64_t{serial} << 48) | (now_ms & kStampTimeMask));
     return stamp + NonceMac(m_secret, stamp, address);
 }
 
-std::string DigestGate::Challenge(uint64_t now_ms, uint32_t address, bool stale) const {
-    std::string value = "Digest realm=\"" + m_realm + "\", nonce=\"" + MakeNonce(now_ms, address) +
-                        "\", qop=\"auth\"";
+std::string DigestGate::Challenge(uint64_t now_ms, uint16_t serial, uint32_t address,
+                                  bool stale) const {
+    std::string value = "Digest realm=\"" + m_realm + "\", nonce=\"" +
+                        MakeNonce(now_ms, serial, address) + "\", qop=\"auth\"";
     if (stale) value += ", stale=TRUE";
     return value;
 }
@@ -160,7 +164,7 @@ DigestVerdict DigestGate::Check(const std::string* authorization, std::string_vi
     const std::string_view stamp = std::string_view(nonce).substr(0, kNonceTimeDigits);
     if (!EqualInConstantTime(nonce.substr(kNonceTimeDigits), NonceMac(m_secret, stamp, address)))
         return DigestVerdict::kStale;
-    uint64_t issued = std::stoull(std::string(stamp), nullptr, 16);
+    uint64_t issued = std::stoull(std::string(stamp), nullptr, 16) & kStampTimeMask;
     // A time ahead of ours is a nonce of before a reboot: the clock began again.
     if (issued > now_ms || now_ms - issued >= kNonceLifetimeMs) return DigestVerdict::kStale;
     if (fields.uri != uri) return DigestVerdict::kWrongUri;

@@ -52,8 +52,10 @@ struct DigestAnswer {
 // and of the address they were given to, under a secret the caller keeps (across restarts, so
 // browsers' nonces stay good), so they need no table: one from another secret or another
 // address, or older than kNonceLifetimeMs, is stale; one that is not shaped like ours is
-// foreign. The challenge offers qop=auth; answers without qop are still taken (RFC 2617 §3.2.2,
-// the RFC 2069 form GStreamer and VLC send).
+// foreign. The stamp's top 16 bits are the caller's serial: two clients at one address
+// challenged in the same millisecond must not share a nonce, or the second one's first count
+// would read as a replay of the first one's. The challenge offers qop=auth; answers without
+// qop are still taken (RFC 2617 §3.2.2, the RFC 2069 form GStreamer and VLC send).
 // Thread contract: const after construction; any thread.
 class DigestGate {
 public:
@@ -66,9 +68,9 @@ public:
 
     const std::string& realm() const { return m_realm; }
     const std::vector<Credential>& users() const { return m_users; }
-    std::string MakeNonce(uint64_t now_ms, uint32_t address) const;
+    std::string MakeNonce(uint64_t now_ms, uint16_t serial, uint32_t address) const;
     // The value of a 401 answer's WWW-Authenticate header.
-    std::string Challenge(uint64_t now_ms, uint32_t address, bool stale) const;
+    std::string Challenge(uint64_t now_ms, uint16_t serial, uint32_t address, bool stale) const;
     // `authorization`: the header's value, or null when the request has none; `method` and
     // `uri`: the request line's first two words; `address`: the client's, host order.
     DigestVerdict Check(const std::string* authorization, std::string_view method,

@@ -361,6 +361,29 @@ def replayed_nc(p, proto, src):
     return verdict, "first 200, the same nc again " + why
 
 
+def one_address_at_once(p, proto, src):
+    # Two tabs, a page's parallel requests or a household behind one NAT: clients at one address
+    # challenged at the same moment, each then answering with its first count.
+    method, uri = target(proto)
+    challenges = [None] * 16
+    def take(i):
+        challenges[i] = p.challenge(proto, src)
+    threads = [threading.Thread(target=take, args=(i,)) for i in range(len(challenges))]
+    for t in threads:
+        t.start()
+    for t in threads:
+        t.join()
+    nonces = {c.get("nonce") for c in challenges}
+    statuses = [p.ask(proto, src, digest(c, p.user, p.password, method, uri, nc=1))[0].status
+                for c in challenges]
+    served = statuses.count(200)
+    if served != len(challenges):
+        return FAILED, "%d of %d clients served (%d distinct nonces): the others' first count " \
+                       "was taken for a replay" % (served, len(challenges), len(nonces))
+    return HELD, "%d clients challenged at once, %d distinct nonces, all served" % (
+        len(challenges), len(nonces))
+
+
 def nc_far_ahead(p, proto, src):
     fields = p.challenge(proto, src)
     method, uri = target(proto)
@@ -966,6 +989,7 @@ CASES = [
     ("digest: an empty cnonce", both(empty_cnonce)),
     ("digest: an odd but lawful cnonce", both(odd_cnonce)),
     ("digest: a nonce count used twice is refused", both(replayed_nc)),
+    ("digest: clients at one address challenged at once", both(one_address_at_once)),
     ("digest: a nonce count far ahead", both(nc_far_ahead)),
     ("digest: an answer replayed from another address", both(other_address)),
     ("digest: a nonce the service never made", both(made_up_nonce)),

@@ -166,18 +166,20 @@ protected:
 };
 
 TEST_F(DigestGateTest, NoncesCarryTheirTimeAndAnHmacOfTimeAndAddress) {
-    EXPECT_EQ(gate.MakeNonce(kIssued, kHere), kNonce);
-    EXPECT_NE(gate.MakeNonce(kIssued, kHere + 1), kNonce);
-    EXPECT_EQ(gate.Challenge(kIssued, kHere, false),
+    EXPECT_EQ(gate.MakeNonce(kIssued, 0, kHere), kNonce);
+    EXPECT_NE(gate.MakeNonce(kIssued, 0, kHere + 1), kNonce);
+    // The serial sits above the time: the same millisecond, another nonce.
+    EXPECT_EQ(gate.MakeNonce(kIssued, 0xbeef, kHere).substr(0, 16), "beef0000000f4240");
+    EXPECT_EQ(gate.Challenge(kIssued, 0, kHere, false),
               std::string("Digest realm=\"orvex\", nonce=\"") + kNonce + "\", qop=\"auth\"");
     EXPECT_EQ(
-        gate.Challenge(kIssued, kHere, true),
+        gate.Challenge(kIssued, 0, kHere, true),
         std::string("Digest realm=\"orvex\", nonce=\"") + kNonce + "\", qop=\"auth\", stale=TRUE");
 }
 
 TEST_F(DigestGateTest, VerdictsOnAnswers) {
     const std::string other_secret =
-        auth::DigestGate({}, "another secret").MakeNonce(kIssued, kHere);
+        auth::DigestGate({}, "another secret").MakeNonce(kIssued, 0, kHere);
     std::string forged = kNonce;
     forged[0] = '1';  // a later time under the old HMAC
     std::string shouting = kNonce;
@@ -188,6 +190,11 @@ TEST_F(DigestGateTest, VerdictsOnAnswers) {
     auth::DigestFields before{"orvex", "orvex", kNonce, kUri, "", "", "", "", "", ""};
     const std::string retired =
         auth::DigestExpectedResponse("1b7a6d0b4b1d0a2e4c37f2a1e9a2b3c4", "DESCRIBE", before);
+    // An answer to a nonce with a serial: its time is read below the serial.
+    auth::DigestFields serial_fields = before;
+    serial_fields.nonce = gate.MakeNonce(kIssued, 0xffff, kHere);
+    const std::string serial_response =
+        auth::DigestExpectedResponse("2f5dc0319c3279451ae1c1d7fd646060", "DESCRIBE", serial_fields);
     const struct {
         std::string header;
         const char* method;
@@ -211,6 +218,12 @@ TEST_F(DigestGateTest, VerdictsOnAnswers) {
          DigestVerdict::kStale},
         {Header("orvex", "orvex", other_secret, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,
          DigestVerdict::kStale},
+        {Header("orvex", "orvex", serial_fields.nonce, kUri, serial_response), "DESCRIBE", kUri,
+         kIssued + 299999, kHere, DigestVerdict::kOk},
+        {Header("orvex", "orvex", serial_fields.nonce, kUri, serial_response), "DESCRIBE", kUri,
+         kIssued + 300000, kHere, DigestVerdict::kStale},
+        {Header("orvex", "orvex", serial_fields.nonce, kUri, serial_response), "DESCRIBE", kUri,
+         kIssued - 1, kHere, DigestVerdict::kStale},
         {Header("orvex", "orvex", forged, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,
          DigestVerdict::kStale},
         {Header("orvex", "orvex", shouting, kUri, kResponse), "DESCRIBE", kUri, kIssued, kHere,

@@ -226,6 +226,12 @@ TEST_F(RtspAccessTest, NoncesGoStaleWithoutCountingAndCountedAnswersAreNotReplay
     Decision again = Describe("10.0.0.5", first);
     EXPECT_EQ(again.answer, AccessAnswer::kChallenge);
     EXPECT_EQ(again.reason, "nonce count used before (a replayed answer) (user \"orvex\")");
+    // Two clients at one address (two tabs, a page's parallel requests, two curls) challenged
+    // in the same millisecond each count from 1, on a nonce of their own.
+    const std::string tab1 = Answer("pw", "10.0.0.7", "00000001");
+    const std::string tab2 = Answer("pw", "10.0.0.7", "00000001");
+    EXPECT_EQ(Describe("10.0.0.7", tab1).answer, AccessAnswer::kServe);
+    EXPECT_EQ(Describe("10.0.0.7", tab2).answer, AccessAnswer::kServe);
     // Two Authorization headers are a malformed request; OPTIONS needs none.
     std::vector<std::string> twice = {std::string("DESCRIBE ") + kUrl + " RTSP/1.0", old, old};
     EXPECT_EQ(JudgeRtspRequest(access, twice, kRtspDescribe, Ip("10.0.0.4"), "10.0.0.4").answer,
