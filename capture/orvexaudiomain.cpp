@@ -149,6 +149,15 @@ private:
     AudioSampleClock clock_{48000, kAacFrameSamples};
 };
 
+// The encoder's end, as the encoder thread says it when it leaves.
+constexpr const char* kEncoderEndedText = "\n exit audio_aac_enc ";
+
+void EndInlineEncoder(std::unique_ptr<AacBlockEncoder>* encoder) {
+    if (!*encoder) return;
+    encoder->reset();
+    OrvexPrint("%s", kEncoderEndedText);
+}
+
 void* PcmThread(void* flag) {
     NameThisThread("orvex-pcm");
     OrvexLog(kTag, "real_start_audiorecord_thread");
@@ -274,10 +283,10 @@ int audio_output_pcm(std::atomic<int>* run_flag) {
         if (inline_encoder && !encoder) continue;
         add_audio_pcm_data(buffer.data(), static_cast<int>(n));
         while (encoder && g_pcm_ring.read(block.data(), kPcmBlockBytes) > 0) {
-            if (!encoder->Encode(block.data())) encoder.reset();
+            if (!encoder->Encode(block.data())) EndInlineEncoder(&encoder);
         }
     }
-    encoder.reset();
+    EndInlineEncoder(&encoder);
     record.stop();
     Global_Config::instance()->set_sub_stat(false);
     return 0;
@@ -306,7 +315,7 @@ int audio_aac_enc(std::atomic<int>* run_flag) {
         if (!encoder.Encode(input)) break;
     }
     encoder.Close();
-    OrvexPrint("\n exit audio_aac_enc ");
+    OrvexPrint("%s", kEncoderEndedText);
     return 0;
 }
 

@@ -312,12 +312,14 @@ TEST_F(AacEncoderLoopTest, InlineEncoderRunsInThePcmThread) {
         std::string library;
         std::vector<Bytes> items;
         const char* printed;  // a line the start prints, if any
+        size_t ended;         // times the encoder's end is printed
     };
     const std::vector<Step> steps = {
         {0, kFrameA}, {0, kFrameB}, {kMoreInput, {}}, {0, kFrameC}, {kEnd, {}}};
     const Case cases[] = {
-        {"frames reach the server", scripted, {kFrameA, kFrameB, kFrameC}, nullptr},
-        {"missing library", "/nonexistent/libstagefright.so", {}, "\nopen dll error......\n"},
+        // The script ends with the encoder's output-too-small: it ends as the thread would.
+        {"frames reach the server", scripted, {kFrameA, kFrameB, kFrameC}, nullptr, 1},
+        {"missing library", "/nonexistent/libstagefright.so", {}, "\nopen dll error......\n", 0},
     };
     fake.properties.Set("kv.orvex.aacenc", "inline");
     Global_Config::instance()->Apply(config::ReadSettings(fake.properties));
@@ -342,6 +344,12 @@ TEST_F(AacEncoderLoopTest, InlineEncoderRunsInThePcmThread) {
         if (c.printed != nullptr) {
             EXPECT_NE(out.find(c.printed), std::string::npos);
         }
+        size_t ended = 0;
+        for (size_t at = out.find("exit audio_aac_enc"); at != std::string::npos;
+             at = out.find("exit audio_aac_enc", at + 1)) {
+            ++ended;
+        }
+        EXPECT_EQ(ended, c.ended) << out;
         EXPECT_EQ(RingItems(), c.items);
         EXPECT_EQ(audio_pcm_ring().used_space(), 0u);
         EXPECT_EQ(Record().set_input_calls, c.items.empty() ? 0 : 2);
