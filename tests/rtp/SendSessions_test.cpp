@@ -279,6 +279,7 @@ TEST_P(SendSessionTest, LatencyReportComesWithEvery300thFrame) {
     }
 }
 
-INSTANTIATE_TEST_SUITE_P(WakeModes, SendSessionTest, ::testing::Values("poll", "event", "inline"));
+INSTANTIATE_TEST_SUITE_P(SenderModes, SendSessionTest,
+                         ::testing::Values("poll", "event", "inline"));
 
 }  // namespace
