@@ -1,5 +1,6 @@
 #include "web/LiveMuxer.h"
 
+#include <algorithm>
 #include <cstdlib>
 #include <string>
 
@@ -67,12 +68,21 @@ void LiveMuxer::OnPicture(const AccessUnitGatherer::Picture& picture) {
         ++m_dropped_pictures;
         return;
     }
-    const uint32_t since_last = picture_ms - m_last_picture_ms;
-    if (since_last >= 1 && since_last <= 1000) m_picture_duration = since_last * 90;
-    uint64_t decode_time = uint64_t{static_cast<uint32_t>(picture_ms - m_origin_ms)} * 90;
-    // Two pictures handed over within one millisecond still get increasing times.
-    if (m_pictures_sent > 0 && decode_time <= m_last_decode_time)
-        decode_time = m_last_decode_time + 1;
+    // A browser's MSE takes a step between two pictures of more than twice the last one's
+    // duration for a break in the stream, and then drops every picture up to the next key
+    // frame: a freeze of up to the key interval. Arrival times jitter (a burst after a stall
+    // comes 60, 4, 4, then 33 ms apart), so a step is held under that bound and the time it
+    // lost is made up over the next pictures, and a duration (the step to its picture) never
+    // falls below three quarters of the one before. Pictures within one millisecond still
+    // get increasing times.
+    const uint64_t arrived = uint64_t{static_cast<uint32_t>(picture_ms - m_origin_ms)} * 90;
+    uint64_t decode_time = arrived;
+    if (m_pictures_sent > 0) {
+        const uint64_t latest = m_last_decode_time + 2 * uint64_t{m_picture_duration} - 1;
+        decode_time = std::min(std::max(arrived, m_last_decode_time + 1), latest);
+        const uint32_t step = static_cast<uint32_t>(decode_time - m_last_decode_time);
+        m_picture_duration = std::max(step, m_picture_duration / 4 * 3);
+    }
     const size_t head = fmp4::WriteFragmentHeader(
         ++m_sequence, fmp4::kVideoTrack, decode_time, m_picture_duration,
         static_cast<uint32_t>(picture.len), key, m_scratch.data(), m_scratch.size());
@@ -80,7 +90,6 @@ void LiveMuxer::OnPicture(const AccessUnitGatherer::Picture& picture) {
         ++m_dropped_pictures;
         if (key) m_started = false;  // the pictures after it cannot be decoded without it
     }
-    m_last_picture_ms = picture_ms;
     m_last_decode_time = decode_time;
     ++m_pictures_sent;
 }
@@ -133,7 +142,6 @@ bool LiveMuxer::StartStream(uint32_t time_ms) {
     m_stream_has_audio = with_audio;
     m_started = true;
     m_origin_ms = time_ms;
-    m_last_picture_ms = time_ms;
     m_audio_running = false;
     m_pictures_sent = 0;
     ++m_restarts;

@@ -41,8 +41,7 @@ private:
     bool m_stream_has_audio = false;
     uint32_t m_origin_ms = 0;  // time 0 of both tracks
 
-    uint32_t m_last_picture_ms = 0;
-    uint32_t m_picture_duration = 3000;  // in 90 kHz ticks, from the last two pictures
+    uint32_t m_picture_duration = 3000;  // the last picture's, in 90 kHz ticks
     uint64_t m_last_decode_time = 0;
     unsigned m_pictures_sent = 0;  // in the running stream
 

@@ -171,7 +171,8 @@ const Bytes kPps = Unhex("68cb8cb2");
 struct Fragment {
     uint32_t track;
     uint64_t decode_time;
-    std::string payload;  // hex
+    std::string payload;    // hex
+    uint32_t duration = 0;  // read, not compared
     bool operator==(const Fragment& o) const {
         return track == o.track && decode_time == o.decode_time && payload == o.payload;
     }
@@ -208,12 +209,14 @@ std::vector<Fragment> Fragments(const Bytes& bytes, Bytes* init = nullptr) {
         if (type == "moof") {
             const uint8_t* tfhd = FindBox(&bytes[at], size, "tfhd");
             const uint8_t* tfdt = FindBox(&bytes[at], size, "tfdt");
+            const uint8_t* trun = FindBox(&bytes[at], size, "trun");
             const size_t mdat = at + size;
-            if (tfhd == nullptr || tfdt == nullptr || mdat + 8 > bytes.size()) break;
+            if (tfhd == nullptr || tfdt == nullptr || trun == nullptr || mdat + 8 > bytes.size())
+                break;
             const uint32_t mdat_size = Be32(&bytes[mdat]);
             if (mdat + mdat_size > bytes.size()) break;
             out.push_back({Be32(tfhd + 12), uint64_t{Be32(tfdt + 12)} << 32 | Be32(tfdt + 16),
-                           Hex(&bytes[mdat + 8], mdat_size - 8)});
+                           Hex(&bytes[mdat + 8], mdat_size - 8), Be32(trun + 20)});
             at = mdat + mdat_size;
             continue;
         }
@@ -332,6 +335,55 @@ TEST(LiveMuxerTest, PicturesBecomeOneFragmentEachWithTheirTimes) {
         {'v', IDR, 66, {{1, 0, "00000004 65888421"}}},  // one slice a picture, learnt
         {'v', P, 100, {{1, 34 * 90, "00000004 419a0011"}}}});
     // clang-format on
+}
+
+// Arrival times as a loaded machine has them. A browser's MSE takes a step between two
+// pictures of more than twice the last one's duration for a break, and drops every picture up
+// to the next key frame: no step may look like that, and the time held back is made up.
+TEST(LiveMuxerTest, JitteredArrivalsNeverLookLikeABreakToABrowser) {
+    const struct {
+        const char* name;
+        std::vector<uint32_t> ms;  // when each one-slice picture arrives, the first a key
+        unsigned caught_up_by;     // the picture from which the times are the arrivals again
+    } cases[] = {
+        {"steady", {0, 33, 66, 100, 133, 166, 200}, 0},
+        {"a burst, then steady", {0, 33, 66, 70, 74, 78, 111, 144, 177}, 7},
+        {"a stall, its pictures flushed, then steady",
+         {0, 33, 66, 300, 301, 302, 303, 304, 333, 366, 400, 433, 466},
+         5},
+        {"pictures in one millisecond", {0, 33, 33, 33, 66, 100, 133}, 0},
+        {"a long stall", {0, 33, 66, 900, 933, 966, 1000, 1033, 1066, 1100}, 6},
+    };
+    for (const auto& c : cases) {
+        SCOPED_TRACE(c.name);
+        FragmentRing ring(1 << 16);
+        LiveMuxer muxer(&ring);
+        auto feed = [&](const char* hex, uint32_t ms) {
+            Bytes unit = Unhex(hex);
+            unit.insert(unit.begin(), {0, 0, 0, 1});
+            muxer.OnVideoFrame(unit.data(), unit.size(), ms);
+        };
+        feed(SPS, c.ms[0]), feed(PPS, c.ms[0]), feed(IDR, c.ms[0]);
+        for (size_t i = 1; i < c.ms.size(); ++i) feed(P, c.ms[i]);
+        feed(AUD, c.ms.back() + 33);  // the last picture ends
+        FragmentRing::Reader reader;
+        std::string type;
+        ASSERT_TRUE(ring.WaitForStart(&reader, &type, 0));
+        const std::vector<Fragment> sent = Fragments(Drain(ring, reader));
+        ASSERT_EQ(sent.size(), c.ms.size());
+        for (size_t i = 1; i < sent.size(); ++i) {
+            SCOPED_TRACE("picture " + std::to_string(i));
+            const uint64_t arrived = uint64_t{c.ms[i] - c.ms[0]} * 90;
+            EXPECT_GT(sent[i].decode_time, sent[i - 1].decode_time);
+            EXPECT_LE(sent[i].decode_time - sent[i - 1].decode_time,
+                      2 * uint64_t{sent[i - 1].duration} - 1);
+            if (c.ms[i] == c.ms[i - 1]) continue;  // a tick later than its arrival
+            EXPECT_LE(sent[i].decode_time, arrived);
+            if (i >= c.caught_up_by) {
+                EXPECT_EQ(sent[i].decode_time, arrived);
+            }
+        }
+    }
 }
 
 TEST(LiveMuxerTest, NewParameterSetsStartANewStreamWithTheirSize) {
